@@ -1,0 +1,37 @@
+// SPDX-License-Identifier: BSD-2-Clause
+#include "dataset/zoneinfo.h"
+
+#include <err.h>
+
+#include "support/first_word.h"
+#include "support/fsutil.h"
+#include "support/paths.h"
+
+mln_zoneinfo::mln_zoneinfo() : mln_zoneinfo(std::string()) {}
+
+mln_zoneinfo::mln_zoneinfo(const std::string& path)
+    : mln_dataset_component(path),
+      zoneinfo_path(path.empty() ? paths::system_zoneinfo
+                                 : path + "/" + "zoneinfo") {
+  read_version();
+}
+
+void mln_zoneinfo::read_version() {
+  version_string = read_first_word(zoneinfo_path + "/" + "+VERSION");
+}
+
+std::string mln_zoneinfo::version() const { return version_string; }
+
+bool mln_zoneinfo::compatible_schema(const mln_dataset_component&) const {
+  return true;
+}
+
+void mln_zoneinfo::activate() const {
+  try {
+    fsutil::remove(paths::zoneinfo_link);
+  } catch (...) {
+    // Creating the link is tried all the same; its failure is the caller's.
+    ::warn("Unlink of zoneinfo softlink failed");
+  }
+  fsutil::create_symlink(zoneinfo_path, paths::zoneinfo_link);
+}

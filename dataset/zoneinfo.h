@@ -1,0 +1,34 @@
+// SPDX-License-Identifier: BSD-2-Clause
+//
+// The compiled zoneinfo tree of a data set.
+#pragma once
+
+#include <string>
+
+#include "dataset/components.h"
+
+class mln_zoneinfo final : public mln_dataset_component {
+ public:
+  // The system partition's tree, "/usr/share/zoneinfo.default".
+  mln_zoneinfo();
+  // The tree "zoneinfo" below the data set's directory; an empty path means
+  // the system partition. Quiet, even where there is no such tree.
+  explicit mln_zoneinfo(const std::string& path);
+
+  // Always true: a zoneinfo tree never stands in the way of a combination.
+  bool compatible_schema(const mln_dataset_component& other) const override;
+
+  // Re-creates "/var/db/timezone/zoneinfo" as a link to `zoneinfo_path`. Prints
+  // "Unlink of zoneinfo softlink failed" when the old one stays, and goes on.
+  void activate() const override;
+
+  // The release of the data, such as 2024a: the first word of the tree's
+  // "+VERSION" file when the component was built; empty if it had none.
+  std::string version() const;
+
+  std::string zoneinfo_path;   // the tree
+  std::string version_string;  // what version() returns
+
+ private:
+  void read_version();
+};

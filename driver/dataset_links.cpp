@@ -1,0 +1,31 @@
+// SPDX-License-Identifier: BSD-2-Clause
+#include "driver/dataset_links.h"
+
+#include <err.h>
+
+#include "support/fsutil.h"
+#include "support/paths.h"
+
+std::string latest_update_path() {
+  return fsutil::read_symlink(paths::latest_update_link);
+}
+
+std::string current_dataset_path() {
+  return dataset_path_from_link(fsutil::read_symlink(paths::zoneinfo_link));
+}
+
+std::string dataset_path_from_link(const std::string& target) {
+  constexpr auto root_length = paths::length(paths::download_root);
+  if (target.starts_with(paths::download_root)) {
+    // Deliberate: neither the name after the last "/" nor the depth is looked
+    // at, because the data set that is built from the path settles both.
+    // Pinned by DatasetPathFromLink.AcceptsAnyNameAfterTheLastSlash and
+    // DatasetPathFromLink.AcceptsATargetSeveralLevelsDown.
+    const auto last_slash = target.rfind('/');
+    if (last_slash > root_length) return target.substr(0, last_slash);
+  } else if (target == paths::system_zoneinfo) {
+    return {};
+  }
+  ::warn("Bad zoneinfo link %s", target.c_str());
+  throw fsutil::link_rejected;
+}

@@ -1,0 +1,40 @@
+// SPDX-License-Identifier: BSD-2-Clause
+#include <csignal>
+#include <cstdio>
+
+#include "driver/startup.h"
+
+namespace {
+
+// A log that is gone must not stop the boot: without this, a warning into a
+// pipe that nobody reads any more would kill the program.
+void survive_a_lost_log() { std::signal(SIGPIPE, SIG_IGN); }
+
+// warn(3) writes a line in three pieces to an unbuffered stream; a log that
+// takes every write for a record, as the kernel's does, would tear it apart.
+void write_whole_lines() {
+  static char line[BUFSIZ];
+  std::setvbuf(stderr, line, _IOLBF, sizeof line);
+}
+
+}  // namespace
+
+// One boot, in order:
+//  1. The two time-zone directories become readable before the first unlock.
+//  2. The legacy link "/var/db/icutz" moves to "/var/db/timezone/icutz".
+//  3. "/var/db/icu" goes.
+//  4. The system partition's data set is read, and what "tz_latest" announces.
+//  5. The data set that "zoneinfo" names is read; a link that makes no sense is
+//     reset to the system partition.
+//  6. So is one that names data that is older than the system's, or of another
+//     ICU schema.
+//  7. An announced update that is strictly newer, and of the system's schema,
+//     is linked into place and recorded.
+//  8. Whatever fails in 4 to 7 ends with links to the system partition.
+//  9. "localtime" is repaired.
+int main() {
+  survive_a_lost_log();
+  write_whole_lines();
+  run_startup_pass();
+  return 0;
+}

@@ -1,0 +1,11 @@
+// SPDX-License-Identifier: BSD-2-Clause
+//
+// The one pass of a boot. Every decision of the program is taken here.
+#pragma once
+
+// Makes the links below "/var/db/timezone/" consistent; see main() for the way
+// of a boot. Whatever fails ends in a warning and in links to the system
+// partition. Throws only what the last resorts throw: the final reset to the
+// system partition (the local-time link is then not looked at) and the default
+// local-time link.
+void run_startup_pass();

@@ -1,0 +1,44 @@
+// SPDX-License-Identifier: BSD-2-Clause
+#include "support/version_grammar.h"
+
+#include <algorithm>
+
+namespace {
+
+bool is_digit(char byte) { return byte >= '0' && byte <= '9'; }
+bool is_letter(char byte) { return byte >= 'a' && byte <= 'z'; }
+
+// Splits the longest run of bytes of one kind, possibly empty, off the front.
+std::string_view take_run(std::string_view& text, bool (*belongs)(char)) {
+  const auto end = std::find_if_not(text.begin(), text.end(), belongs);
+  const std::string_view run =
+      text.substr(0, static_cast<std::size_t>(end - text.begin()));
+  text.remove_prefix(run.size());
+  return run;
+}
+
+// Splits "\.([0-9]+)" off the front and returns its digits; without digits
+// after the dot the text stays as it is.
+std::string_view take_dotted_number(std::string_view& text) {
+  if (!text.starts_with('.')) return {};
+  std::string_view rest = text.substr(1);
+  const std::string_view number = take_run(rest, is_digit);
+  if (!number.empty()) text = rest;
+  return number;
+}
+
+}  // namespace
+
+// ([0-9]+)([a-z]+)(?:\.([0-9]+))?(?:\.([0-9]+))?
+//
+// Each run ends where a byte of another kind stands, and a lone dotted number
+// is the first of the two, so the longest choice is always the right one and
+// nothing is ever tried twice.
+std::optional<version_groups> match_version_text(std::string_view text) {
+  const std::string_view year = take_run(text, is_digit);
+  const std::string_view letters = take_run(text, is_letter);
+  const std::string_view major = take_dotted_number(text);
+  const std::string_view minor = take_dotted_number(text);
+  if (year.empty() || letters.empty() || !text.empty()) return std::nullopt;
+  return version_groups{year, letters, major, minor};
+}
