@@ -1,0 +1,102 @@
+// SPDX-License-Identifier: BSD-2-Clause
+//
+// The words of the other tests, tested themselves.
+#include <gtest/gtest-spi.h>
+
+#include <cerrno>
+
+#include "tests/device/device.h"
+
+using namespace device;
+
+namespace {
+
+class PrivateDevice : public DeviceTest {};
+
+TEST_F(PrivateDevice, IsWhereTheTestsRun) { EXPECT_EQ(why_not_private(), ""); }
+
+TEST_F(PrivateDevice, StartsWithTheTwoDirectoriesThatThePlatformMakes) {
+  std::vector<std::string> found;
+  for (const auto& [path, shown] : look_at_everything()) found.push_back(path);
+  EXPECT_THAT(
+      found, ::testing::ElementsAre("/usr/share", "/var/db", "/var/db/timezone",
+                                    "/var/db/timezone/tz"));
+}
+
+TEST_F(PrivateDevice, RefusesPermissionEvenToRoot) {
+  make_file("/var/db/file", "x", 0);
+  EXPECT_EQ(file_at("/var/db/file"), "");
+  set_mode("/var/db", 0555);
+  const outcome created = run({"/usr/bin/touch", "/var/db/new"});
+  set_mode("/var/db", 0755);
+  EXPECT_NE(created.exit_status, 0);
+}
+
+TEST_F(PrivateDevice, IsRecognisedByItsOwnFileSystems) {
+  const outcome outside = run({"/usr/bin/sh", "-c", R"(
+      grep -q ' /var/db tmpfs ' /proc/mounts &&
+      grep -q ' /usr/share tmpfs ' /proc/mounts)"});
+  EXPECT_EQ(outside.exit_status, 0);
+}
+
+TEST_F(PrivateDevice, ShowsEveryChangeInASnapshot) {
+  make_file("/var/db/file", "content");
+  make_link("/var/db/link", "target");
+  const auto before = look_at_everything();
+  EXPECT_EQ(look_at_everything(), before);
+
+  make_file("/var/db/file", "Content");
+  EXPECT_FALSE(look_at_everything() == before);
+  wipe("/var/db/file");
+  EXPECT_FALSE(look_at_everything() == before);
+}
+
+TEST_F(PrivateDevice, ShowsALinkThatWasMadeAnewWithTheSameTarget) {
+  make_link("/var/db/link", "target");
+  const auto before = look_at_everything();
+  make_link("/var/db/link", "target");
+  EXPECT_FALSE(look_at_everything() == before);
+}
+
+TEST_F(PrivateDevice, TellsALinkAFileADirectoryAndNothingApart) {
+  make_link("/var/db/link", "target");
+  make_file("/var/db/file", "content");
+  EXPECT_EQ(link_at("/var/db/link"), "target");
+  EXPECT_EQ(link_at("/var/db/file"), "(a file)");
+  EXPECT_EQ(link_at("/var/db/timezone"), "(a directory)");
+  EXPECT_EQ(link_at("/var/db/none"), nothing);
+  EXPECT_EQ(file_at("/var/db/file"), "content");
+  EXPECT_EQ(file_at("/var/db/link"), "(a link to target)");
+}
+
+TEST_F(PrivateDevice, ReportsHowAProgramEnded) {
+  const outcome failed = run({"/usr/bin/sh", "-c", "echo lost >&2; exit 3"});
+  EXPECT_EQ(failed.exit_status, 3);
+  EXPECT_EQ(failed.signal, 0);
+  EXPECT_EQ(failed.log, "lost\n");
+  const outcome killed = run({"/usr/bin/sh", "-c", "kill -9 $$"});
+  EXPECT_EQ(killed.signal, 9);
+}
+
+TEST_F(PrivateDevice, ComparesAFailureWithItsErrorText) {
+  const std::vector<std::string> printed = {
+      "marlin: remove: x: Input/output error"};
+  EXPECT_THAT(printed, lines(failure("remove: x", EIO)));
+  EXPECT_THAT(printed, ::testing::Not(lines(failure("remove: x", EPERM))));
+  EXPECT_THAT(printed, ::testing::Not(lines(failure("remove: y", EIO))));
+}
+
+TEST_F(PrivateDevice, ComparesAWarningUpToItsErrorText) {
+  const std::vector<std::string> printed = {"marlin: so: and so: Success"};
+  EXPECT_THAT(printed, lines(warning("so: and so")));
+  EXPECT_THAT(printed, ::testing::Not(lines(warning("so"))));
+  EXPECT_THAT(printed, ::testing::Not(no_lines()));
+  EXPECT_THAT(printed, ::testing::Not(lines(warning("so: and so"),
+                                            warning("so: and so"))));
+}
+
+TEST_F(PrivateDevice, NoticesThatNothingWasThrown) {
+  EXPECT_NONFATAL_FAILURE(thrown_by([] {}), "no int was thrown");
+}
+
+}  // namespace

@@ -1,0 +1,176 @@
+// SPDX-License-Identifier: BSD-2-Clause
+//
+// Downloaded data is not trusted to be well formed, and a broken system
+// partition must not stop a boot either.
+#include <fcntl.h>
+#include <sys/resource.h>
+#include <unistd.h>
+
+#include "tests/device/device.h"
+
+using namespace device;
+
+namespace {
+
+class UntrustedData : public DeviceTest {
+ protected:
+  void SetUp() override {
+    DeviceTest::SetUp();
+    install_system("2023c", "44l");
+    install_update("2024a.1.0", "44l");
+    point_links_at_system();
+    announce("2024a.1.0");
+  }
+
+  // An update's own "+VERSION" decides nothing, whatever it holds.
+  static void expect_activation() {
+    const outcome booted = boot();
+    EXPECT_EQ(booted.exit_status, 0);
+    EXPECT_EQ(booted.log, "");
+    EXPECT_EQ(link_at(zoneinfo), update("2024a.1.0") + "/zoneinfo");
+  }
+
+  const std::string version_file = update("2024a.1.0") + "/zoneinfo/+VERSION";
+};
+
+TEST_F(UntrustedData, OfAnyContentInAVersionFileIsHarmless) {
+  for (const std::string& content :
+       {std::string(), std::string(70'000, '\0'), std::string("%s%n%s\n"),
+        std::string(1u << 20, '9'), std::string("\xff\xfe\x80")}) {
+    point_links_at_system();
+    make_file(version_file, content);
+    expect_activation();
+  }
+}
+
+TEST_F(UntrustedData, OfAnyKindInPlaceOfAVersionFileIsHarmless) {
+  wipe(version_file);
+  expect_activation();
+
+  point_links_at_system();
+  make_directory(version_file);
+  expect_activation();
+
+  point_links_at_system();
+  wipe(version_file);
+  make_fifo(version_file);
+  expect_activation();
+
+  point_links_at_system();
+  make_link(version_file, "/dev/zero");
+  expect_activation();
+
+  point_links_at_system();
+  make_link(version_file, version_file);
+  expect_activation();
+}
+
+TEST_F(UntrustedData, OfAFifoInPlaceOfTheFormatFileCountsAsNone) {
+  wipe(system_icu + "/icutzformat.txt");
+  make_fifo(system_icu + "/icutzformat.txt");
+  const outcome booted = boot();
+  EXPECT_EQ(booted.exit_status, 0);
+  EXPECT_THAT(booted.lines(),
+              lines(warning("New update not compatible or older version: "
+                            "2024a.1.0 vs. 2023c.1.0")));
+}
+
+TEST_F(UntrustedData, OfAFifoInPlaceOfTheSystemsVersionCountsAsNone) {
+  wipe(system_tree + "/+VERSION");
+  make_fifo(system_tree + "/+VERSION");
+  const auto first =
+      warning("Cannot parse version string .1.0, results.size() = 0");
+  const auto second = warning("Cannot parse version string .1.0");
+  EXPECT_THAT(boot().lines(), lines(first, second, first, second));
+  EXPECT_EQ(file_at(record), ".1.0_2024a.1.0");
+}
+
+TEST_F(UntrustedData, OfAFifoInPlaceOfTheRecordIsLeftAlone) {
+  make_fifo(record);
+  expect_activation();
+  EXPECT_EQ(file_at(record), "(something else)");
+}
+
+TEST_F(UntrustedData, OfA64MebibyteVersionOfTheSystemIsReadWhole) {
+  const std::string word(64u << 20, '7');
+  make_file(system_tree + "/+VERSION", word);
+  wipe(tz_latest);
+  const outcome booted = boot();
+  EXPECT_EQ(booted.exit_status, 0);
+  // Two lines for the system's data set and two for the current one.
+  const std::string first =
+      "marlin: Cannot parse version string " + word + ".1.0, results.size()";
+  EXPECT_EQ(booted.log.compare(0, first.size(), first), 0);
+  EXPECT_EQ(booted.lines().size(), 4u);
+}
+
+TEST_F(UntrustedData, OfA64MebibyteVersionIsRecordedWhole) {
+  const std::string word(64u << 20, 'x');
+  make_file(system_tree + "/+VERSION", word);
+  EXPECT_EQ(boot().exit_status, 0);
+  EXPECT_TRUE(file_at(record) == word + ".1.0_2024a.1.0");
+}
+
+TEST_F(UntrustedData, OfAVersionThatDoesNotFitIntoMemoryEndsInTheLastResort) {
+  // A sparse file, so that only the reading process meets the size.
+  make_file(version_file, "x");
+  ASSERT_EQ(::truncate(version_file.c_str(), 1l << 40), 0);
+  const outcome booted = run({MARLIN_PROGRAM}, [] {
+    const rlimit limit{256u << 20, 256u << 20};
+    ::setrlimit(RLIMIT_AS, &limit);
+  });
+  EXPECT_EQ(booted.exit_status, 0);
+  EXPECT_THAT(
+      booted.lines(),
+      lines(warning("Unable to locate data; resetting to system partition")));
+  EXPECT_EQ(link_at(zoneinfo), system_tree);
+  wipe(version_file);
+}
+
+TEST_F(UntrustedData, OfLinkTargetsBeyondTheLimitIsCutAndRejected) {
+  for (const std::size_t size : {1023u, 1024u, 1025u, 4095u}) {
+    const std::string target = "/" + std::string(size - 1, 'x');
+    point_zoneinfo_at(target);
+    wipe(tz_latest);
+    EXPECT_THAT(
+        boot().lines(),
+        lines(warning("Bad zoneinfo link " + target.substr(0, 1024)),
+              warning(
+                  "Invalid current symlinks; resetting to system partition")));
+    EXPECT_EQ(link_at(zoneinfo), system_tree);
+  }
+}
+
+TEST_F(UntrustedData, OfAnUpdateNameOf255BytesIsOneVersion) {
+  const std::string name = "2024" + std::string(251, 'z');
+  install_update(name, "44l");
+  announce(name);
+  EXPECT_EQ(boot().exit_status, 0);
+  EXPECT_EQ(link_at(zoneinfo), update(name) + "/zoneinfo");
+  EXPECT_EQ(file_at(record), "2023c.1.0_" + name);
+}
+
+TEST_F(UntrustedData, OfNamesWithNewlinesAndPercentSignsIsPrintedAsItIs) {
+  const std::string name = "2024a\n%s%n";
+  install_update(name, "44l");
+  announce(name);
+  EXPECT_THAT(boot().log,
+              ::testing::HasSubstr(
+                  "marlin: Cannot parse version string 2024a\n%s%n: "));
+  EXPECT_EQ(link_at(zoneinfo), system_tree);
+}
+
+TEST_F(UntrustedData, OfTenThousandDirectoriesBelowTheIcuDataIsNotWalked) {
+  // Deep enough that a walk through it would run out of path.
+  const std::string icu = update("2024a.1.0") + "/icutz";
+  ASSERT_EQ(run({"/usr/bin/sh", "-c",
+                 "cd " + icu +
+                     " && for i in $(seq 1000); do mkdir -p "
+                     "aaaaaaaaaa && cd -P aaaaaaaaaa || exit 1; done"})
+                .exit_status,
+            0);
+  expect_activation();
+  EXPECT_EQ(run({"/usr/bin/rm", "-r", icu}).exit_status, 0);
+}
+
+}  // namespace

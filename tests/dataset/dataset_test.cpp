@@ -1,0 +1,332 @@
+// SPDX-License-Identifier: BSD-2-Clause
+#include "dataset/dataset.h"
+
+#include <cerrno>
+#include <stdexcept>
+#include <type_traits>
+
+#include "dataset/icu.h"
+#include "dataset/zoneinfo.h"
+#include "tests/device/device.h"
+
+using namespace device;
+
+namespace {
+
+class Dataset : public DeviceTest {
+ protected:
+  void SetUp() override {
+    DeviceTest::SetUp();
+    install_system("2023c", "44l");
+  }
+
+  static const mln_zoneinfo& zoneinfo_of(const mln_dataset& dataset) {
+    return dynamic_cast<const mln_zoneinfo&>(*dataset.components.at(0));
+  }
+  static const mln_icu& icu_of(const mln_dataset& dataset) {
+    return dynamic_cast<const mln_icu&>(*dataset.components.at(1));
+  }
+  static std::string refusal_of(const std::string& path) {
+    try {
+      mln_dataset dataset(path);
+    } catch (const std::invalid_argument& refusal) {
+      return refusal.what();
+    }
+    return "accepted";
+  }
+};
+class DatasetActivate : public Dataset {};
+class ResetToSystemPartition : public Dataset {};
+
+TEST_F(Dataset, OfAnEmptyPathIsTheSystemPartitions) {
+  const mln_dataset implied;
+  const mln_dataset named("");
+  for (const mln_dataset* system : {&implied, &named}) {
+    EXPECT_EQ(system->path, "");
+    EXPECT_EQ(system->version_string, "2023c.1.0");
+    EXPECT_TRUE(system->version == mln_version("2023c.1.0"));
+    ASSERT_EQ(system->components.size(), 2u);
+    EXPECT_EQ(zoneinfo_of(*system).zoneinfo_path,
+              "/usr/share/zoneinfo.default");
+    EXPECT_EQ(icu_of(*system).icu_path, "/usr/share/icu");
+    EXPECT_EQ(icu_of(*system).schema, "44l");
+  }
+}
+
+TEST_F(Dataset, OfAnUpdateIsNamedByItsDirectory) {
+  install_update("2024a.1.0", "45b");
+  EXPECT_THAT(printed_by([] {
+                const mln_dataset update("/var/db/timezone/tz/2024a.1.0");
+                EXPECT_EQ(update.path, "/var/db/timezone/tz/2024a.1.0");
+                EXPECT_EQ(update.version_string, "2024a.1.0");
+                EXPECT_TRUE(update.version == mln_version("2024a.1.0"));
+                ASSERT_EQ(update.components.size(), 2u);
+                EXPECT_EQ(zoneinfo_of(update).zoneinfo_path,
+                          "/var/db/timezone/tz/2024a.1.0/zoneinfo");
+                EXPECT_EQ(icu_of(update).icu_path,
+                          "/var/db/timezone/tz/2024a.1.0/icutz");
+                EXPECT_EQ(icu_of(update).schema, "45b");
+              }),
+              no_lines());
+}
+
+TEST_F(Dataset, OfAnUpdateReadsItsVersionFileButIsNotNamedByIt) {
+  install_update("2024a.1.0", "44l");
+  make_file(update("2024a.1.0") + "/zoneinfo/+VERSION", "2099z\n");
+  const mln_dataset dataset(update("2024a.1.0"));
+  EXPECT_EQ(dataset.version_string, "2024a.1.0");
+  EXPECT_EQ(zoneinfo_of(dataset).version(), "2099z");
+}
+
+TEST_F(Dataset, OfAnUpdateDoesNotNeedAVersionFile) {
+  install_update("2024a.1.0", "44l");
+  wipe(update("2024a.1.0") + "/zoneinfo");
+  EXPECT_THAT(printed_by([] {
+                const mln_dataset dataset(update("2024a.1.0"));
+                EXPECT_TRUE(dataset.version == mln_version("2024a.1.0"));
+              }),
+              no_lines());
+}
+
+TEST_F(Dataset, OfTheDownloadRootItselfIsRefused) {
+  EXPECT_THAT(printed_by([] {
+                EXPECT_EQ(refusal_of("/var/db/timezone/tz/"), "badpath");
+              }),
+              lines(warning("mln_dataset::create_components: bad path "
+                            "/var/db/timezone/tz/")));
+}
+
+TEST_F(Dataset, OfAPathOutsideTheDownloadRootIsRefused) {
+  for (const std::string path :
+       {"/", "x", "tz/2024a.1.0", "var/db/timezone/tz/2024a.1.0",
+        "/var/db/timezone/tz", "/var/db/timezone/tz2/2024a.1.0",
+        "/var/db/Timezone/tz/2024a.1.0", "/VAR/db/timezone/tz/2024a.1.0",
+        "//var/db/timezone/tz/2024a.1.0", "/usr/share/zoneinfo.default",
+        "/var/db/timezone/tz.2024a.1.0", "/var/db/timezone/zoneinfo/%s%n"}) {
+    EXPECT_THAT(
+        printed_by([&] { EXPECT_EQ(refusal_of(path), "badpath"); }),
+        lines(warning("mln_dataset::create_components: bad path " + path)));
+  }
+}
+
+TEST_F(Dataset, OfARefusedPathHasReadItsVersionFileBefore) {
+  // Only the access time could tell, if the file is there; that the reading
+  // failed tells it too, by the error that it leaves for the refusal's line.
+  EXPECT_THAT(
+      printed_by([] {
+        errno = 0;
+        EXPECT_EQ(refusal_of("/var/db/missing"), "badpath");
+      }),
+      lines(failure("mln_dataset::create_components: bad path /var/db/missing",
+                    ENOENT)));
+}
+
+TEST_F(Dataset, OfTheShortestPathIsAcceptedWithAnUnsetVersion) {
+  make_directory("/var/db/timezone/tz/x");
+  EXPECT_THAT(
+      printed_by([] {
+        const mln_dataset dataset("/var/db/timezone/tz/x");
+        EXPECT_EQ(dataset.version_string, "x");
+        EXPECT_TRUE(dataset.version == mln_version());
+        EXPECT_EQ(dataset.components.size(), 2u);
+      }),
+      lines(warning("Cannot parse version string x, results.size() = 0"),
+            warning("Cannot parse version string x"),
+            warning("No ICU schema found for /var/db/timezone/tz/x")));
+}
+
+TEST_F(Dataset, OfAPathWithATrailingSlashKeepsItAndIsOlderThanAll) {
+  install_update("2024a.1.0", "44l");
+  EXPECT_THAT(
+      printed_by([] {
+        const mln_dataset dataset("/var/db/timezone/tz/2024a.1.0/");
+        EXPECT_EQ(dataset.path, "/var/db/timezone/tz/2024a.1.0/");
+        EXPECT_EQ(dataset.version_string, "2024a.1.0/");
+        EXPECT_TRUE(mln_dataset() > dataset);
+        EXPECT_EQ(zoneinfo_of(dataset).zoneinfo_path,
+                  "/var/db/timezone/tz/2024a.1.0//zoneinfo");
+      }),
+      lines(
+          warning("Cannot parse version string 2024a.1.0/, results.size() = 0"),
+          warning("Cannot parse version string 2024a.1.0/")));
+}
+
+TEST_F(Dataset, OfADeeperPathKeepsItInItsVersionTextAndIsUnset) {
+  install_update("a/b", "44l");
+  printed_by([] {
+    const mln_dataset dataset("/var/db/timezone/tz/a/b");
+    EXPECT_EQ(dataset.version_string, "a/b");
+    EXPECT_TRUE(dataset.version == mln_version());
+  });
+}
+
+TEST_F(Dataset, OfASystemWithoutAVersionFileHasAnUnsetVersion) {
+  wipe(system_tree);
+  EXPECT_THAT(printed_by([] {
+                const mln_dataset system;
+                EXPECT_EQ(system.version_string, ".1.0");
+                EXPECT_TRUE(system.version == mln_version());
+              }),
+              lines(warning("Cannot parse version string .1.0, "
+                            "results.size() = 0"),
+                    warning("Cannot parse version string .1.0")));
+}
+
+TEST_F(Dataset, WithANumberThatDoesNotFitThrowsOutOfRange) {
+  install_update("2147483648a", "44l");
+  EXPECT_THAT(printed_by([] {
+                EXPECT_THROW(mln_dataset(update("2147483648a")),
+                             std::out_of_range);
+              }),
+              no_lines());
+}
+
+TEST_F(Dataset, PrintsTheParsersLinesBeforeTheIcuComponents) {
+  make_directory(update("odd"));
+  EXPECT_THAT(
+      printed_by([] { mln_dataset dataset(update("odd")); }),
+      lines(warning("Cannot parse version string odd, "
+                    "results.size() = 0"),
+            warning("Cannot parse version string odd"),
+            warning("No ICU schema found for /var/db/timezone/tz/odd")));
+}
+
+TEST_F(Dataset, IsNeverCopied) {
+  static_assert(!std::is_copy_constructible_v<mln_dataset>);
+  static_assert(!std::is_copy_assignable_v<mln_dataset>);
+}
+
+TEST_F(Dataset, OfTheSamePathIsEqualEvenIfTheDiskChanged) {
+  install_update("2024a.1.0", "44l");
+  const mln_dataset before(update("2024a.1.0"));
+  install_update("2024a.1.0", "45l");
+  const mln_dataset after(update("2024a.1.0"));
+  EXPECT_TRUE(before == after);
+}
+
+TEST_F(Dataset, OfTheSystemEqualsEveryOtherButNoUpdate) {
+  const mln_dataset before;
+  install_system("2024a", "45l");
+  install_update("2024a.1.0", "44l");
+  EXPECT_TRUE(before == mln_dataset());
+  EXPECT_FALSE(before == mln_dataset(update("2024a.1.0")));
+}
+
+TEST_F(Dataset, OfAnotherPathIsNotEqualThoughOfTheSameVersion) {
+  install_update("2024a.1.0", "44l");
+  install_update("2024a.01.0", "44l");
+  const mln_dataset left(update("2024a.1.0"));
+  const mln_dataset right(update("2024a.01.0"));
+  EXPECT_FALSE(left == right);
+  EXPECT_FALSE(left > right);
+  EXPECT_FALSE(right > left);
+}
+
+TEST_F(Dataset, IsNewerByItsVersionAlone) {
+  install_update("2023c.1.0", "44l");
+  install_update("2023c.1.1", "9b");
+  const mln_dataset system;
+  const mln_dataset equal(update("2023c.1.0"));
+  const mln_dataset newer(update("2023c.1.1"));
+  EXPECT_TRUE(newer > system);
+  EXPECT_FALSE(system > newer);
+  EXPECT_FALSE(equal > system);
+  EXPECT_FALSE(system > equal);
+}
+
+TEST_F(Dataset, IsCompatibleWithItselfAndWithTheSameSchemaOnly) {
+  install_update("2024a.1.0", "44l");
+  install_update("2024b.1.0", "45l");
+  const mln_dataset system;
+  const mln_dataset same(update("2024a.1.0"));
+  const mln_dataset other(update("2024b.1.0"));
+  EXPECT_TRUE(system.compatible_with(system));
+  EXPECT_TRUE(same.compatible_with(system));
+  EXPECT_FALSE(other.compatible_with(system));
+}
+
+TEST_F(Dataset, OfListsOfDifferentLengthsIsNotCompatible) {
+  const mln_dataset system;
+  mln_dataset shorter;
+  shorter.components.pop_back();
+  EXPECT_FALSE(shorter.compatible_with(system));
+  EXPECT_FALSE(system.compatible_with(shorter));
+}
+
+TEST_F(DatasetActivate, LinksTheZoneinfoTreeThenTheIcuData) {
+  install_update("2024a.1.0", "44l");
+  EXPECT_THAT(printed_by([] { mln_dataset(update("2024a.1.0")).activate(); }),
+              no_lines());
+  EXPECT_EQ(link_at(zoneinfo), "/var/db/timezone/tz/2024a.1.0/zoneinfo");
+  EXPECT_EQ(link_at(icutz), "/var/db/timezone/tz/2024a.1.0/icutz");
+}
+
+TEST_F(DatasetActivate, StopsAtTheFirstComponentThatThrows) {
+  install_update("2024a.1.0", "44l");
+  make_directory(zoneinfo);
+  make_link(icutz, "/var/db/old");
+  printed_by([] {
+    EXPECT_EQ(thrown_by([] { mln_dataset(update("2024a.1.0")).activate(); }),
+              EEXIST);
+  });
+  EXPECT_EQ(link_at(icutz), "/var/db/old");
+}
+
+TEST_F(DatasetActivate, LeavesWhatIsLinkedByThenLinked) {
+  install_update("2024a.1.0", "44l");
+  make_directory(icutz);
+  printed_by([] {
+    EXPECT_EQ(thrown_by([] { mln_dataset(update("2024a.1.0")).activate(); }),
+              EEXIST);
+  });
+  EXPECT_EQ(link_at(zoneinfo), "/var/db/timezone/tz/2024a.1.0/zoneinfo");
+}
+
+TEST_F(DatasetActivate, OfTheSystemLinksItsTreeAndNoIcuData) {
+  point_links_at_update("2024a.1.0");
+  make_link(legacy_icutz, "/var/db/older");
+  EXPECT_THAT(printed_by([] { mln_dataset().activate(); }), no_lines());
+  EXPECT_EQ(link_at(zoneinfo), "/usr/share/zoneinfo.default");
+  EXPECT_EQ(link_at(icutz), nothing);
+  EXPECT_EQ(link_at(legacy_icutz), nothing);
+}
+
+TEST_F(ResetToSystemPartition, LinksTheSystemTreeAndTouchesNothingElse) {
+  install_update("2024a.1.0", "44l");
+  point_links_at_update("2024a.1.0");
+  announce("2024a.1.0");
+  point_localtime_at("anything");
+  EXPECT_THAT(printed_by([] { reset_to_system_partition(); }), no_lines());
+  EXPECT_EQ(link_at(zoneinfo), "/usr/share/zoneinfo.default");
+  EXPECT_EQ(link_at(icutz), nothing);
+  EXPECT_EQ(link_at(tz_latest), update("2024a.1.0"));
+  EXPECT_EQ(link_at(local_time), "anything");
+  EXPECT_EQ(file_at(record), nothing);
+}
+
+TEST_F(ResetToSystemPartition, ReadsTheSystemPartitionAnew) {
+  wipe(system_tree);
+  EXPECT_THAT(printed_by([] { reset_to_system_partition(); }),
+              lines(warning("Cannot parse version string .1.0, "
+                            "results.size() = 0"),
+                    warning("Cannot parse version string .1.0")));
+  EXPECT_EQ(link_at(zoneinfo), "/usr/share/zoneinfo.default");
+}
+
+TEST_F(ResetToSystemPartition, PassesOnWhatActivatingThrows) {
+  make_directory(zoneinfo);
+  point_localtime_at("anything");
+  make_link(icutz, "/var/db/old");
+  printed_by([] {
+    EXPECT_EQ(thrown_by([] { reset_to_system_partition(); }), EEXIST);
+  });
+  EXPECT_EQ(link_at(icutz), "/var/db/old");
+}
+
+TEST_F(ResetToSystemPartition, PassesOnWhatBuildingThrows) {
+  install_system("2147483648a", "44l");
+  EXPECT_THROW(reset_to_system_partition(), std::out_of_range);
+  EXPECT_EQ(link_at(zoneinfo), nothing);
+}
+
+}  // namespace

@@ -1,0 +1,175 @@
+// SPDX-License-Identifier: BSD-2-Clause
+//
+// What the search for an ICU schema asks of fts(3), and what it makes of
+// entries and failures that no file system here can be brought to yield. This
+// program's own definitions stand in for the C library's.
+#include <fts.h>
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+
+#include <cerrno>
+#include <cstdlib>
+#include <cstring>
+#include <string>
+#include <vector>
+
+#include "dataset/icu.h"
+#include "tests/device/device.h"
+
+using namespace device;
+
+namespace {
+
+struct scripted_entry {
+  std::string name;
+  int level = 1;
+  int info = FTS_F;
+  int error = 0;
+  mode_t mode = S_IFREG | 0644;
+};
+
+struct {
+  std::vector<scripted_entry> entries;
+  int open_error = 0;
+
+  std::string root;
+  int options = 0;
+  bool sorted = false;
+  int closed = 0;
+  std::size_t read = 0;
+  std::vector<std::string> skipped;
+} walk;
+
+struct stat entry_status;
+char* entry_memory;
+
+}  // namespace
+
+extern "C" {
+
+FTS* fts_open(char* const* roots, int options,
+              int (*compare)(const FTSENT**, const FTSENT**)) {
+  walk.root = roots[0];
+  EXPECT_EQ(roots[1], nullptr);
+  walk.options = options;
+  walk.sorted = compare != nullptr;
+  if (walk.open_error == 0) return reinterpret_cast<FTS*>(&walk);
+  errno = walk.open_error;
+  return nullptr;
+}
+
+FTSENT* fts_read(FTS*) {
+  if (walk.read == walk.entries.size()) return nullptr;
+  const scripted_entry& scripted = walk.entries[walk.read++];
+  std::free(entry_memory);
+  entry_memory = static_cast<char*>(
+      std::calloc(1, sizeof(FTSENT) + scripted.name.size() + 1));
+  auto* const entry = reinterpret_cast<FTSENT*>(entry_memory);
+  std::memcpy(entry->fts_name, scripted.name.c_str(), scripted.name.size() + 1);
+  entry->fts_namelen = static_cast<unsigned short>(scripted.name.size());
+  entry->fts_level = static_cast<short>(scripted.level);
+  entry->fts_info = static_cast<unsigned short>(scripted.info);
+  entry->fts_errno = scripted.error;
+  entry_status.st_mode = scripted.mode;
+  entry->fts_statp = &entry_status;
+  return entry;
+}
+
+int fts_set(FTS*, FTSENT* entry, int instruction) {
+  EXPECT_EQ(instruction, FTS_SKIP);
+  walk.skipped.emplace_back(entry->fts_name);
+  return 0;
+}
+
+int fts_close(FTS*) {
+  ++walk.closed;
+  return 0;
+}
+
+}  // extern "C"
+
+namespace {
+
+struct IcuWalk : public testing::Test {
+  void SetUp() override { walk = {}; }
+
+  static std::string schema() {
+    return mln_icu("/var/db/timezone/tz/2024a.1.0").schema;
+  }
+};
+
+TEST_F(IcuWalk, FollowsOnlyTheRootAndStaysOnItsDeviceInDirectoryOrder) {
+  printed_by([] { schema(); });
+  EXPECT_EQ(walk.root, "/var/db/timezone/tz/2024a.1.0/icutz");
+  EXPECT_EQ(walk.options, 0x51);
+  EXPECT_FALSE(walk.sorted);
+  EXPECT_EQ(walk.closed, 1);
+}
+
+TEST_F(IcuWalk, ThatCannotBeStartedIsReportedAndThrown) {
+  walk.open_error = ENOMEM;
+  const std::string reason = std::strerror(ENOMEM);
+  EXPECT_THAT(
+      printed_by([] { EXPECT_EQ(thrown_by([] { schema(); }), ENOMEM); }),
+      lines(failure("tz_icu::initialize: fts_open of "
+                    "/var/db/timezone/tz/2024a.1.0/icutz failed, " +
+                        reason,
+                    ENOMEM)));
+  EXPECT_EQ(walk.closed, 0);
+}
+
+TEST_F(IcuWalk, EndsAtTheFirstMatch) {
+  walk.entries = {{"icutz44l.dat"}, {"icutz45l.dat"}};
+  EXPECT_EQ(schema(), "44l");
+  EXPECT_EQ(walk.read, 1u);
+  EXPECT_EQ(walk.closed, 1);
+}
+
+TEST_F(IcuWalk, GoesOnAfterANameThatDoesNotMatch) {
+  walk.entries = {{"readme"}, {""}, {"icutz45l.dat"}};
+  EXPECT_EQ(schema(), "45l");
+}
+
+TEST_F(IcuWalk, PassesOverAnEntryWithAnError) {
+  walk.entries = {{.name = "icutz44l.dat", .error = EIO}, {"icutz45l.dat"}};
+  EXPECT_EQ(schema(), "45l");
+}
+
+TEST_F(IcuWalk, PassesOverEntriesThatAreNotDirectlyInTheRoot) {
+  walk.entries = {{.name = "icutz43l.dat", .level = 0},
+                  {.name = "icutz44l.dat", .level = 2},
+                  {"icutz45l.dat"}};
+  EXPECT_EQ(schema(), "45l");
+}
+
+TEST_F(IcuWalk, PassesOverEntriesThatAreNoRegularFile) {
+  for (const int info : {FTS_D, FTS_DP, FTS_DC, FTS_DNR, FTS_DEFAULT, FTS_ERR,
+                         FTS_NS, FTS_NSOK, FTS_SL, FTS_SLNONE}) {
+    walk = {};
+    walk.entries = {{.name = "icutz44l.dat", .info = info}, {"icutz45l.dat"}};
+    EXPECT_EQ(schema(), "45l") << info;
+  }
+}
+
+TEST_F(IcuWalk, PassesOverFilesThatOthersMayNotRead) {
+  walk.entries = {{.name = "icutz44l.dat", .mode = S_IFREG | 0773},
+                  {.name = "icutz45l.dat", .mode = S_IFREG | 0004}};
+  EXPECT_EQ(schema(), "45l");
+}
+
+TEST_F(IcuWalk, EntersTheRootButNoDirectoryBelowIt) {
+  walk.entries = {{.name = "icutz", .level = 0, .info = FTS_D},
+                  {.name = "below", .level = 1, .info = FTS_D},
+                  {.name = "below", .level = 1, .info = FTS_DP},
+                  {"icutz45l.dat"}};
+  EXPECT_EQ(schema(), "45l");
+  EXPECT_EQ(walk.skipped, std::vector<std::string>{"below"});
+}
+
+TEST_F(IcuWalk, WithoutAMatchIsReported) {
+  EXPECT_THAT(printed_by([] { EXPECT_EQ(schema(), ""); }),
+              lines(warning("No ICU schema found for "
+                            "/var/db/timezone/tz/2024a.1.0")));
+}
+
+}  // namespace

@@ -1,0 +1,117 @@
+// SPDX-License-Identifier: BSD-2-Clause
+#include "dataset/zoneinfo.h"
+
+#include <cerrno>
+
+#include "dataset/icu.h"
+#include "tests/device/device.h"
+
+using namespace device;
+
+namespace {
+
+const std::string update_path = "/var/db/timezone/tz/2016a.1.0";
+
+class Zoneinfo : public DeviceTest {};
+class ZoneinfoActivate : public DeviceTest {};
+
+TEST_F(Zoneinfo, OfAnEmptyPathIsTheSystemTree) {
+  install_system("2023c", "44l");
+  for (const mln_zoneinfo& tree : {mln_zoneinfo(), mln_zoneinfo("")}) {
+    EXPECT_EQ(tree.dataset_path, "");
+    EXPECT_EQ(tree.zoneinfo_path, "/usr/share/zoneinfo.default");
+    EXPECT_EQ(tree.version_string, "2023c");
+    EXPECT_EQ(tree.version(), "2023c");
+  }
+}
+
+TEST_F(Zoneinfo, OfAnUpdateIsTheTreeInItsDirectory) {
+  make_file(update_path + "/zoneinfo/+VERSION", "\n  2016a and more\n");
+  const mln_zoneinfo tree(update_path);
+  EXPECT_EQ(tree.dataset_path, update_path);
+  EXPECT_EQ(tree.zoneinfo_path, "/var/db/timezone/tz/2016a.1.0/zoneinfo");
+  EXPECT_EQ(tree.version(), "2016a");
+}
+
+TEST_F(Zoneinfo, DoesNotLookForATrailingSlash) {
+  EXPECT_EQ(mln_zoneinfo(update_path + "/").zoneinfo_path,
+            "/var/db/timezone/tz/2016a.1.0//zoneinfo");
+}
+
+TEST_F(Zoneinfo, TakesAVersionWordThatOnlyWhiteSpaceEnds) {
+  make_file(system_tree + "/+VERSION", "2016a,x y");
+  EXPECT_EQ(mln_zoneinfo().version(), "2016a,x");
+}
+
+TEST_F(Zoneinfo, WithoutAVersionFileIsQuietlyWithoutAVersion) {
+  EXPECT_THAT(printed_by([] { EXPECT_EQ(mln_zoneinfo().version(), ""); }),
+              no_lines());
+  make_file(system_tree + "/+VERSION", "");
+  EXPECT_THAT(printed_by([] { EXPECT_EQ(mln_zoneinfo().version(), ""); }),
+              no_lines());
+  make_file(system_tree + "/+VERSION", "2016a", 0);
+  EXPECT_THAT(printed_by([] { EXPECT_EQ(mln_zoneinfo().version(), ""); }),
+              no_lines());
+}
+
+TEST_F(Zoneinfo, KeepsTheVersionThatItFirstRead) {
+  install_system("2023c", "44l");
+  const mln_zoneinfo tree;
+  install_system("2024a", "44l");
+  EXPECT_EQ(tree.version(), "2023c");
+}
+
+TEST_F(Zoneinfo, IsCompatibleWithEveryComponent) {
+  install_system("2023c", "44l");
+  EXPECT_TRUE(mln_zoneinfo().compatible_schema(mln_zoneinfo(update_path)));
+  EXPECT_TRUE(mln_zoneinfo().compatible_schema(mln_icu()));
+}
+
+TEST_F(ZoneinfoActivate, LinksTheSystemTree) {
+  point_zoneinfo_at("/var/db/anything");
+  EXPECT_THAT(printed_by([] { mln_zoneinfo().activate(); }), no_lines());
+  EXPECT_EQ(link_at(zoneinfo), "/usr/share/zoneinfo.default");
+}
+
+TEST_F(ZoneinfoActivate, LinksAnUpdatesTree) {
+  point_zoneinfo_at("/var/db/anything");
+  EXPECT_THAT(printed_by([] { mln_zoneinfo(update_path).activate(); }),
+              no_lines());
+  EXPECT_EQ(link_at(zoneinfo), "/var/db/timezone/tz/2016a.1.0/zoneinfo");
+}
+
+TEST_F(ZoneinfoActivate, CreatesAMissingLinkQuietly) {
+  EXPECT_THAT(printed_by([] { mln_zoneinfo().activate(); }), no_lines());
+  EXPECT_EQ(link_at(zoneinfo), "/usr/share/zoneinfo.default");
+}
+
+TEST_F(ZoneinfoActivate, LinksATreeThatDoesNotExist) {
+  mln_zoneinfo("/var/db/timezone/tz/none").activate();
+  EXPECT_EQ(link_at(zoneinfo), "/var/db/timezone/tz/none/zoneinfo");
+}
+
+TEST_F(ZoneinfoActivate, OverADirectoryReportsBothFailuresAndThrows) {
+  make_directory(zoneinfo);
+  EXPECT_THAT(
+      printed_by([] {
+        EXPECT_EQ(thrown_by([] { mln_zoneinfo().activate(); }), EEXIST);
+      }),
+      lines(
+          failure("remove: could not remove /var/db/timezone/zoneinfo", EISDIR),
+          failure("Unlink of zoneinfo softlink failed", EISDIR),
+          failure("create_symlink: from /var/db/timezone/zoneinfo to "
+                  "/usr/share/zoneinfo.default",
+                  EEXIST)));
+}
+
+TEST_F(ZoneinfoActivate, ThrowsTheErrorOfALinkThatCannotBeCreated) {
+  wipe(timezone_root);
+  EXPECT_THAT(printed_by([] {
+                EXPECT_EQ(thrown_by([] { mln_zoneinfo().activate(); }), ENOENT);
+              }),
+              lines(failure("create_symlink: from /var/db/timezone/zoneinfo to "
+                            "/usr/share/zoneinfo.default",
+                            ENOENT)));
+}
+
+}  // namespace

@@ -1,0 +1,344 @@
+// SPDX-License-Identifier: BSD-2-Clause
+#include "tests/device/device.h"
+
+#include <dirent.h>
+#include <fcntl.h>
+#include <linux/close_range.h>
+#include <linux/magic.h>
+#include <sys/mman.h>
+#include <sys/stat.h>
+#include <sys/vfs.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdio>
+#include <cstring>
+#include <filesystem>
+#include <fstream>
+#include <iomanip>
+#include <iostream>
+#include <sstream>
+#include <stdexcept>
+
+namespace device {
+namespace {
+
+namespace fs = std::filesystem;
+
+// A device that cannot be built as asked is no device to test on.
+void must(bool succeeded, const std::string& what) {
+  if (succeeded) return;
+  throw std::runtime_error("cannot " + what + ": " + std::strerror(errno));
+}
+
+std::string bytes_of(const std::string& path) {
+  std::ostringstream bytes;
+  bytes << std::ifstream(path, std::ios::binary).rdbuf();
+  return bytes.str();
+}
+
+std::string target_of(const std::string& path) {
+  std::string target(4096, '\0');
+  const ssize_t length = ::readlink(path.c_str(), target.data(), target.size());
+  target.resize(length < 0 ? 0 : static_cast<std::size_t>(length));
+  return target;
+}
+
+void look_below(const std::string& path, snapshot& seen) {
+  struct stat status {};
+  if (::lstat(path.c_str(), &status) != 0) return;
+  std::string content;
+  if (S_ISREG(status.st_mode)) content = bytes_of(path);
+  if (S_ISLNK(status.st_mode)) content = target_of(path);
+  seen[path] = {status.st_mode, status.st_ino, status.st_mtim, status.st_ctim,
+                content};
+  if (!S_ISDIR(status.st_mode)) return;
+  DIR* const directory = ::opendir(path.c_str());
+  if (directory == nullptr) return;
+  while (const dirent* const found = ::readdir(directory)) {
+    const std::string name = found->d_name;
+    if (name != "." && name != "..") look_below(path + "/" + name, seen);
+  }
+  ::closedir(directory);
+}
+
+std::string describe(const std::string& path, mode_t wanted,
+                     const std::function<std::string()>& content) {
+  struct stat status {};
+  if (::lstat(path.c_str(), &status) != 0) {
+    return errno == ENOENT ? nothing
+                           : "(" + std::string(std::strerror(errno)) + ")";
+  }
+  if ((status.st_mode & S_IFMT) == wanted) return content();
+  if (S_ISLNK(status.st_mode)) return "(a link to " + target_of(path) + ")";
+  if (S_ISREG(status.st_mode)) return "(a file)";
+  if (S_ISDIR(status.st_mode)) return "(a directory)";
+  return "(something else)";
+}
+
+// Permissions that a test took away must not keep the next one from starting
+// with an empty device.
+void empty_directory(const std::string& path) {
+  for (const auto& child : fs::directory_iterator(path)) wipe(child.path());
+}
+
+bool is_memory_file_system(const char* path) {
+  struct statfs status {};
+  return ::statfs(path, &status) == 0 && status.f_type == TMPFS_MAGIC;
+}
+
+dev_t device_of(const char* path) {
+  struct stat status {};
+  return ::stat(path, &status) == 0 ? status.st_dev : 0;
+}
+
+}  // namespace
+
+std::string update(const std::string& version) {
+  return downloads + "/" + version;
+}
+
+void make_directory(const std::string& path, mode_t mode) {
+  fs::create_directories(path);
+  set_mode(path, mode);
+}
+
+void make_file(const std::string& path, const std::string& content,
+               mode_t mode) {
+  fs::create_directories(fs::path(path).parent_path());
+  std::ofstream file(path, std::ios::binary);
+  file << content;
+  file.close();
+  must(file.good(), "write " + path);
+  set_mode(path, mode);
+}
+
+void make_fifo(const std::string& path) {
+  fs::create_directories(fs::path(path).parent_path());
+  must(::mkfifo(path.c_str(), 0644) == 0, "make the FIFO " + path);
+}
+
+void make_link(const std::string& path, const std::string& target) {
+  ::unlink(path.c_str());
+  must(::symlink(target.c_str(), path.c_str()) == 0, "link " + path);
+}
+
+void set_mode(const std::string& path, mode_t mode) {
+  must(::chmod(path.c_str(), mode) == 0, "set the mode of " + path);
+}
+
+void wipe(const std::string& path) {
+  const auto status = fs::symlink_status(path);
+  if (fs::is_directory(status)) {
+    set_mode(path, 0700);
+    empty_directory(path);
+  }
+  fs::remove(path);
+}
+
+void install_system(const std::string& release, const std::string& format) {
+  wipe(system_tree);
+  make_file(system_tree + "/+VERSION", release + "\n");
+  make_file(system_tree + "/America/Los_Angeles", "TZif system LA");
+  make_file(system_tree + "/Europe/Paris", "TZif system Paris");
+  make_file(system_icu + "/icutzformat.txt", format + "\n");
+}
+
+void install_update(const std::string& version, const std::string& schema) {
+  const std::string tree = update(version) + "/zoneinfo";
+  const std::string release = version.substr(0, version.find('.'));
+  make_file(tree + "/+VERSION", release + "\n");
+  make_file(tree + "/America/Los_Angeles", "TZif " + version + " LA");
+  make_file(tree + "/Europe/Paris", "TZif " + version + " Paris");
+  make_file(update(version) + "/icutz/icutz" + schema + ".dat", "ICU");
+}
+
+void announce(const std::string& version) {
+  make_link(tz_latest, update(version));
+}
+
+void point_links_at_update(const std::string& version) {
+  point_zoneinfo_at(update(version) + "/zoneinfo");
+  make_link(icutz, update(version) + "/icutz");
+  point_localtime_at(default_localtime);
+}
+
+void point_links_at_system() {
+  point_zoneinfo_at(system_tree);
+  ::unlink(icutz.c_str());
+  point_localtime_at(default_localtime);
+}
+
+void point_zoneinfo_at(const std::string& target) {
+  make_link(zoneinfo, target);
+}
+
+void point_localtime_at(const std::string& target) {
+  make_link(local_time, target);
+}
+
+bool operator==(const entry& left, const entry& right) {
+  const auto same_time = [](const timespec& a, const timespec& b) {
+    return a.tv_sec == b.tv_sec && a.tv_nsec == b.tv_nsec;
+  };
+  return left.mode == right.mode && left.inode == right.inode &&
+         same_time(left.modified, right.modified) &&
+         same_time(left.changed, right.changed) &&
+         left.content == right.content;
+}
+
+void PrintTo(const entry& shown, std::ostream* out) {
+  *out << "inode " << shown.inode << ", mode " << std::oct << shown.mode
+       << std::dec << ", changed " << shown.changed.tv_sec << "."
+       << shown.changed.tv_nsec << ", \"" << shown.content.substr(0, 80)
+       << "\"";
+}
+
+snapshot look_at(const std::vector<std::string>& paths) {
+  snapshot seen;
+  for (const auto& path : paths) look_below(path, seen);
+  return seen;
+}
+
+snapshot look_at_everything() { return look_at({"/var/db", "/usr/share"}); }
+
+std::string listing() {
+  std::ostringstream out;
+  for (const auto& [path, shown] : look_at_everything()) {
+    out << "  " << std::oct << std::setw(6) << shown.mode << std::dec << " "
+        << path;
+    if (S_ISLNK(shown.mode)) out << " -> " << shown.content.substr(0, 200);
+    if (S_ISREG(shown.mode))
+      out << " \"" << shown.content.substr(0, 60) << "\"";
+    out << "\n";
+  }
+  return out.str();
+}
+
+std::string link_at(const std::string& path) {
+  return describe(path, S_IFLNK, [&] { return target_of(path); });
+}
+
+std::string file_at(const std::string& path) {
+  return describe(path, S_IFREG, [&] { return bytes_of(path); });
+}
+
+std::vector<std::string> outcome::lines() const {
+  std::vector<std::string> all;
+  std::istringstream in(log);
+  for (std::string line; std::getline(in, line);) all.push_back(line);
+  return all;
+}
+
+outcome run(const std::vector<std::string>& command,
+            const std::function<void()>& in_the_child) {
+  const int log = ::memfd_create("log", MFD_CLOEXEC);
+  must(log >= 0, "create a log");
+  std::vector<char*> arguments;
+  for (const auto& word : command)
+    arguments.push_back(const_cast<char*>(word.c_str()));
+  arguments.push_back(nullptr);
+
+  const pid_t child = ::fork();
+  must(child >= 0, "fork");
+  if (child == 0) {
+    ::dup2(log, STDERR_FILENO);
+    if (in_the_child) in_the_child();
+    // Nothing of this process reaches the program but descriptors 0 to 2.
+    ::close_range(3, ~0u, CLOSE_RANGE_CLOEXEC);
+    ::execv(arguments[0], arguments.data());
+    ::_exit(127);
+  }
+  int status = 0;
+  must(::waitpid(child, &status, 0) == child, "wait for " + command[0]);
+  const std::string printed = bytes_of("/proc/self/fd/" + std::to_string(log));
+  ::close(log);
+  return {WIFEXITED(status) ? WEXITSTATUS(status) : -1,
+          WIFSIGNALED(status) ? WTERMSIG(status) : 0, printed};
+}
+
+outcome boot() {
+  const std::vector<std::string> read_only = {downloads, tz_latest,
+                                              "/usr/share"};
+  const snapshot before = look_at(read_only);
+  outcome result = run({MARLIN_PROGRAM});
+  EXPECT_EQ(look_at(read_only), before)
+      << "a data set, the announcement or the system partition was changed";
+  std::cout << result.log.substr(0, 10'000);
+  return result;
+}
+
+std::vector<std::string> printed_by(const std::function<void()>& act) {
+  const int log = ::memfd_create("log", MFD_CLOEXEC);
+  must(log >= 0, "create a log");
+  const int standard_error = ::dup(STDERR_FILENO);
+  ::dup2(log, STDERR_FILENO);
+  const auto restore = [&] {
+    ::dup2(standard_error, STDERR_FILENO);
+    ::close(standard_error);
+  };
+  try {
+    act();
+  } catch (...) {
+    restore();
+    ::close(log);
+    throw;
+  }
+  restore();
+  const outcome result{0, 0, bytes_of("/proc/self/fd/" + std::to_string(log))};
+  ::close(log);
+  return result.lines();
+}
+
+int thrown_by(const std::function<void()>& act) {
+  try {
+    act();
+  } catch (int error) {
+    return error;
+  }
+  ADD_FAILURE() << "no int was thrown";
+  return 0;
+}
+
+::testing::Matcher<std::string> failure(const std::string& text, int error) {
+  return ::testing::StrEq("marlin: " + text + ": " + std::strerror(error));
+}
+
+::testing::Matcher<std::string> warning(const std::string& text) {
+  return ::testing::ResultOf(
+      "the line up to its error text",
+      [](const std::string& line) { return line.substr(0, line.rfind(": ")); },
+      ::testing::StrEq("marlin: " + text));
+}
+
+std::string why_not_private() {
+  for (const char* path : {"/", "/var/db", "/usr/share"}) {
+    if (!is_memory_file_system(path))
+      return std::string(path) + " is not a throw-away file system in memory";
+  }
+  if (device_of("/var/db") == device_of("/") ||
+      device_of("/usr/share") == device_of("/") ||
+      device_of("/var/db") == device_of("/usr/share"))
+    return "/var/db and /usr/share are not file systems of their own";
+  if (bytes_of("/proc/self/status").find("CapEff:\t0000000000000000") ==
+      std::string::npos)
+    return "this process has capabilities, so permissions mean nothing";
+  return {};
+}
+
+void DeviceTest::SetUp() {
+  const std::string reason = why_not_private();
+  ASSERT_EQ(reason, "") << "refusing to touch this machine";
+  ::umask(022);
+  empty_directory("/var/db");
+  empty_directory("/usr/share");
+  make_directory(downloads);
+}
+
+void DeviceTest::TearDown() {
+  if (HasFailure() && why_not_private().empty())
+    std::cout << "The device afterwards:\n" << listing();
+}
+
+}  // namespace device

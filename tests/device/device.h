@@ -1,0 +1,138 @@
+// SPDX-License-Identifier: BSD-2-Clause
+//
+// A device to test on: "/var/db" and "/usr/share" as file systems of its own,
+// built with words of the domain, booted, and looked at afterwards. The places
+// and texts are written out here once more, on purpose: a wrong constant in the
+// program must not make its own test right.
+#pragma once
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <sys/types.h>
+
+#include <functional>
+#include <map>
+#include <string>
+#include <vector>
+
+namespace device {
+
+// Links and files that the program owns or reads.
+inline const std::string zoneinfo = "/var/db/timezone/zoneinfo";
+inline const std::string icutz = "/var/db/timezone/icutz";
+inline const std::string local_time = "/var/db/timezone/localtime";
+inline const std::string tz_latest = "/var/db/timezone/tz_latest";
+inline const std::string record = "/var/db/timezone/TZVersionDiffRecord";
+inline const std::string legacy_icutz = "/var/db/icutz";
+inline const std::string old_icu = "/var/db/icu";
+
+// Directories of the data.
+inline const std::string timezone_root = "/var/db/timezone";
+inline const std::string downloads = "/var/db/timezone/tz";
+inline const std::string system_tree = "/usr/share/zoneinfo.default";
+inline const std::string system_icu = "/usr/share/icu";
+inline const std::string default_localtime =
+    "/var/db/timezone/zoneinfo/America/Los_Angeles";
+
+// The directory of the update with this version.
+std::string update(const std::string& version);
+
+// --- Building a device -----------------------------------------------------
+
+void make_directory(const std::string& path, mode_t mode = 0755);
+void make_file(const std::string& path, const std::string& content = {},
+               mode_t mode = 0644);
+void make_fifo(const std::string& path);
+void make_link(const std::string& path, const std::string& target);
+void set_mode(const std::string& path, mode_t mode);
+// Removes whatever is there, with all that is in it.
+void wipe(const std::string& path);
+
+// A system partition with the zones Los Angeles and Paris.
+void install_system(const std::string& release, const std::string& format);
+// A downloaded update, with the same zones and an ICU data file.
+void install_update(const std::string& version, const std::string& schema);
+// What an installer of updates does last.
+void announce(const std::string& version);
+// Makes an update, or with no version the system partition, the active set.
+void point_links_at_update(const std::string& version);
+void point_links_at_system();
+void point_zoneinfo_at(const std::string& target);
+void point_localtime_at(const std::string& target);
+
+// --- Looking at it ---------------------------------------------------------
+
+struct entry {
+  mode_t mode;
+  ino_t inode;
+  timespec modified;
+  timespec changed;
+  std::string content;  // of a regular file, or the target of a link
+};
+bool operator==(const entry& left, const entry& right);
+void PrintTo(const entry& shown, std::ostream* out);
+
+using snapshot = std::map<std::string, entry>;
+
+// Everything at and below these paths, down to inode numbers and times.
+snapshot look_at(const std::vector<std::string>& paths);
+// Everything on the device.
+snapshot look_at_everything();
+// The device for a person to read.
+std::string listing();
+
+// The target of a link, or a description of what is there instead.
+std::string link_at(const std::string& path);
+// The content of a regular file, or a description of what is there instead.
+std::string file_at(const std::string& path);
+inline const std::string nothing = "(nothing)";
+
+// --- Booting ---------------------------------------------------------------
+
+struct outcome {
+  int exit_status;  // of a process that exited, otherwise -1
+  int signal;       // that ended the process, otherwise 0
+  std::string log;  // the bytes of standard error
+  std::vector<std::string> lines() const;
+};
+
+// Runs a program to its end.
+outcome run(const std::vector<std::string>& command,
+            const std::function<void()>& in_the_child = {});
+
+// Boots: runs marlin, as the shipped program, and expects that no data set, no
+// announcement and nothing on the system partition was changed by it.
+outcome boot();
+
+// The lines that `act` prints to standard error in this process.
+std::vector<std::string> printed_by(const std::function<void()>& act);
+
+// The int that `act` throws; fails the test when it throws none.
+int thrown_by(const std::function<void()>& act);
+
+// --- What is expected of warning lines --------------------------------------
+
+// A line after a call that failed: its error text counts.
+::testing::Matcher<std::string> failure(const std::string& text, int error);
+// A line whose error text is whatever an earlier call left.
+::testing::Matcher<std::string> warning(const std::string& text);
+
+template <typename... Lines>
+auto lines(Lines... expected) {
+  return ::testing::ElementsAre(expected...);
+}
+inline auto no_lines() { return ::testing::IsEmpty(); }
+
+// Every test that touches the device derives from this. Refuses to touch
+// anything outside of a private device; starts from an empty one that has only
+// "/var/db/timezone/tz"; shows the whole device when a test has failed.
+class DeviceTest : public ::testing::Test {
+ protected:
+  void SetUp() override;
+  void TearDown() override;
+};
+
+// Why this process may not touch "/var/db" and "/usr/share"; empty if it may.
+std::string why_not_private();
+
+}  // namespace device

@@ -1,0 +1,78 @@
+// SPDX-License-Identifier: BSD-2-Clause
+#include "driver/data_protection.h"
+
+#include <cerrno>
+
+#include "tests/device/device.h"
+
+using namespace device;
+
+namespace {
+
+class DataProtection : public DeviceTest {
+ protected:
+  void SetUp() override {
+    DeviceTest::SetUp();
+    install_system("2023c", "44l");
+    point_links_at_system();
+  }
+
+  // The first calls of a boot, as the build for a platform with
+  // data-protection classes makes them. Descriptors are numbered the same way
+  // in every run.
+  static std::vector<std::string> first_calls(std::size_t count) {
+    const std::string trace = "/var/db/trace";
+    const outcome booted =
+        run({"/usr/bin/strace", "-qq", "-o", trace, "-e",
+             "trace=open,openat,fcntl,fcntl64,close,access,faccessat", "-E",
+             "ASAN_OPTIONS=detect_leaks=0", MARLIN_WITH_CLASSES});
+    EXPECT_EQ(booted.exit_status, 0);
+    EXPECT_EQ(booted.log, "");
+    std::vector<std::string> calls = outcome{0, 0, file_at(trace)}.lines();
+    wipe(trace);
+    while (!calls.empty() &&
+           calls.front().find("/var/db/timezone/") == std::string::npos)
+      calls.erase(calls.begin());
+    if (calls.size() > count) calls.resize(count);
+    return calls;
+  }
+};
+
+using ::testing::AllOf;
+using ::testing::ElementsAre;
+using ::testing::HasSubstr;
+using ::testing::StartsWith;
+
+TEST_F(DataProtection, AsksForClassDOnBothDirectoriesBeforeAllElse) {
+  EXPECT_THAT(
+      first_calls(7),
+      ElementsAre(
+          HasSubstr("\"/var/db/timezone/\", O_RDONLY|O_CLOEXEC) = 3"),
+          AllOf(StartsWith("fcntl(3, 0x40"), HasSubstr(", 0x4)")),
+          StartsWith("close(3)"),
+          HasSubstr("\"/var/db/timezone/tz/\", O_RDONLY|O_CLOEXEC) = 3"),
+          AllOf(StartsWith("fcntl(3, 0x40"), HasSubstr(", 0x4)")),
+          StartsWith("close(3)"), HasSubstr("\"/var/db/icutz\"")));
+}
+
+TEST_F(DataProtection, IsQuietlyLeftOutForADirectoryThatCannotBeOpened) {
+  wipe(downloads);
+  EXPECT_THAT(
+      first_calls(5),
+      ElementsAre(HasSubstr("\"/var/db/timezone/\", O_RDONLY|O_CLOEXEC) = 3"),
+                  StartsWith("fcntl(3, 0x40"), StartsWith("close(3)"),
+                  HasSubstr("\"/var/db/timezone/tz/\", O_RDONLY|O_CLOEXEC) "
+                            "= -1 ENOENT"),
+                  HasSubstr("\"/var/db/icutz\"")));
+}
+
+TEST_F(DataProtection, CreatesPrintsAndThrowsNothing) {
+  wipe(timezone_root);
+  const auto before = look_at_everything();
+  EXPECT_THAT(printed_by(relax_data_protection), no_lines());
+  EXPECT_THAT(printed_by([] { set_protection_class_d("/var/db/none"); }),
+              no_lines());
+  EXPECT_EQ(look_at_everything(), before);
+}
+
+}  // namespace

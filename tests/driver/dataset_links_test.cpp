@@ -1,0 +1,170 @@
+// SPDX-License-Identifier: BSD-2-Clause
+#include "driver/dataset_links.h"
+
+#include <cerrno>
+
+#include "tests/device/device.h"
+
+using namespace device;
+
+namespace {
+
+class LatestUpdatePath : public DeviceTest {};
+class CurrentDatasetPath : public DeviceTest {};
+class DatasetPathFromLink : public DeviceTest {
+ protected:
+  static void accepts(const std::string& target, const std::string& path) {
+    EXPECT_THAT(printed_by([&] {
+                  EXPECT_EQ(dataset_path_from_link(target), path) << target;
+                }),
+                no_lines());
+  }
+  static void rejects(const std::string& target) {
+    EXPECT_THAT(printed_by([&] {
+                  errno = EXDEV;
+                  EXPECT_EQ(thrown_by([&] { dataset_path_from_link(target); }),
+                            -1);
+                }),
+                lines(failure("Bad zoneinfo link " + target, EXDEV)));
+  }
+};
+
+TEST_F(LatestUpdatePath, IsTheTargetOfTheAnnouncement) {
+  announce("2024a.1.0");
+  EXPECT_EQ(latest_update_path(), "/var/db/timezone/tz/2024a.1.0");
+}
+
+TEST_F(LatestUpdatePath, IsQuietlyEmptyWithoutAnAnnouncement) {
+  EXPECT_THAT(printed_by([] { EXPECT_EQ(latest_update_path(), ""); }),
+              no_lines());
+}
+
+TEST_F(LatestUpdatePath, IsNotChecked) {
+  for (const std::string target :
+       {"tz/2024a.1.0", "/var/db/timezone/tz/2024a.1.0/", "/gone", "../..//"}) {
+    make_link(tz_latest, target);
+    EXPECT_THAT(printed_by([&] { EXPECT_EQ(latest_update_path(), target); }),
+                no_lines());
+  }
+}
+
+TEST_F(LatestUpdatePath, ThrowsWhenTheAnnouncementIsAFile) {
+  make_file(tz_latest);
+  EXPECT_THAT(
+      printed_by(
+          [] { EXPECT_EQ(thrown_by([] { latest_update_path(); }), EINVAL); }),
+      lines(failure("read_symlink: /var/db/timezone/tz_latest", EINVAL)));
+}
+
+TEST_F(CurrentDatasetPath, IsTheUpdateThatTheZoneinfoLinkNames) {
+  point_zoneinfo_at("/var/db/timezone/tz/2024a.1.0/zoneinfo");
+  EXPECT_EQ(current_dataset_path(), "/var/db/timezone/tz/2024a.1.0");
+}
+
+TEST_F(CurrentDatasetPath, IsEmptyForTheSystemPartition) {
+  point_zoneinfo_at("/usr/share/zoneinfo.default");
+  EXPECT_THAT(printed_by([] { EXPECT_EQ(current_dataset_path(), ""); }),
+              no_lines());
+}
+
+TEST_F(CurrentDatasetPath, IsRejectedWithoutAZoneinfoLink) {
+  EXPECT_THAT(printed_by([] {
+                EXPECT_EQ(thrown_by([] { current_dataset_path(); }), -1);
+              }),
+              lines(warning("Bad zoneinfo link ")));
+}
+
+TEST_F(CurrentDatasetPath, ThrowsTheReadingsErrorForAFileOrADirectory) {
+  const auto expected =
+      lines(failure("read_symlink: /var/db/timezone/zoneinfo", EINVAL));
+  const auto act = [] {
+    EXPECT_EQ(thrown_by([] { current_dataset_path(); }), EINVAL);
+  };
+  make_file(zoneinfo);
+  EXPECT_THAT(printed_by(act), expected);
+  wipe(zoneinfo);
+  make_directory(zoneinfo);
+  EXPECT_THAT(printed_by(act), expected);
+}
+
+TEST_F(CurrentDatasetPath, ThrowsTheReadingsErrorWithoutPermission) {
+  point_zoneinfo_at("/usr/share/zoneinfo.default");
+  set_mode(timezone_root, 0);
+  EXPECT_THAT(
+      printed_by(
+          [] { EXPECT_EQ(thrown_by([] { current_dataset_path(); }), EACCES); }),
+      lines(failure("read_symlink: /var/db/timezone/zoneinfo", EACCES)));
+}
+
+TEST_F(CurrentDatasetPath, ChangesNothing) {
+  point_links_at_update("2024a.1.0");
+  announce("2024b.1.0");
+  const auto before = look_at_everything();
+  current_dataset_path();
+  latest_update_path();
+  EXPECT_EQ(look_at_everything(), before);
+}
+
+TEST_F(DatasetPathFromLink, IsAllBeforeTheLastSlashOfADownload) {
+  accepts("/var/db/timezone/tz/2024a.1.0/zoneinfo",
+          "/var/db/timezone/tz/2024a.1.0");
+}
+
+TEST_F(DatasetPathFromLink, IsEmptyForExactlyTheSystemTree) {
+  accepts("/usr/share/zoneinfo.default", "");
+}
+
+TEST_F(DatasetPathFromLink, AcceptsAnyNameAfterTheLastSlash) {
+  accepts("/var/db/timezone/tz/2024a.1.0/", "/var/db/timezone/tz/2024a.1.0");
+  accepts("/var/db/timezone/tz/2024a.1.0/icutz",
+          "/var/db/timezone/tz/2024a.1.0");
+  accepts("/var/db/timezone/tz/2024a.1.0/zoneinfo/",
+          "/var/db/timezone/tz/2024a.1.0/zoneinfo");
+}
+
+TEST_F(DatasetPathFromLink, AcceptsATargetSeveralLevelsDown) {
+  accepts("/var/db/timezone/tz/a/b/zoneinfo", "/var/db/timezone/tz/a/b");
+}
+
+TEST_F(DatasetPathFromLink, AcceptsANameOfOneByte) {
+  accepts("/var/db/timezone/tz/x/", "/var/db/timezone/tz/x");
+}
+
+TEST_F(DatasetPathFromLink, KeepsDoubledSlashesAndDots) {
+  accepts("/var/db/timezone/tz/a//zoneinfo", "/var/db/timezone/tz/a/");
+  accepts("/var/db/timezone/tz//a/zoneinfo", "/var/db/timezone/tz//a");
+  accepts("/var/db/timezone/tz/../x/zoneinfo", "/var/db/timezone/tz/../x");
+}
+
+TEST_F(DatasetPathFromLink, RejectsADownloadWithoutASlashAfterItsName) {
+  rejects("/var/db/timezone/tz/2024a.1.0");
+  rejects("/var/db/timezone/tz/x");
+}
+
+TEST_F(DatasetPathFromLink, RejectsADoubledSlashAfterThePrefix) {
+  rejects("/var/db/timezone/tz//zoneinfo");
+  rejects("/var/db/timezone/tz//");
+}
+
+TEST_F(DatasetPathFromLink, RejectsThePrefixAlone) {
+  rejects("/var/db/timezone/tz/");
+  rejects("/var/db/timezone/tz");
+}
+
+TEST_F(DatasetPathFromLink, RejectsWhatIsNotExactlyTheSystemTree) {
+  for (const char* target :
+       {"/usr/share/zoneinfo.default/", "/usr/share/zoneinfo",
+        "/usr/share/zoneinfo.defaulT", "/usr/share/zoneinfo.default2",
+        "//usr/share/zoneinfo.default", "usr/share/zoneinfo.default"})
+    rejects(target);
+}
+
+TEST_F(DatasetPathFromLink, RejectsEverythingElse) {
+  for (const char* target :
+       {"", "/", "tz/2024a.1.0/zoneinfo", "/var/db/Timezone/tz/a/zoneinfo",
+        "/var/db/timezone/tZ/a/zoneinfo", "/var/db/timezone/tz2/a/zoneinfo",
+        " /var/db/timezone/tz/a/zoneinfo", "%s%n", "two\twords"})
+    rejects(target);
+}
+
+}  // namespace

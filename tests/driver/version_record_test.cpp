@@ -1,0 +1,125 @@
+// SPDX-License-Identifier: BSD-2-Clause
+#include "driver/version_record.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include "tests/device/device.h"
+
+using namespace device;
+
+namespace {
+
+class VersionRecord : public DeviceTest {
+ protected:
+  static void write() { record_version_change("2023c.1.0", "2024a.1.0"); }
+};
+
+TEST_F(VersionRecord, HoldsBothVersionsAndNothingElse) {
+  EXPECT_THAT(printed_by(write), no_lines());
+  EXPECT_EQ(file_at(record), "2023c.1.0_2024a.1.0");
+  EXPECT_EQ(file_at(record).size(), 19u);
+}
+
+TEST_F(VersionRecord, ReplacesWhatWasThere) {
+  make_file(record, std::string(1000, 'x'));
+  write();
+  EXPECT_EQ(file_at(record), "2023c.1.0_2024a.1.0");
+}
+
+TEST_F(VersionRecord, KeepsEveryByteOfBothVersions) {
+  const std::string from("a\0b\n%s", 6);
+  const std::string to("\xff\0", 2);
+  record_version_change(from, to);
+  EXPECT_EQ(file_at(record), from + "_" + to);
+}
+
+TEST_F(VersionRecord, HasNoLimitOfLength) {
+  const std::string from(20u << 20, 'f');
+  record_version_change(from, "t");
+  EXPECT_TRUE(file_at(record) == from + "_t");
+}
+
+TEST_F(VersionRecord, IsCreatedWithTheDefaultPermissions) {
+  for (const mode_t mask : {0022u, 0077u, 0u}) {
+    wipe(record);
+    ::umask(mask);
+    write();
+    EXPECT_EQ(look_at({record}).at(record).mode, S_IFREG | (0666u & ~mask));
+  }
+}
+
+TEST_F(VersionRecord, KeepsThePermissionsOfAFileThatIsThere) {
+  make_file(record, "", 0600);
+  write();
+  EXPECT_EQ(look_at({record}).at(record).mode, S_IFREG | 0600u);
+}
+
+TEST_F(VersionRecord, FollowsALink) {
+  make_link(record, "/var/db/elsewhere");
+  write();
+  EXPECT_EQ(file_at("/var/db/elsewhere"), "2023c.1.0_2024a.1.0");
+  EXPECT_EQ(link_at(record), "/var/db/elsewhere");
+}
+
+TEST_F(VersionRecord, IsQuietlyLeftOutWhenItCannotBeOpened) {
+  make_file(record, "old", 0444);
+  EXPECT_THAT(printed_by(write), no_lines());
+  EXPECT_EQ(file_at(record), "old");
+
+  wipe(record);
+  make_directory(record);
+  EXPECT_THAT(printed_by(write), no_lines());
+  EXPECT_EQ(file_at(record), "(a directory)");
+
+  wipe(timezone_root);
+  EXPECT_THAT(printed_by(write), no_lines());
+  EXPECT_EQ(file_at(record), nothing);
+}
+
+TEST_F(VersionRecord, IsQuietlyLeftOutWhenTheDiskIsFull) {
+  make_link(record, "/dev/full");
+  EXPECT_THAT(printed_by(write), no_lines());
+}
+
+TEST_F(VersionRecord, IsNotWrittenToAFifoThatNobodyReads) {
+  make_fifo(record);
+  EXPECT_THAT(printed_by(write), no_lines());
+}
+
+TEST_F(VersionRecord, IsNotWrittenToAFifoThatSomebodyReads) {
+  make_fifo(record);
+  const int reader = ::open(record.c_str(), O_RDONLY | O_NONBLOCK);
+  ASSERT_GE(reader, 0);
+  EXPECT_THAT(printed_by(write), no_lines());
+  char byte = 0;
+  EXPECT_EQ(::read(reader, &byte, 1), 0);
+  ::close(reader);
+}
+
+TEST_F(VersionRecord, IsNotWrittenToATerminal) {
+  const int terminal = ::posix_openpt(O_RDWR | O_NOCTTY);
+  ASSERT_GE(terminal, 0);
+  ASSERT_EQ(::grantpt(terminal), 0);
+  ASSERT_EQ(::unlockpt(terminal), 0);
+  make_link(record, ::ptsname(terminal));
+  EXPECT_THAT(printed_by(write), no_lines());
+  ASSERT_EQ(::fcntl(terminal, F_SETFL, O_NONBLOCK), 0);
+  char byte = 0;
+  EXPECT_LT(::read(terminal, &byte, 1), 0);
+  ::close(terminal);
+}
+
+TEST_F(VersionRecord, LeavesNoDescriptorOpen) {
+  const int before = ::dup(0);
+  ::close(before);
+  write();
+  make_link(record, "/dev/null");
+  write();
+  const int after = ::dup(0);
+  ::close(after);
+  EXPECT_EQ(after, before);
+}
+
+}  // namespace

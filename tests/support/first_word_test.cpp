@@ -1,0 +1,140 @@
+// SPDX-License-Identifier: BSD-2-Clause
+#include "support/first_word.h"
+
+#include <fcntl.h>
+#include <unistd.h>
+
+#include <fstream>
+
+#include "tests/device/device.h"
+
+using namespace device;
+
+namespace {
+
+const std::string path = "/usr/share/file";
+
+class FirstWord : public DeviceTest {
+ protected:
+  static std::string of(const std::string& content) {
+    make_file(path, content);
+    return read_first_word(path);
+  }
+
+  // What the standard library's formatted extraction makes of the file.
+  static std::string by_stream() {
+    std::ifstream file(path);
+    std::string word;
+    file >> word;
+    return word;
+  }
+};
+
+TEST_F(FirstWord, EndsAtWhiteSpaceOrAtTheEndOfTheFile) {
+  EXPECT_EQ(of("2016a"), "2016a");
+  EXPECT_EQ(of("2016a\n"), "2016a");
+  EXPECT_EQ(of("2016a,x y"), "2016a,x");
+  EXPECT_EQ(of("\n  2016a more\n"), "2016a");
+}
+
+TEST_F(FirstWord, KnowsSixKindsOfWhiteSpaceAndNoOther) {
+  for (const char byte : std::string(" \t\n\v\f\r")) {
+    EXPECT_EQ(of(std::string(2, byte) + "a" + byte + "b"), "a");
+  }
+  for (int byte = 0; byte < 256; ++byte) {
+    const auto in_between = static_cast<char>(byte);
+    of(std::string("a") + in_between + "b");
+    EXPECT_EQ(read_first_word(path), by_stream()) << byte;
+  }
+}
+
+TEST_F(FirstWord, IsEmptyWhenTheFileHasNone) {
+  EXPECT_EQ(of(""), "");
+  EXPECT_EQ(of(" \t\n\v\f\r"), "");
+  EXPECT_EQ(of(std::string(100'000, ' ')), "");
+}
+
+TEST_F(FirstWord, KeepsNulBytes) {
+  const std::string word("20\0a", 4);
+  EXPECT_EQ(of(word + " x"), word);
+  EXPECT_EQ(of(std::string(1, '\0')), std::string(1, '\0'));
+}
+
+TEST_F(FirstWord, HasNoLimitOfLength) {
+  for (const std::size_t size :
+       {4094u, 4095u, 4096u, 4097u, 8191u, 8192u, 8193u, 1'000'000u}) {
+    const std::string word(size, 'x');
+    EXPECT_EQ(of(word), word) << size;
+    EXPECT_EQ(of(word + " y"), word) << size;
+    EXPECT_EQ(of(" " + word + "\ny"), word) << size;
+    EXPECT_EQ(of(std::string(size, '\n') + "y z"), "y") << size;
+    EXPECT_EQ(of(std::string(size, '\n') + word), word) << size;
+  }
+}
+
+TEST_F(FirstWord, Of64MebibytesIsReadWhole) {
+  const std::string word(64u << 20, '7');
+  make_file(path, word);
+  EXPECT_TRUE(read_first_word(path) == word);
+}
+
+TEST_F(FirstWord, OfAMissingFileIsQuietlyEmpty) {
+  EXPECT_THAT(printed_by([] { EXPECT_EQ(read_first_word(path), ""); }),
+              no_lines());
+}
+
+TEST_F(FirstWord, OfAFileThatMayNotBeReadIsQuietlyEmpty) {
+  make_file(path, "2016a", 0);
+  EXPECT_THAT(printed_by([] { EXPECT_EQ(read_first_word(path), ""); }),
+              no_lines());
+}
+
+TEST_F(FirstWord, OfADirectoryIsQuietlyEmpty) {
+  make_directory(path);
+  EXPECT_THAT(printed_by([] { EXPECT_EQ(read_first_word(path), ""); }),
+              no_lines());
+}
+
+TEST_F(FirstWord, FollowsALink) {
+  make_file("/usr/share/real", "2016a");
+  make_link(path, "real");
+  EXPECT_EQ(read_first_word(path), "2016a");
+}
+
+TEST_F(FirstWord, OfAFifoIsEmptyAndDoesNotBlock) {
+  make_fifo(path);
+  EXPECT_EQ(read_first_word(path), "");
+}
+
+TEST_F(FirstWord, OfAFifoWithAWriterIsEmptyAndTakesNothingFromIt) {
+  make_fifo(path);
+  const int fifo = ::open(path.c_str(), O_RDWR);
+  ASSERT_EQ(::write(fifo, "2016a ", 6), 6);
+  EXPECT_EQ(read_first_word(path), "");
+  char left[8];
+  EXPECT_EQ(::read(fifo, left, sizeof left), 6);
+  ::close(fifo);
+}
+
+TEST_F(FirstWord, OfADeviceIsEmptyAndDoesNotBlock) {
+  for (const char* device :
+       {"/dev/null", "/dev/zero", "/dev/full", "/dev/random", "/dev/urandom",
+        "/dev/tty", "/dev/ptmx"}) {
+    make_link(path, device);
+    EXPECT_EQ(read_first_word(path), "") << device;
+  }
+}
+
+TEST_F(FirstWord, LeavesNoDescriptorOpen) {
+  const int before = ::dup(0);
+  ::close(before);
+  of("2016a");
+  of(std::string(10'000, 'x'));
+  make_directory("/usr/share/directory");
+  read_first_word("/usr/share/directory");
+  const int after = ::dup(0);
+  ::close(after);
+  EXPECT_EQ(after, before);
+}
+
+}  // namespace

@@ -1,0 +1,84 @@
+// SPDX-License-Identifier: BSD-2-Clause
+#include "support/version_grammar.h"
+
+#include <gtest/gtest.h>
+
+#include <regex>
+#include <string>
+
+#include "tests/support/generated_text.h"
+
+namespace {
+
+// year|letters|major|minor, or "no match".
+std::string matched(std::string_view text) {
+  const auto groups = match_version_text(text);
+  if (!groups) return "no match";
+  std::string shown(groups->year);
+  for (const auto group : {groups->letters, groups->major, groups->minor})
+    shown.append("|").append(group);
+  return shown;
+}
+
+std::string matched_by_regex(const std::string& text) {
+  static const std::regex grammar(
+      R"(([0-9]+)([a-z]+)(?:\.([0-9]+))?(?:\.([0-9]+))?)");
+  std::smatch groups;
+  if (!std::regex_match(text, groups, grammar)) return "no match";
+  std::string shown = groups[1].str();
+  for (const std::size_t group : {2u, 3u, 4u})
+    shown.append("|").append(groups[group].str());
+  return shown;
+}
+
+TEST(VersionGrammar, AcceptsAYearLettersAndUpToTwoNumbers) {
+  EXPECT_EQ(matched("2016a"), "2016|a||");
+  EXPECT_EQ(matched("2016ab.7"), "2016|ab|7|");
+  EXPECT_EQ(matched("2016a.1.0"), "2016|a|1|0");
+  EXPECT_EQ(matched("0z.00.007"), "0|z|00|007");
+  EXPECT_EQ(matched("99999999999999999999az.1"), "99999999999999999999|az|1|");
+}
+
+TEST(VersionGrammar, RejectsNearMisses) {
+  for (const char* text :
+       {"",         "2016",       "a",        "a2016",        "2016A",
+        "2016aB",   "2016a.",     "2016a.1.", "2016a.1.0.",   "2016a.1.0.0",
+        "2016a..1", "2016a.b",    "2016a.1b", " 2016a",       "2016a ",
+        "2016a\n",  "-2016a",     "+2016a",   "2016-a",       "2016a,1",
+        ".1.0",     "2016a.1.0/", "2016a/1",  "2016\xc3\xa4", "/2016a",
+        ":2016a",   "2016`",      "2016{"}) {
+    EXPECT_EQ(matched(text), "no match") << text;
+  }
+}
+
+TEST(VersionGrammar, RejectsANulByteAnywhere) {
+  for (std::size_t place = 0; place <= 9; ++place) {
+    std::string text = "2016a.1.0";
+    text.insert(place, 1, '\0');
+    EXPECT_EQ(matched(text), "no match") << place;
+  }
+}
+
+TEST(VersionGrammar, AgreesWithTheRegularExpressionOnAMillionTexts) {
+  text_generator generator(1, {{"2016", "0", "99999999999"},
+                               {"a", "zz", "b"},
+                               {"", ".0", ".1", ".12"},
+                               {"", ".0", ".007"}});
+  int matches = 0;
+  for (int i = 0; i < 1'000'000; ++i) {
+    const std::string text = generator.next();
+    const std::string expected = matched_by_regex(text);
+    matches += expected != "no match";
+    ASSERT_EQ(matched(text), expected) << testing::PrintToString(text);
+  }
+  EXPECT_GT(matches, 200'000);
+}
+
+TEST(VersionGrammar, TakesTextsOfAnyLength) {
+  const std::string digits(16u << 20, '1');
+  const std::string letters(16u << 20, 'q');
+  EXPECT_TRUE(match_version_text(digits + letters + "." + digits));
+  EXPECT_FALSE(match_version_text(digits + letters + "." + digits + "."));
+}
+
+}  // namespace

@@ -1,0 +1,178 @@
+// SPDX-License-Identifier: BSD-2-Clause
+#include "support/version.h"
+
+#include <algorithm>
+#include <cerrno>
+#include <random>
+#include <stdexcept>
+
+#include "tests/device/device.h"
+
+using namespace device;
+
+namespace {
+
+std::string shown(const mln_version& version) {
+  return std::to_string(version.year) + "|" + version.letters + "|" +
+         std::to_string(version.major) + "|" + std::to_string(version.minor);
+}
+
+const std::string unset = "-1||-1|-1";
+
+TEST(VersionParse, FillsFourFields) {
+  EXPECT_THAT(printed_by([] {
+                EXPECT_EQ(shown(mln_version("2016a")), "2016|a|-1|-1");
+                EXPECT_EQ(shown(mln_version("2016a.1.0")), "2016|a|1|0");
+                EXPECT_EQ(shown(mln_version("2016ab.7")), "2016|ab|7|-1");
+              }),
+              no_lines());
+}
+
+TEST(VersionParse, StartsUnset) { EXPECT_EQ(shown(mln_version()), unset); }
+
+TEST(VersionParse, PrintsTwoLinesForAMalformedText) {
+  for (const std::string text : {"2016A", "2016", "a2016", "2016a.",
+                                 "2016a.1.0.0", " 2016a", "", "%s%n"}) {
+    mln_version version;
+    EXPECT_THAT(printed_by([&] {
+                  errno = EIO;
+                  version = mln_version(text);
+                }),
+                lines(failure("Cannot parse version string " + text +
+                                  ", results.size() = 0",
+                              EIO),
+                      failure("Cannot parse version string " + text, EIO)));
+    EXPECT_EQ(shown(version), unset) << text;
+  }
+}
+
+TEST(VersionParse, PrintsATextUpToItsFirstNul) {
+  const std::string text("2016a\0b", 7);
+  EXPECT_THAT(
+      printed_by([&] { EXPECT_EQ(shown(mln_version(text)), unset); }),
+      lines(warning("Cannot parse version string 2016a, results.size() = 0"),
+            warning("Cannot parse version string 2016a")));
+}
+
+TEST(VersionParse, OfAMalformedTextUnsetsAnEarlierValue) {
+  mln_version version("2016a.1.0");
+  printed_by([&] { version.parse("nonsense"); });
+  EXPECT_EQ(shown(version), unset);
+}
+
+TEST(VersionParse, OfAShorterTextUnsetsTheNumbersThatItLacks) {
+  mln_version version("2016a.1.2");
+  version.parse("2017b");
+  EXPECT_EQ(shown(version), "2017|b|-1|-1");
+}
+
+TEST(VersionParse, TakesTheLargestNumber) {
+  EXPECT_EQ(shown(mln_version("2147483647a.2147483647.2147483647")),
+            "2147483647|a|2147483647|2147483647");
+  EXPECT_EQ(shown(mln_version(std::string(5000, '0') + "1a.01.000")),
+            "1|a|1|0");
+}
+
+TEST(VersionParse, ThrowsOutOfRangeForALargerNumber) {
+  EXPECT_THAT(printed_by([] {
+                EXPECT_THROW(mln_version("2147483648a"), std::out_of_range);
+                EXPECT_THROW(mln_version("1a.2147483648"), std::out_of_range);
+                EXPECT_THROW(mln_version("1a.1.4294967296"), std::out_of_range);
+                EXPECT_THROW(mln_version("99999999999999999999999a"),
+                             std::out_of_range);
+              }),
+              no_lines());
+}
+
+TEST(VersionParse, KeepsTheFieldsBeforeANumberThatDoesNotFit) {
+  mln_version version("2016a.1.2");
+  EXPECT_THROW(version.parse("2147483648b.3.4"), std::out_of_range);
+  EXPECT_EQ(shown(version), "2016|a|1|2");
+  EXPECT_THROW(version.parse("2017b.2147483648.4"), std::out_of_range);
+  EXPECT_EQ(shown(version), "2017|b|1|2");
+  EXPECT_THROW(version.parse("2018c.5.2147483648"), std::out_of_range);
+  EXPECT_EQ(shown(version), "2018|c|5|2");
+}
+
+void expect_newer(const std::string& newer, const std::string& older) {
+  const mln_version left(newer);
+  const mln_version right(older);
+  EXPECT_TRUE(left > right) << newer << " > " << older;
+  EXPECT_FALSE(right > left) << older << " > " << newer;
+  EXPECT_FALSE(left == right) << newer << " == " << older;
+}
+
+TEST(VersionOrder, GoesByYearThenLettersThenMajorThenMinor) {
+  expect_newer("2017a", "2016z.1.9");
+  expect_newer("10000a", "2016z");
+  expect_newer("2016b.0.0", "2016a.9.9");
+  expect_newer("2016a.2.0", "2016a.1.9");
+  expect_newer("2016a.1.1", "2016a.1.0");
+}
+
+TEST(VersionOrder, ComparesNumbersAndNotTexts) {
+  expect_newer("2016a.10", "2016a.9");
+  expect_newer("2016a.1.10", "2016a.1.9");
+  EXPECT_TRUE(mln_version("2016a.01") == mln_version("2016a.1"));
+}
+
+TEST(VersionOrder, TakesAMissingNumberForOlderThanAnyOther) {
+  expect_newer("2016a.0.0", "2016a.0");
+  expect_newer("2016a.0", "2016a");
+  expect_newer("2016a.1.0", "2016a.1");
+  expect_newer("2016a.1", "2016a");
+}
+
+TEST(VersionOrder, ComparesLettersAsTexts) {
+  expect_newer("2016za", "2016z");
+  expect_newer("2016b", "2016az");
+}
+
+TEST(VersionOrder, ComparesLettersByUnsignedBytes) {
+  mln_version low;
+  mln_version high;
+  low.letters = "z";
+  high.letters = "\xe4";
+  EXPECT_TRUE(high > low);
+  EXPECT_FALSE(low > high);
+}
+
+TEST(VersionOrder, HasTheUnsetValueBelowEveryParsedOne) {
+  const mln_version oldest("0a");
+  EXPECT_TRUE(oldest > mln_version());
+  EXPECT_FALSE(mln_version() > oldest);
+  EXPECT_FALSE(mln_version() > mln_version());
+  EXPECT_TRUE(mln_version() == mln_version());
+}
+
+TEST(VersionOrder, HasAllUnparseableTextsEqual) {
+  printed_by([] {
+    EXPECT_TRUE(mln_version("x") == mln_version("2016A"));
+    EXPECT_FALSE(mln_version("x") > mln_version("2016A"));
+  });
+}
+
+TEST(VersionOrder, SortsEveryListTheSameWay) {
+  const std::vector<std::string> sorted = {
+      "0a",       "2016a",     "2016a.0", "2016a.0.0", "2016a.1", "2016a.1.0",
+      "2016a.10", "2016az.99", "2016b",   "2016z",     "2016za",  "2017a"};
+  std::mt19937 random(1);
+  for (int i = 0; i < 100; ++i) {
+    auto texts = sorted;
+    std::shuffle(texts.begin(), texts.end(), random);
+    std::sort(texts.begin(), texts.end(), [](const auto& a, const auto& b) {
+      return mln_version(b) > mln_version(a);
+    });
+    EXPECT_EQ(texts, sorted);
+  }
+}
+
+TEST(VersionEquality, AsksForAllFourFields) {
+  const mln_version version("2016a.1.2");
+  EXPECT_TRUE(version == mln_version("2016a.1.2"));
+  for (const char* other :
+       {"2017a.1.2", "2016b.1.2", "2016a.2.2", "2016a.1.3", "2016a.1"})
+    EXPECT_FALSE(version == mln_version(other)) << other;
+}
+
+}  // namespace
