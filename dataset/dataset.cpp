@@ -5,6 +5,7 @@
 
 #include <memory>
 #include <stdexcept>
+#include <utility>
 
 #include "dataset/icu.h"
 #include "dataset/zoneinfo.h"
@@ -12,7 +13,8 @@
 
 mln_dataset::mln_dataset() : mln_dataset(std::string()) {}
 
-mln_dataset::mln_dataset(const std::string& dataset_path) : path(dataset_path) {
+mln_dataset::mln_dataset(std::string dataset_path)
+    : path(std::move(dataset_path)) {
   create_components();
 }
 

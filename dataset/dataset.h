@@ -13,13 +13,13 @@ class mln_dataset {
  public:
   // The system partition's data set.
   mln_dataset();
-  // The data set in the directory `path`, directly below
+  // The data set in the directory `dataset_path`, directly below
   // "/var/db/timezone/tz/" and without a trailing "/"; an empty path means the
   // system partition. Prints "mln_dataset::create_components: bad path PATH"
   // and throws std::invalid_argument, "badpath", for a path that does not begin
   // so. A name that is no version prints the parser's lines and leaves
   // `version` unset. Throws also what the parser and the components throw.
-  explicit mln_dataset(const std::string& path);
+  explicit mln_dataset(std::string dataset_path);
 
   mln_dataset(const mln_dataset&) = delete;
   mln_dataset& operator=(const mln_dataset&) = delete;

@@ -13,7 +13,8 @@ std::string_view icu_schema_in(std::string_view name) {
   if (name.size() < 2) return {};
   const std::string_view digits = name.substr(0, name.size() - 1);
   const char format = name.back();
-  const bool matches = digits.find_first_not_of("0123456789") == digits.npos &&
-                       (format == 'l' || format == 'b' || format == 'e');
+  const bool matches =
+      digits.find_first_not_of("0123456789") == std::string_view::npos &&
+      (format == 'l' || format == 'b' || format == 'e');
   return matches ? name : std::string_view();
 }

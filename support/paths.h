@@ -4,6 +4,8 @@
 // it, when it exists. All are absolute and fixed; nothing can move them.
 #pragma once
 
+#include <cstddef>
+
 namespace paths {
 
 // Both directories are made by whoever sets up the device, never by marlin.
@@ -35,8 +37,8 @@ inline constexpr char system_icu[] = "/usr/share/icu";
 inline constexpr char former_zoneinfo[] = "/usr/share/zoneinfo";
 
 // The length of a path as the prefix rules count it, without the NUL.
-template <unsigned long size>
-constexpr unsigned long length(const char (&)[size]) {
+template <std::size_t size>
+constexpr std::size_t length(const char (&)[size]) {
   return size - 1;
 }
 
