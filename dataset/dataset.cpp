@@ -32,6 +32,7 @@ void mln_dataset::create_components() {
     throw std::invalid_argument("badpath");
   }
   version.parse(version_string);
+  components.reserve(2);
   components.push_back(zoneinfo);
   components.push_back(std::make_shared<mln_icu>(path));
 }

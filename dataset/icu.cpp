@@ -56,13 +56,13 @@ mln_icu::mln_icu() : mln_icu(std::string()) {}
 
 mln_icu::mln_icu(const std::string& path)
     : mln_dataset_component(path),
-      icu_path(path.empty() ? paths::system_icu : path + "/" + "icutz") {
+      icu_path(path.empty() ? paths::system_icu : path + "/icutz") {
   initialize();
 }
 
 void mln_icu::initialize() {
   if (dataset_path.empty()) {
-    schema = read_first_word(icu_path + "/" + "icutzformat.txt");
+    schema = read_first_word(icu_path + "/icutzformat.txt");
     return;
   }
   const auto walk = open_walk(icu_path);

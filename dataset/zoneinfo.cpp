@@ -12,12 +12,12 @@ mln_zoneinfo::mln_zoneinfo() : mln_zoneinfo(std::string()) {}
 mln_zoneinfo::mln_zoneinfo(const std::string& path)
     : mln_dataset_component(path),
       zoneinfo_path(path.empty() ? paths::system_zoneinfo
-                                 : path + "/" + "zoneinfo") {
+                                 : path + "/zoneinfo") {
   read_version();
 }
 
 void mln_zoneinfo::read_version() {
-  version_string = read_first_word(zoneinfo_path + "/" + "+VERSION");
+  version_string = read_first_word(zoneinfo_path + "/+VERSION");
 }
 
 std::string mln_zoneinfo::version() const { return version_string; }

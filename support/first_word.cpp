@@ -10,9 +10,9 @@
 
 namespace {
 
-bool is_white_space(char byte) {
+constexpr auto is_white_space = [](char byte) {
   return byte == ' ' || (byte >= '\t' && byte <= '\r');
-}
+};
 
 class input_file {
  public:

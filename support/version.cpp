@@ -3,7 +3,10 @@
 
 #include <err.h>
 
+#include <charconv>
+#include <stdexcept>
 #include <string_view>
+#include <system_error>
 #include <tuple>
 
 #include "support/version_grammar.h"
@@ -11,7 +14,11 @@
 namespace {
 
 std::int32_t to_number(std::string_view digits) {
-  return std::stoi(std::string(digits));
+  std::int32_t number{};
+  const auto [end, error] =
+      std::from_chars(digits.data(), digits.data() + digits.size(), number);
+  if (error == std::errc::result_out_of_range) throw std::out_of_range("stoi");
+  return number;
 }
 
 std::int32_t to_optional_number(std::string_view digits) {

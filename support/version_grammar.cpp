@@ -5,11 +5,12 @@
 
 namespace {
 
-bool is_digit(char byte) { return byte >= '0' && byte <= '9'; }
-bool is_letter(char byte) { return byte >= 'a' && byte <= 'z'; }
+constexpr auto is_digit = [](char byte) { return byte >= '0' && byte <= '9'; };
+constexpr auto is_letter = [](char byte) { return byte >= 'a' && byte <= 'z'; };
 
 // Splits the longest run of bytes of one kind, possibly empty, off the front.
-std::string_view take_run(std::string_view& text, bool (*belongs)(char)) {
+template <typename Kind>
+std::string_view take_run(std::string_view& text, Kind belongs) {
   const auto end = std::find_if_not(text.begin(), text.end(), belongs);
   const std::string_view run =
       text.substr(0, static_cast<std::size_t>(end - text.begin()));
