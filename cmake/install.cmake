@@ -1,0 +1,40 @@
+# SPDX-License-Identifier: BSD-2-Clause
+#
+# What a device gets. Under libexec, not sbin: the boot runs the program and
+# nobody types its name; hier(7) keeps libexec for just that, and out of reach
+# of anybody's PATH it is not run by accident while the links have readers.
+include(GNUInstallDirs)
+
+# systemd reads its own directories only, whatever the prefix: both are below
+# "lib", never below a library directory such as lib64.
+set(MARLIN_UNIT_DIR
+    lib/systemd/system
+    CACHE STRING "Where the boot unit goes; empty: nowhere")
+set(MARLIN_TMPFILES_DIR
+    lib/tmpfiles.d
+    CACHE STRING "Where the tmpfiles.d snippet goes; empty: nowhere")
+
+install(TARGETS marlin RUNTIME DESTINATION ${CMAKE_INSTALL_LIBEXECDIR})
+install(FILES man/marlin.8 DESTINATION ${CMAKE_INSTALL_MANDIR}/man8)
+install(FILES man/marlin-layout.5 DESTINATION ${CMAKE_INSTALL_MANDIR}/man5)
+
+if(MARLIN_UNIT_DIR)
+  configure_file(packaging/marlin.service.in packaging/marlin.service @ONLY)
+  install(FILES ${PROJECT_BINARY_DIR}/packaging/marlin.service
+          DESTINATION ${MARLIN_UNIT_DIR})
+  set(wants ${PROJECT_BINARY_DIR}/packaging/sysinit.target.wants)
+  file(MAKE_DIRECTORY ${wants})
+  file(CREATE_LINK ../marlin.service ${wants}/marlin.service SYMBOLIC)
+  install(FILES ${wants}/marlin.service
+          DESTINATION ${MARLIN_UNIT_DIR}/sysinit.target.wants)
+endif()
+if(MARLIN_TMPFILES_DIR)
+  install(FILES packaging/marlin.conf DESTINATION ${MARLIN_TMPFILES_DIR})
+endif()
+
+install(FILES README.md CHANGELOG.md LICENSE
+        DESTINATION ${CMAKE_INSTALL_DOCDIR})
+install(FILES docs/architecture.md docs/decisions.md docs/integration.md
+              docs/demo.svg DESTINATION ${CMAKE_INSTALL_DOCDIR}/docs)
+install(DIRECTORY packaging/examples DESTINATION ${CMAKE_INSTALL_DOCDIR}
+        USE_SOURCE_PERMISSIONS)
