@@ -1,0 +1,753 @@
+# SPDX-License-Identifier: BSD-2-Clause
+"""One boot as it has to be, in Python.
+
+Written from what the program has to do, not from its code, so that a reader can
+check the one and the proofs then compare it with the other. In goes a device, a
+tree of nodes; out come the device afterwards, the lines that are printed, how
+the process ends, and every file-system call on the way, in order, any of which
+can be made to fail.
+
+Byte strings are Python strings in which every character stands for one byte
+(latin-1), so that lengths are byte counts and texts compare as bytes do.
+
+The sections, from the bottom up:
+  1. the device: nodes, and how the kernel walks a path
+  2. the file-system calls, which can be made to fail
+  3. the four primitives, and the C library's remove(3)
+  4. the first word of a file
+  5. the walk through a directory of ICU data
+  6. version texts
+  7. components and data sets
+  8. the links that are read
+  9. the legacy link, local time, the record
+ 10. the pass
+"""
+
+import os
+import re
+from errno import (EACCES, EEXIST, EISDIR, EINVAL, ELOOP, ENAMETOOLONG, ENOENT,
+                   ENOTDIR, ENOTEMPTY, ENXIO, ESPIPE)
+
+ZONEINFO = "/var/db/timezone/zoneinfo"
+ICUTZ = "/var/db/timezone/icutz"
+LOCALTIME = "/var/db/timezone/localtime"
+TZ_LATEST = "/var/db/timezone/tz_latest"
+RECORD = "/var/db/timezone/TZVersionDiffRecord"
+LEGACY_ICUTZ = "/var/db/icutz"
+OLD_ICU = "/var/db/icu"
+DOWNLOADS = "/var/db/timezone/tz/"
+SYSTEM_ZONEINFO = "/usr/share/zoneinfo.default"
+SYSTEM_ICU = "/usr/share/icu"
+FORMER_ZONEINFO = "/usr/share/zoneinfo"
+DEFAULT_ZONE = "America/Los_Angeles"
+DEFAULT_LOCALTIME = "/var/db/timezone/zoneinfo/America/Los_Angeles"
+
+# --- 1. The device ----------------------------------------------------------
+
+
+class Failed(Exception):
+  """A system call that failed, with its error number."""
+
+  def __init__(self, error):
+    super().__init__(error)
+    self.error = error
+
+
+class Node:
+  """Whatever can stand at a path. `kind` is dir, file, link or fifo."""
+
+  def __init__(self, kind, mode=0o777, text="", entries=None):
+    self.kind = kind
+    self.mode = mode  # of a link: without meaning
+    self.text = text  # a file's content, a link's target
+    self.entries = entries  # a directory's, by name, in listing order
+
+  def permits(self, wanted):
+    """Whether the owner, which the program runs as, may: 4, 2, 1 or sums."""
+    return self.mode >> 6 & wanted == wanted
+
+
+def names_in(path):
+  return [name for name in path.split("/") if name]
+
+
+class Device:
+  """A tree of nodes, with verbs to build one and the kernel's path walk."""
+
+  def __init__(self):
+    self.root = Node("dir", 0o755, entries={})
+    for path in ("/var/db", "/usr/share"):
+      self.directory(path)
+
+  def directory(self, path, mode=0o755):
+    """Makes a directory, and those that lead to it."""
+    here = self.root
+    for name in names_in(path):
+      if name not in here.entries:
+        here.entries[name] = Node("dir", 0o755, entries={})
+      here = here.entries[name]
+    here.mode = mode
+    return here
+
+  def put(self, path, node):
+    parent, _, name = path.rpartition("/")
+    here = self.root
+    for step in names_in(parent):
+      here = here.entries.setdefault(step, Node("dir", 0o755, entries={}))
+    here.entries[name] = node
+
+  def file(self, path, content="", mode=0o644):
+    self.put(path, Node("file", mode, content))
+
+  def link(self, path, target):
+    self.put(path, Node("link", text=target))
+
+  def fifo(self, path, mode=0o644):
+    self.put(path, Node("fifo", mode))
+
+  def drop(self, path):
+    parent, _, name = path.rpartition("/")
+    self.find(parent).entries.pop(name, None)
+
+  def find(self, path):
+    """The node at a path, links and permissions not minded, or None."""
+    here = self.root
+    for name in names_in(path):
+      if here.kind != "dir" or name not in here.entries:
+        return None
+      here = here.entries[name]
+    return here
+
+  def everything(self):
+    """Every (path, node) below the two places that a device is made of."""
+    def below(path, node):
+      yield path, node
+      if node.kind == "dir":
+        for name, child in node.entries.items():
+          yield from below(path + "/" + name, child)
+    for path in ("/usr/share", "/var/db"):
+      yield from below(path, self.find(path))
+
+  def walk(self, path, follow):
+    """What the kernel finds at a path: (directory, name, node), the node None
+    where only the last name is missing. Fails as the kernel does."""
+    if not path:
+      raise Failed(ENOENT)
+    if len(path) > 4095:
+      raise Failed(ENAMETOOLONG)
+    way, todo, links = [self.root], names_in(path), 0
+    must_be_directory = path.endswith("/")
+    directory, name = None, None
+    while todo:
+      directory, name = way[-1], todo.pop(0)
+      if directory.kind != "dir":
+        raise Failed(ENOTDIR)
+      if not directory.permits(1):
+        raise Failed(EACCES)
+      if name == ".":
+        continue
+      if name == "..":
+        if len(way) > 1:
+          way.pop()
+        continue
+      if len(name) > 255:
+        raise Failed(ENAMETOOLONG)
+      node = directory.entries.get(name)
+      if node is None:
+        if todo:
+          raise Failed(ENOENT)
+        return directory, name, None
+      if node.kind == "link" and (todo or follow or must_be_directory):
+        links += 1
+        if links > 40:
+          raise Failed(ELOOP)
+        if node.text.startswith("/"):
+          way = [self.root]
+        if not todo and node.text.endswith("/"):
+          must_be_directory = True
+        todo = names_in(node.text) + todo
+        continue
+      way.append(node)
+    if must_be_directory and way[-1].kind != "dir":
+      raise Failed(ENOTDIR)
+    return directory, name, way[-1]
+
+
+# --- 2. The file-system calls -----------------------------------------------
+
+
+class Killed(BaseException):
+  """The process is gone; no handler sees this."""
+
+
+class Kernel:
+  """Carries out the calls of one boot and writes them down.
+
+  `fault(number, name, path)` gives the error number with which a call fails, or
+  None; calls are counted from 1. A call that fails so has no effect. The boot
+  is killed before call `killed_before`, if that is given.
+  """
+
+  def __init__(self, device, fault=None, killed_before=None):
+    self.device = device
+    self.fault = fault or (lambda number, name, path: None)
+    self.killed_before = killed_before
+    self.calls = []  # (name, path)
+    self.changed = set()  # nodes that a call changed, made or removed
+    # A walk that cannot be started takes a lack of memory, not a failing call.
+    self.walk_error = lambda path: None
+
+  def _call(self, name, path=None):
+    if len(self.calls) + 1 == self.killed_before:
+      raise Killed()
+    self.calls.append((name, path))
+    error = self.fault(len(self.calls), name, path)
+    if error is not None:
+      raise Failed(error)
+
+  def _existing(self, path, follow):
+    directory, name, node = self.device.walk(path, follow)
+    if node is None:
+      raise Failed(ENOENT)
+    return directory, name, node
+
+  def access(self, path):
+    self._call("access", path)
+    self._existing(path, follow=True)
+
+  def readlink(self, path):
+    self._call("readlink", path)
+    node = self._existing(path, follow=False)[2]
+    if node.kind != "link":
+      raise Failed(EINVAL)
+    return node.text
+
+  def symlink(self, target, path):
+    self._call("symlink", path)
+    if not target:
+      raise Failed(ENOENT)
+    if len(target) > 4095:
+      raise Failed(ENAMETOOLONG)
+    directory, name, node = self.device.walk(path, follow=False)
+    if node is not None:
+      raise Failed(EEXIST)
+    if not directory.permits(3):
+      raise Failed(EACCES)
+    made = Node("link", text=target)
+    directory.entries[name] = made
+    self.changed |= {directory, made}
+
+  def unlink(self, path):
+    self._call("unlink", path)
+    directory, name, node = self._existing(path, follow=False)
+    if not directory.permits(3):
+      raise Failed(EACCES)
+    if node.kind == "dir":
+      raise Failed(EISDIR)
+    del directory.entries[name]
+    self.changed |= {directory, node}
+
+  def rmdir(self, path):
+    self._call("rmdir", path)
+    directory, name, node = self._existing(path, follow=False)
+    if not directory.permits(3):
+      raise Failed(EACCES)
+    if node.kind != "dir":
+      raise Failed(ENOTDIR)
+    if node.entries:
+      raise Failed(ENOTEMPTY)
+    del directory.entries[name]
+    self.changed |= {directory, node}
+
+  def open(self, path):
+    self._call("open", path)
+    node = self._existing(path, follow=True)[2]
+    if not node.permits(4):
+      raise Failed(EACCES)
+    return node
+
+  def create(self, path):
+    """open(2) to write, with everything that was in the file thrown away."""
+    self._call("create", path)
+    directory, name, node = self.device.walk(path, follow=True)
+    if node is None:
+      if not directory.permits(3):
+        raise Failed(EACCES)
+      node = Node("file", 0o644)  # 0666 as this device's umask cuts it
+      directory.entries[name] = node
+      self.changed |= {directory, node}
+      return node
+    if node.kind == "dir":
+      raise Failed(EISDIR)
+    if not node.permits(2):
+      raise Failed(EACCES)
+    if node.kind == "fifo":
+      raise Failed(ENXIO)  # without waiting for a reader
+    node.text = ""
+    self.changed.add(node)
+    return node
+
+  def pread(self, node, size, position):
+    self._call("pread")
+    if node.kind == "dir":
+      raise Failed(EISDIR)
+    if node.kind == "fifo":
+      raise Failed(ESPIPE)
+    return node.text[position:position + size]
+
+  def write(self, node, text):
+    self._call("write")
+    node.text += text
+    self.changed.add(node)
+
+  def fstat(self):
+    self._call("fstat")
+
+  def close(self):
+    """A descriptor is closed whatever this reports."""
+    try:
+      self._call("close")
+    except Failed:
+      pass
+
+  def stat(self, path):
+    self._call("stat", path)
+    return self._existing(path, follow=True)[2]
+
+  def lstat(self, path):
+    self._call("lstat", path)
+    return self._existing(path, follow=False)[2]
+
+  def entry_status(self, directory, name):
+    """lstat(2) of a name in the working directory."""
+    self._call("lstat", name)
+    return directory.entries[name]
+
+  def fchdir(self, node=None):
+    """To a directory, or back to where the process started."""
+    self._call("fchdir")
+    if node is not None and not node.permits(1):
+      raise Failed(EACCES)
+
+  def getdents(self, node):
+    self._call("getdents")
+    return list(node.entries)
+
+
+# --- 10 holds the pass; these are what it is built of ------------------------
+
+
+class Thrown(Exception):
+  """Whatever the program throws; no handler looks at more than that."""
+
+
+def quietly(call, *arguments):
+  """Whether a call succeeded."""
+  try:
+    call(*arguments)
+  except Failed:
+    return False
+  return True
+
+
+def shown(text):
+  """A text as an argument of a printed line: up to its first NUL."""
+  return text.split("\0", 1)[0]
+
+
+UNSET_VERSION = (-1, "", -1, -1)
+WHITE_SPACE = " \t\n\v\f\r"
+INT_MAX = 2147483647
+# How much is read at a time; the outcome does not depend on it.
+READ_SIZE = 4096
+
+
+def schema_of_data_file(entry):
+  """A regular file that others may read, of the right name."""
+  name, node = entry
+  match = re.fullmatch(r"icutz([0-9]+[lbe])\.dat", name)
+  readable = node.kind == "file" and node.mode & 0o004
+  return match.group(1) if match and readable else ""
+
+
+class Boot:
+  """One pass over one kernel.
+
+  `lines` gets (text, error) for every line that is printed, without the name of
+  the program. Where `error` is not None, a call has just failed and its text
+  ends the line; otherwise the line ends in whatever was left.
+  """
+
+  def __init__(self, kernel):
+    self.kernel = kernel
+    self.lines = []
+
+  def warn(self, text, error=None):
+    self.lines.append((text, error))
+
+  # --- 3. The primitives ------------------------------------------------------
+
+  def remove(self, path):
+    try:
+      self.kernel.unlink(path)
+    except Failed as failed:
+      if failed.error == ENOENT:
+        return
+      self.warn(f"remove: could not remove {path}", failed.error)
+      raise Thrown from failed
+
+  def exists(self, path):
+    try:
+      self.kernel.access(path)
+    except Failed:
+      return False
+    return True
+
+  def read_symlink(self, path):
+    try:
+      return self.kernel.readlink(path)[:1024]
+    except Failed as failed:
+      if failed.error == ENOENT:
+        return ""
+      self.warn(f"read_symlink: {path}", failed.error)
+      raise Thrown from failed
+
+  def create_symlink(self, target, link):
+    try:
+      self.kernel.symlink(target, link)
+    except Failed as failed:
+      self.warn(f"create_symlink: from {link} to {target}", failed.error)
+      raise Thrown from failed
+
+  def c_library_remove(self, path):
+    """remove(3): also an empty directory, which unlink(2) tells by EISDIR. Its
+    result is ignored wherever it is used."""
+    try:
+      self.kernel.unlink(path)
+    except Failed as failed:
+      if failed.error == EISDIR:
+        try:
+          self.kernel.rmdir(path)
+        except Failed:
+          pass
+
+  def error_of_last_line(self):
+    """For a line that directly follows that of a call that failed."""
+    return self.lines[-1][1]
+
+  # --- 4. The first word of a file --------------------------------------------
+
+  def first_word(self, path):
+    """Empty where there is no such file, nothing that can be read, or no word.
+    What is no regular file cannot be read. When reading fails midway the word
+    is what came before."""
+    try:
+      file = self.kernel.open(path)
+    except Failed:
+      return ""
+    text = ""
+    try:
+      while True:
+        some = self.kernel.pread(file, READ_SIZE, len(text))
+        if not text and len(some) == READ_SIZE:
+          self.kernel.fstat()  # whether this is a regular file after all
+        text += some
+        word_has_ended = re.compile(r"[^ \t-\r][ \t-\r]").search(
+            text, max(0, len(text) - len(some) - 1))
+        if not some or word_has_ended:
+          break
+    except Failed:
+      pass
+    self.kernel.close()
+    word = text.lstrip(WHITE_SPACE)
+    return re.split(r"[ \t-\r]", word, maxsplit=1)[0]
+
+  # --- 5. The walk through a directory of ICU data ----------------------------
+
+  def icu_schema(self, dataset_path):
+    """The schema of an update: that of the first data file, in listing order;
+    empty where there is none."""
+    icu_path = dataset_path + "/icutz"
+    error = self.kernel.walk_error(icu_path)
+    if error is not None:
+      # The text of the error stands twice: once here, once from warn itself.
+      self.warn(f"tz_icu::initialize: fts_open of {icu_path} failed, "
+                f"{os.strerror(error)}", error)
+      raise Thrown
+    schema = self.walk(icu_path, schema_of_data_file)
+    if not schema:
+      self.warn(f"No ICU schema found for {dataset_path}")
+    return schema
+
+  def walk(self, root, schema_of):
+    """What `schema_of` gives for the first direct entry for which it gives
+    something. Entries that cannot be examined do not count.
+
+    These are the calls of fts(3) as the GNU C library makes them for the
+    options physical, follow the root, one device. What they come to: a
+    directory that cannot be examined, opened or entered has no entries; a
+    listing that breaks off has those read so far; an entry that cannot be
+    examined does not count; what fails on the way out changes nothing. fts(3)
+    wants to be able to come back to the working directory: if that cannot be
+    opened it does without changing directories, and if it cannot be entered
+    the walk is over.
+    """
+    kernel = self.kernel
+    directory = None
+    try:
+      directory = kernel.stat(root)
+    except Failed:
+      quietly(kernel.lstat, root)  # a dangling link, or nothing at all?
+    moves = quietly(kernel.open, ".")
+
+    def go_back():
+      return not moves or quietly(kernel.fchdir)
+
+    found = ""
+    if go_back() and directory is not None and directory.kind == "dir":
+      entered, entries = self.list_entries(root, directory, moves)
+      found = next((schema for schema in map(schema_of, entries) if schema), "")
+      if entered and not found:
+        go_back()  # from the last entry
+    go_back()
+    if moves:
+      kernel.close()
+    return found
+
+  def list_entries(self, root, directory, moves):
+    """(whether the directory was entered, its entries as (name, node))"""
+    kernel = self.kernel
+    if not quietly(kernel.open, root):
+      return False, []
+    entries = []
+    is_directory = quietly(kernel.fstat)
+    entered = is_directory and (not moves or (
+        quietly(kernel.fstat) and quietly(kernel.fchdir, directory)))
+    if entered:
+      try:
+        for name in kernel.getdents(directory):
+          try:
+            node = (kernel.entry_status(directory, name) if moves
+                    else kernel.lstat(root + "/" + name))
+            entries.append((name, node))
+          except Failed:
+            pass
+        kernel.getdents(directory)  # the end of the list
+      except Failed:
+        pass
+    kernel.close()
+    return entered, entries
+
+  # --- 6. Version texts ---------------------------------------------------------
+
+  def parse_version(self, text):
+    """(year, letters, major, minor), which compare as versions do."""
+    match = re.fullmatch(
+        r"([0-9]+)([a-z]+)(?:\.([0-9]+))?(?:\.([0-9]+))?", text)
+    if not match:
+      self.warn(f"Cannot parse version string {shown(text)}, "
+                "results.size() = 0")
+      self.warn(f"Cannot parse version string {shown(text)}")
+      return UNSET_VERSION
+
+    def number(digits):
+      if digits is None:
+        return -1
+      if int(digits) > INT_MAX:
+        raise Thrown
+      return int(digits)
+
+    year, letters, major, minor = match.groups()
+    return number(year), letters, number(major), number(minor)
+
+  # --- 7. Components and data sets ----------------------------------------------
+
+  def data_set(self, path):
+    """Builds the data set of a path, the empty one that of the system."""
+    release = self.first_word(zoneinfo_path(path) + "/+VERSION")
+    if path == "":
+      version_text = release + ".1.0"
+    elif len(path) >= 21 and path[:20] == DOWNLOADS:
+      version_text = path[20:]
+    else:
+      self.warn(f"mln_dataset::create_components: bad path {path}")
+      raise Thrown
+    version = self.parse_version(version_text)
+    if path == "":
+      schema = self.first_word(SYSTEM_ICU + "/icutzformat.txt")
+    else:
+      schema = self.icu_schema(path)
+    return DataSet(path, version_text, version, schema)
+
+  def activate(self, data_set):
+    self.activate_zoneinfo(data_set)
+    self.activate_icu(data_set)
+
+  def activate_zoneinfo(self, data_set):
+    try:
+      self.remove(ZONEINFO)
+    except Thrown:
+      self.warn("Unlink of zoneinfo softlink failed",
+                self.error_of_last_line())
+    self.create_symlink(zoneinfo_path(data_set.path), ZONEINFO)
+
+  def activate_icu(self, data_set):
+    try:
+      self.remove(ICUTZ)
+      self.remove(LEGACY_ICUTZ)
+    except Thrown:
+      self.warn("unlink of ICU softlink failed", self.error_of_last_line())
+    if data_set.path != "":
+      self.create_symlink(data_set.path + "/icutz", ICUTZ)
+
+  def reset_to_system_partition(self):
+    self.activate(self.data_set(""))
+
+  # --- 8. The links that are read -----------------------------------------------
+
+  def latest_update_path(self):
+    return self.read_symlink(TZ_LATEST)
+
+  def current_dataset_path(self):
+    return self.dataset_path_from_link(self.read_symlink(ZONEINFO))
+
+  def dataset_path_from_link(self, target):
+    if len(target) >= 21 and target[:20] == DOWNLOADS:
+      last_slash = target.rindex("/")
+      if last_slash > 20:
+        return target[:last_slash]
+    elif target == SYSTEM_ZONEINFO:
+      return ""
+    self.warn(f"Bad zoneinfo link {target}")
+    raise Thrown
+
+  # --- 9. The legacy link, local time, the record ---------------------------------
+
+  def migrate_legacy_icu_link(self):
+    if self.exists(LEGACY_ICUTZ) and not self.exists(ICUTZ):
+      try:
+        self.create_symlink(self.read_symlink(LEGACY_ICUTZ), ICUTZ)
+      except Thrown:
+        self.warn(f"Could not migrate {LEGACY_ICUTZ} to {ICUTZ}",
+                  self.error_of_last_line())
+    if self.exists(LEGACY_ICUTZ):
+      try:
+        self.remove(LEGACY_ICUTZ)
+      except Thrown:
+        self.warn(f"Could not remove {LEGACY_ICUTZ}",
+                  self.error_of_last_line())
+
+  def repair_localtime_link(self):
+    lines_before = len(self.lines)
+    try:
+      target = self.read_symlink(LOCALTIME)
+      if target[:25] == ZONEINFO:
+        return
+      if target[:19] != FORMER_ZONEINFO:
+        raise Thrown
+      corrected = ZONEINFO + target[19:]
+      self.warn(f"Correcting localtime link to {corrected}")
+      if not self.exists(corrected):
+        raise Thrown
+      self.c_library_remove(LOCALTIME)
+      self.create_symlink(corrected, LOCALTIME)
+    except Thrown:
+      # A primitive's line, if there is one, directly precedes this.
+      printed = len(self.lines) > lines_before
+      self.warn(f"localtime link invalid; resetting to {DEFAULT_ZONE}",
+                self.error_of_last_line() if printed else None)
+      self.c_library_remove(LOCALTIME)
+      self.create_symlink(DEFAULT_LOCALTIME, LOCALTIME)
+
+  def write_record(self, old, new):
+    """Quiet, whatever fails. What is no regular file is not written to."""
+    try:
+      file = self.kernel.create(RECORD)
+    except Failed:
+      return
+    try:
+      self.kernel.fstat()
+      self.kernel.write(file, old.version_text + "_" + new.version_text)
+    except Failed:
+      pass
+    self.kernel.close()
+
+  # --- 10. The pass -----------------------------------------------------------
+
+  def run(self):
+    # The protection classes: this platform has none.
+    self.migrate_legacy_icu_link()
+    self.c_library_remove(OLD_ICU)
+    try:
+      self.select_data_set()
+    except Thrown:
+      self.warn("Unable to locate data; resetting to system partition")
+      self.reset_to_system_partition()
+    self.repair_localtime_link()
+
+  def select_data_set(self):
+    system = self.data_set("")
+    latest = self.latest_update_path()
+    try:
+      current_path = self.current_dataset_path()
+    except Thrown:
+      self.warn("Invalid current symlinks; resetting to system partition")
+      self.reset_to_system_partition()
+      current_path = ""
+    current = self.data_set(current_path)
+    if current.schema == system.schema and not system.version > current.version:
+      active = current
+    else:
+      self.warn("Symlink points at data incompatible with installed system")
+      self.reset_to_system_partition()
+      active = system
+    if latest == "":
+      return
+    update = self.data_set(latest)
+    # Compared with the current set, also when the links have been reset.
+    if update.schema == system.schema and update.version > current.version:
+      self.activate(update)
+      self.write_record(active, update)
+    else:
+      self.warn("New update not compatible or older version: "
+                f"{shown(update.version_text)} vs. "
+                f"{shown(current.version_text)}")
+
+
+class DataSet:
+
+  def __init__(self, path, version_text, version, schema):
+    self.path = path
+    self.version_text = version_text
+    self.version = version
+    self.schema = schema
+
+
+def zoneinfo_path(path):
+  return SYSTEM_ZONEINFO if path == "" else path + "/zoneinfo"
+
+
+class Outcome:
+  """What one boot comes to; the device itself has been changed."""
+
+  def __init__(self, kernel, lines, ending):
+    self.calls = kernel.calls
+    self.changed = kernel.changed
+    self.lines = lines
+    self.ending = ending  # "exit 0", "abort" or "killed"
+
+
+def boot(device, fault=None, killed_before=None, walk_error=None):
+  """Boots a device, which changes it; the arguments are those of Kernel."""
+  kernel = Kernel(device, fault, killed_before)
+  if walk_error:
+    kernel.walk_error = walk_error
+  pass_ = Boot(kernel)
+  try:
+    pass_.run()
+    ending = "exit 0"
+  except Thrown:
+    ending = "abort"  # nobody caught it
+  except Killed:
+    ending = "killed"
+  return Outcome(kernel, pass_.lines, ending)
