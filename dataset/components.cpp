@@ -5,8 +5,11 @@
 
 bool compatible_components(const component_list& receivers,
                            const component_list& others) {
-  return std::equal(receivers.begin(), receivers.end(), others.begin(),
-                    others.end(), [](const auto& receiver, const auto& other) {
-                      return receiver->compatible_schema(*other);
-                    });
+  // std::equal would compare the lengths first, and ask nothing at all of lists
+  // that differ there.
+  const std::size_t common = std::min(receivers.size(), others.size());
+  for (std::size_t i = 0; i < common; ++i) {
+    if (!receivers[i]->compatible_schema(*others[i])) return false;
+  }
+  return receivers.size() == others.size();
 }

@@ -17,8 +17,10 @@ class mln_dataset {
   // "/var/db/timezone/tz/" and without a trailing "/"; an empty path means the
   // system partition. Prints "mln_dataset::create_components: bad path PATH"
   // and throws std::invalid_argument, "badpath", for a path that does not begin
-  // so. A name that is no version prints the parser's lines and leaves
-  // `version` unset. Throws also what the parser and the components throw.
+  // with that directory or names nothing in it. What follows it is the version
+  // text: one that does not parse, as that of a deeper path, prints the
+  // parser's lines and leaves `version` unset. Throws also what the parser and
+  // the components throw.
   explicit mln_dataset(std::string dataset_path);
 
   mln_dataset(const mln_dataset&) = delete;

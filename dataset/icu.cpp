@@ -31,7 +31,7 @@ walk_pointer open_walk(std::string& directory) {
 
 // Whether an entry may be a data file at all. An empty name needs no test here:
 // the grammar of names refuses it.
-bool is_public_file_of_the_root(const FTSENT& entry) {
+bool is_direct_file_that_others_may_read(const FTSENT& entry) {
   return entry.fts_errno == 0 && entry.fts_level == 1 &&
          entry.fts_info == FTS_F && (entry.fts_statp->st_mode & S_IROTH) != 0;
 }
@@ -39,7 +39,7 @@ bool is_public_file_of_the_root(const FTSENT& entry) {
 // The schema of the first data file, in the order of the walk.
 std::string first_schema(FTS& walk) {
   while (FTSENT* const entry = ::fts_read(&walk)) {
-    if (is_public_file_of_the_root(*entry)) {
+    if (is_direct_file_that_others_may_read(*entry)) {
       const auto schema = icu_schema_in({entry->fts_name, entry->fts_namelen});
       if (!schema.empty()) return std::string(schema);
     }
@@ -65,7 +65,7 @@ void mln_icu::initialize() {
     schema = read_first_word(icu_path + "/icutzformat.txt");
     return;
   }
-  const auto walk = open_walk(icu_path);
+  auto walk = open_walk(icu_path);
   if (!walk) {
     // Deliberate: the prefix is not the class's name, and the error text stands
     // twice, because warn(3) appends it again; logs are searched for the line
@@ -76,6 +76,7 @@ void mln_icu::initialize() {
     throw errno;
   }
   schema = first_schema(*walk);
+  walk.reset();
   if (schema.empty())
     ::warn("No ICU schema found for %s", dataset_path.c_str());
 }
@@ -98,9 +99,9 @@ void mln_icu::activate() const {
     // Creating the link is tried all the same; its failure is the caller's.
     ::warn("unlink of ICU softlink failed");
   }
-  // Deliberate: the system partition's ICU data gets no link, unlike its
-  // zoneinfo tree, because readers look for it in its own place when there is
-  // no link. Pinned by IcuActivate.CreatesNoLinkForTheSystemPartition.
+  // Deliberate: no link is made to the system partition's ICU data, unlike to
+  // its zoneinfo tree, because that data is used in its own place and a link
+  // means an update. Pinned by IcuActivate.CreatesNoLinkForTheSystemPartition.
   if (dataset_path.empty()) return;
   fsutil::create_symlink(icu_path, paths::icu_link);
 }

@@ -26,8 +26,8 @@ class mln_zoneinfo final : public mln_dataset_component {
   // "+VERSION" file when the component was built; empty if it had none.
   std::string version() const;
 
-  std::string zoneinfo_path;   // the tree
-  std::string version_string;  // what version() returns
+  std::string zoneinfo_path;
+  std::string version_string;
 
  private:
   void read_version();

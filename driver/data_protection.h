@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: BSD-2-Clause
 //
-// Makes the time-zone directories readable before the device's first unlock, on
-// platforms that encrypt by data-protection class.
+// Lifts data protection from the time-zone directories, on platforms that have
+// data-protection classes: what they hold is needed before anything else.
 #pragma once
 
 // Puts "/var/db/timezone/" and "/var/db/timezone/tz/" into class D.

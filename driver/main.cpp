@@ -20,7 +20,7 @@ void write_whole_lines() {
 }  // namespace
 
 // One boot, in order:
-//  1. The two time-zone directories become readable before the first unlock.
+//  1. The two time-zone directories are freed from data protection.
 //  2. The legacy link "/var/db/icutz" moves to "/var/db/timezone/icutz".
 //  3. "/var/db/icu" goes.
 //  4. The system partition's data set is read, and what "tz_latest" announces.

@@ -19,6 +19,7 @@ bool is_regular(int descriptor) {
 void write_all(int descriptor, std::string_view bytes) {
   while (!bytes.empty()) {
     const ssize_t written = ::write(descriptor, bytes.data(), bytes.size());
+    // A full disk costs the record and nothing else.
     if (written <= 0) return;
     bytes.remove_prefix(static_cast<std::size_t>(written));
   }
@@ -34,6 +35,7 @@ void record_version_change(const std::string& from, const std::string& to) {
       paths::version_record,
       O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC | O_NONBLOCK | O_NOCTTY, 0666);
   if (descriptor < 0) return;
+  // Whoever reads a FIFO or has a device there did not ask for a record.
   if (is_regular(descriptor)) write_all(descriptor, record);
   ::close(descriptor);
 }

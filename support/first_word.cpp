@@ -54,21 +54,31 @@ class input_file {
   off_t position_ = 0;
 };
 
+void extract_word(input_file& file, std::string& word) {
+  char buffer[4096];
+  for (;;) {
+    const std::string_view bytes = file.read(buffer, sizeof buffer);
+    if (bytes.empty()) return;
+    auto start = bytes.begin();
+    if (word.empty())
+      start = std::find_if_not(start, bytes.end(), is_white_space);
+    const auto end = std::find_if(start, bytes.end(), is_white_space);
+    word.append(start, end);
+    if (end != bytes.end() && !word.empty()) return;
+  }
+}
+
 }  // namespace
 
 std::string read_first_word(const std::string& path) {
   std::string word;
   input_file file(path);
   if (!file.is_open()) return word;
-  char buffer[4096];
-  for (;;) {
-    const std::string_view bytes = file.read(buffer, sizeof buffer);
-    if (bytes.empty()) return word;
-    auto start = bytes.begin();
-    if (word.empty())
-      start = std::find_if_not(start, bytes.end(), is_white_space);
-    const auto end = std::find_if(start, bytes.end(), is_white_space);
-    word.append(start, end);
-    if (end != bytes.end() && !word.empty()) return word;
+  try {
+    extract_word(file, word);
+  } catch (...) {
+    // A word that does not fit into memory is cut, as a file stream would cut
+    // it, so that an absurd file does not cost the boot its data set.
   }
+  return word;
 }

@@ -1,15 +1,15 @@
 // SPDX-License-Identifier: BSD-2-Clause
 //
-// Reads the release of a zoneinfo tree and the format of the system's ICU data,
-// each of which is the first word of a text file.
+// The first word of a text file, as extraction from a file stream would give
+// it, at a fraction of a stream's cost and without ever blocking.
 #pragma once
 
 #include <string>
 
 // The first run of bytes that are not white space (blank, \t, \n, \v, \f, \r)
 // in the file at `path`, of whatever length, NUL bytes and all; the rest of the
-// file is not looked at. Empty when there is no such word, or no regular file
-// that can be opened and read; when reading fails midway, what came before.
-// Never blocks on a FIFO or a device, prints nothing, throws only on memory
-// exhaustion. open(2), pread(2).
+// file is not looked at. Empty when there is no such word, or no file that can
+// be opened and read; when reading fails or memory runs out midway, what came
+// before. A FIFO, and a device that can fill a buffer, count as unreadable.
+// Prints and throws nothing. open(2), pread(2).
 std::string read_first_word(const std::string& path);

@@ -25,8 +25,8 @@ inline constexpr char latest_update_link[] = "/var/db/timezone/tz_latest";
 // Written here whenever an update is activated; it outlives later boots.
 inline constexpr char version_record[] = "/var/db/timezone/TZVersionDiffRecord";
 
-// Left behind by older systems: where the ICU link used to be, and what was
-// there before it. They differ by two letters; both are meant.
+// Left behind by older systems, and removed: where the ICU link used to be, and
+// a place without the two last letters. Both are meant.
 inline constexpr char legacy_icu_link[] = "/var/db/icutz";
 inline constexpr char obsolete_icu[] = "/var/db/icu";
 
@@ -42,7 +42,7 @@ constexpr std::size_t length(const char (&)[size]) {
   return size - 1;
 }
 
-// The rules for links and data-set paths speak of these byte counts.
+// A slip of the keyboard in one of these would accept the wrong links.
 static_assert(length(download_root) == 20);
 static_assert(length(zoneinfo_link) == 25);
 static_assert(length(former_zoneinfo) == 19);

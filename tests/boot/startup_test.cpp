@@ -1,6 +1,8 @@
 // SPDX-License-Identifier: BSD-2-Clause
 //
 // Whole boots with the program as it ships.
+#include <sys/resource.h>
+
 #include <cerrno>
 #include <csignal>
 
@@ -57,7 +59,7 @@ class StartupPass : public DeviceTest {
   }
 };
 
-// --- Nothing to do ----------------------------------------------------------
+// --- Nothing to do
 
 TEST_F(StartupPass, TouchesNothingOnADeviceThatWasNeverUpdated) {
   boot_changes_nothing_and_prints(no_lines());
@@ -88,7 +90,7 @@ TEST_F(StartupPass, IgnoresItsArguments) {
   EXPECT_EQ(look_at_everything(), before);
 }
 
-// --- Updates ----------------------------------------------------------------
+// --- Updates
 
 TEST_F(StartupPass, ActivatesACompatibleNewerUpdate) {
   install_update("2024a.1.0", "44l");
@@ -182,9 +184,9 @@ TEST_F(StartupPass, ComparesTheUpdateWithTheCurrentSetAndNotWithTheSystem) {
       lines(warning(not_activated("2024a.1.0", "2024b.1.0"))));
 }
 
-TEST_F(StartupPass, ActivatesAnUpdateThoughItsAnnouncedDirectoryIsEmpty) {
-  // Only a schema is asked for, and here both have none; the links then lead
-  // nowhere until the next boot, when the same comparison keeps them.
+TEST_F(StartupPass, ActivatesAnUpdateThoughItsAnnouncedDirectoryIsMissing) {
+  // Only the schema is compared, and here neither has one. The links then lead
+  // nowhere, and the next boot finds nothing wrong with them.
   wipe(system_icu);
   make_link(tz_latest, update("2024a.1.0"));
   boot_prints(
@@ -429,6 +431,25 @@ TEST_F(StartupPass, StillRepairsTheLocalTimeAfterTheLastResort) {
   EXPECT_EQ(link_at(local_time), default_localtime);
 }
 
+TEST_F(StartupPass, EndsWithADefaultLocalTimeWhenTheCorrectedLinkFails) {
+  point_localtime_at("/usr/share/zoneinfo/Europe/Paris");
+  const outcome booted =
+      run({"/usr/bin/strace", "-qq", "-o", "/dev/null", "-E",
+           "ASAN_OPTIONS=detect_leaks=0", "-e",
+           "inject=?symlink,symlinkat:error=EIO:when=1", MARLIN_PROGRAM});
+  EXPECT_EQ(booted.exit_status, 0);
+  EXPECT_THAT(
+      booted.lines(),
+      lines(warning("Correcting localtime link to "
+                    "/var/db/timezone/zoneinfo/Europe/Paris"),
+            failure("create_symlink: from /var/db/timezone/localtime to "
+                    "/var/db/timezone/zoneinfo/Europe/Paris",
+                    EIO),
+            failure("localtime link invalid; resetting to America/Los_Angeles",
+                    EIO)));
+  EXPECT_EQ(link_at(local_time), default_localtime);
+}
+
 // --- Ends that are not an exit
 // -----------------------------------------------------
 
@@ -604,6 +625,113 @@ TEST_F(StartupPass, GoesOnWithoutARecordThatCannotBeWritten) {
   install_update("2024a.1.0", "44l");
   announce("2024a.1.0");
   boot_prints(no_lines());
+  expect_links_at_update("2024a.1.0");
+}
+
+TEST_F(StartupPass, BuildsTheSystemsSetBeforeReadingTheAnnouncement) {
+  wipe(system_tree);
+  make_file(tz_latest);
+  const auto first =
+      warning("Cannot parse version string .1.0, results.size() = 0");
+  const auto second = warning("Cannot parse version string .1.0");
+  boot_prints(lines(first, second,
+                    failure("read_symlink: /var/db/timezone/tz_latest", EINVAL),
+                    failure(unable_to_locate, EINVAL), first, second));
+}
+
+TEST_F(StartupPass, ChecksTheCurrentSetBeforeBuildingTheUpdate) {
+  install_update("2024a.1.0", "44l");
+  point_links_at_update("2024a.1.0");
+  install_system("2025a", "44l");
+  make_link(tz_latest, "nonsense");
+  boot_prints(
+      lines(warning(incompatible),
+            warning("mln_dataset::create_components: bad path nonsense"),
+            warning(unable_to_locate)));
+  expect_links_at_system();
+}
+
+TEST_F(StartupPass, MigratesTheLegacyLinkBeforeReadingAnyLink) {
+  make_directory(legacy_icutz);
+  wipe(zoneinfo);
+  boot_prints(
+      lines(failure("read_symlink: /var/db/icutz", EINVAL),
+            failure("Could not migrate /var/db/icutz to /var/db/timezone/icutz",
+                    EINVAL),
+            failure("remove: could not remove /var/db/icutz", EISDIR),
+            failure("Could not remove /var/db/icutz", EISDIR),
+            warning("Bad zoneinfo link "), warning(invalid_links),
+            failure("remove: could not remove /var/db/icutz", EISDIR),
+            failure("unlink of ICU softlink failed", EISDIR)));
+  expect_links_at_system();
+}
+
+TEST_F(StartupPass, MovesALegacyLinkThatResolvesThroughTheObsoleteIcu) {
+  make_directory(old_icu);
+  make_link(legacy_icutz, old_icu);
+  boot_prints(no_lines());
+  EXPECT_EQ(link_at(icutz), old_icu);
+  EXPECT_EQ(link_at(legacy_icutz), nothing);
+  EXPECT_EQ(link_at(old_icu), nothing);
+}
+
+TEST_F(StartupPass, RemovesTheObsoleteIcuBeforeAnythingThatCanEndTheBoot) {
+  make_file(old_icu);
+  install_system("2147483648a", "44l");
+  EXPECT_EQ(boot().signal, SIGABRT);
+  EXPECT_EQ(link_at(old_icu), nothing);
+}
+
+TEST_F(StartupPass, TakesTheLastResortWhenTheResetOfAnOldSetFails) {
+  install_update("2024a.1.0", "44l");
+  point_links_at_update("2024a.1.0");
+  install_system("2025a", "44l");
+  set_mode(timezone_root, 0555);
+  const auto before = look_at_everything();
+  const outcome booted = boot();
+  EXPECT_EQ(booted.signal, SIGABRT);
+  const std::vector<::testing::Matcher<std::string>> reset = {
+      failure("remove: could not remove /var/db/timezone/zoneinfo", EACCES),
+      failure("Unlink of zoneinfo softlink failed", EACCES),
+      failure("create_symlink: from /var/db/timezone/zoneinfo to "
+              "/usr/share/zoneinfo.default",
+              EEXIST)};
+  EXPECT_THAT(booted.lines(),
+              lines(warning(incompatible), reset[0], reset[1], reset[2],
+                    failure(unable_to_locate, EEXIST), reset[0], reset[1],
+                    reset[2], ::testing::StartsWith("terminate called")));
+  EXPECT_EQ(look_at_everything(), before);
+}
+
+TEST_F(StartupPass, KeepsARecordThroughEveryReset) {
+  make_file(record, "2022a.1.0_2023c.1.0");
+  const auto before = look_at({record});
+  const auto reset = [&] {
+    EXPECT_EQ(boot().exit_status, 0);
+    expect_links_at_system();
+    EXPECT_EQ(look_at({record}), before);
+  };
+  point_zoneinfo_at("nonsense");
+  reset();
+  install_update("2022b.1.0", "44l");
+  point_links_at_update("2022b.1.0");
+  reset();
+  make_file(tz_latest);
+  reset();
+}
+
+TEST_F(StartupPass, GoesOnWhenTheRecordCannotBeWrittenWhole) {
+  install_update("2024a.1.0", "44l");
+  announce("2024a.1.0");
+  make_file(record, std::string(100, 'x'));
+  const outcome booted = run({MARLIN_PROGRAM}, [] {
+    ::signal(SIGXFSZ, SIG_IGN);
+    const rlimit limit{5, 5};
+    ::setrlimit(RLIMIT_FSIZE, &limit);
+  });
+  EXPECT_EQ(booted.exit_status, 0);
+  EXPECT_EQ(booted.log, "");
+  EXPECT_EQ(file_at(record), "2023c");
   expect_links_at_update("2024a.1.0");
 }
 

@@ -70,13 +70,13 @@ TEST_F(CompatibleComponents, CountARefusalAtTheLastPosition) {
 TEST_F(CompatibleComponents, AreNotListsOfWhichTheFirstIsShorter) {
   EXPECT_FALSE(compatible_components(list("y", 'a'), list("yy", 'x')));
   EXPECT_FALSE(compatible_components(list("", 'a'), list("y", 'x')));
-  for (const auto& question : asked) EXPECT_EQ(question, "ax");
+  EXPECT_EQ(asked, questions{"ax"});
 }
 
 TEST_F(CompatibleComponents, AreNotListsOfWhichTheFirstIsLonger) {
   EXPECT_FALSE(compatible_components(list("yyy", 'a'), list("y", 'x')));
   EXPECT_FALSE(compatible_components(list("y", 'a'), list("", 'x')));
-  for (const auto& question : asked) EXPECT_EQ(question, "ax");
+  EXPECT_EQ(asked, questions{"ax"});
 }
 
 TEST_F(CompatibleComponents, AreTwoEmptyLists) {

@@ -158,9 +158,7 @@ TEST_F(IcuSchema, OfAnUpdateWithAFileForAnIcuDirectoryIsEmpty) {
               lines(no_schema_found));
 }
 
-TEST_F(IcuSchema, OfADataFileInPlaceOfTheDirectoryIsEmpty) {
-  // A path that ends in "/icutz" cannot itself be a data file's name, but a
-  // link to a data file is followed, and its entry is the root of the walk.
+TEST_F(IcuSchema, OfALinkToADataFileForAnIcuDirectoryIsEmpty) {
   make_file("/var/db/timezone/icutz44l.dat");
   make_directory(update_path);
   make_link(icu_directory, "/var/db/timezone/icutz44l.dat");

@@ -13,6 +13,7 @@
 #include <string>
 #include <vector>
 
+#include "dataset/dataset.h"
 #include "dataset/icu.h"
 #include "tests/device/device.h"
 
@@ -31,6 +32,7 @@ struct scripted_entry {
 struct {
   std::vector<scripted_entry> entries;
   int open_error = 0;
+  int error_of_closing = 0;
 
   std::string root;
   int options = 0;
@@ -83,6 +85,7 @@ int fts_set(FTS*, FTSENT* entry, int instruction) {
 
 int fts_close(FTS*) {
   ++walk.closed;
+  if (walk.error_of_closing != 0) errno = walk.error_of_closing;
   return 0;
 }
 
@@ -90,8 +93,11 @@ int fts_close(FTS*) {
 
 namespace {
 
-struct IcuWalk : public testing::Test {
-  void SetUp() override { walk = {}; }
+struct IcuWalk : public DeviceTest {
+  void SetUp() override {
+    DeviceTest::SetUp();
+    walk = {};
+  }
 
   static std::string schema() {
     return mln_icu("/var/db/timezone/tz/2024a.1.0").schema;
@@ -170,6 +176,29 @@ TEST_F(IcuWalk, WithoutAMatchIsReported) {
   EXPECT_THAT(printed_by([] { EXPECT_EQ(schema(), ""); }),
               lines(warning("No ICU schema found for "
                             "/var/db/timezone/tz/2024a.1.0")));
+}
+
+TEST_F(IcuWalk, IsClosedBeforeAMissingSchemaIsReported) {
+  walk.error_of_closing = EXDEV;
+  EXPECT_THAT(printed_by([] { schema(); }),
+              lines(failure("No ICU schema found for "
+                            "/var/db/timezone/tz/2024a.1.0",
+                            EXDEV)));
+}
+
+TEST_F(IcuWalk, IsNotStartedForTheSystemPartition) {
+  make_file(system_icu + "/icutzformat.txt", "44l and more");
+  EXPECT_THAT(printed_by([] { EXPECT_EQ(mln_icu().schema, "44l"); }),
+              no_lines());
+  EXPECT_EQ(walk.root, "");
+}
+
+TEST_F(IcuWalk, ThatCannotBeStartedEndsTheBuildingOfTheDataSet) {
+  walk.open_error = ENOMEM;
+  printed_by([] {
+    EXPECT_EQ(thrown_by([] { mln_dataset("/var/db/timezone/tz/2024a.1.0"); }),
+              ENOMEM);
+  });
 }
 
 }  // namespace

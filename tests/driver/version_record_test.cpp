@@ -78,7 +78,7 @@ TEST_F(VersionRecord, IsQuietlyLeftOutWhenItCannotBeOpened) {
   EXPECT_EQ(file_at(record), nothing);
 }
 
-TEST_F(VersionRecord, IsQuietlyLeftOutWhenTheDiskIsFull) {
+TEST_F(VersionRecord, IsNotWrittenToADevice) {
   make_link(record, "/dev/full");
   EXPECT_THAT(printed_by(write), no_lines());
 }

@@ -1,0 +1,95 @@
+// SPDX-License-Identifier: BSD-2-Clause
+//
+// Handlers take every exception, not only the numbers of failed calls: here the
+// next request for memory is refused.
+#include <cstdlib>
+#include <new>
+
+#include "dataset/icu.h"
+#include "dataset/zoneinfo.h"
+#include "driver/legacy_icu_link.h"
+#include "driver/localtime_link.h"
+#include "support/first_word.h"
+#include "tests/device/device.h"
+
+using namespace device;
+
+namespace {
+int accepted = 0;  // how many requests for memory are granted first
+int refusals = 0;  // how many are refused after them
+}  // namespace
+
+void* operator new(std::size_t size) {
+  if (accepted > 0) {
+    --accepted;
+  } else if (refusals > 0) {
+    --refusals;
+    throw std::bad_alloc();
+  }
+  if (void* const memory = std::malloc(size)) return memory;
+  throw std::bad_alloc();
+}
+void operator delete(void* memory) noexcept { std::free(memory); }
+void operator delete(void* memory, std::size_t) noexcept { std::free(memory); }
+
+namespace {
+
+class WithoutMemory : public DeviceTest {};
+
+TEST_F(WithoutMemory, ZoneinfoActivationGoesOn) {
+  const mln_zoneinfo tree;
+  EXPECT_THAT(printed_by([&] {
+                refusals = 1;
+                tree.activate();
+              }),
+              lines(warning("Unlink of zoneinfo softlink failed")));
+  EXPECT_EQ(link_at(zoneinfo), system_tree);
+}
+
+TEST_F(WithoutMemory, IcuActivationGoesOn) {
+  install_update("2024a.1.0", "44l");
+  const mln_icu icu(update("2024a.1.0"));
+  EXPECT_THAT(printed_by([&] {
+                refusals = 1;
+                icu.activate();
+              }),
+              lines(warning("unlink of ICU softlink failed")));
+  EXPECT_EQ(link_at(icutz), update("2024a.1.0") + "/icutz");
+}
+
+TEST_F(WithoutMemory, AFirstWordIsCut) {
+  make_file("/usr/share/file", std::string(100, 'x'));
+  const std::string path = "/usr/share/file";
+  refusals = 1;
+  EXPECT_EQ(read_first_word(path), "");
+  EXPECT_EQ(refusals, 0);
+}
+
+TEST_F(WithoutMemory, TheLegacyLinkIsRemovedAndNotMigrated) {
+  const std::string target = "/var/db/a-name-that-needs-memory";
+  make_directory(target);
+  make_link(legacy_icutz, target);
+  EXPECT_THAT(printed_by([] {
+                // The second request: the first is for the present link's path.
+                accepted = 1;
+                refusals = 1;
+                migrate_legacy_icu_link();
+              }),
+              lines(warning("Could not migrate /var/db/icutz to "
+                            "/var/db/timezone/icutz")));
+  EXPECT_EQ(link_at(icutz), nothing);
+  EXPECT_EQ(link_at(legacy_icutz), nothing);
+}
+
+TEST_F(WithoutMemory, TheLocalTimeIsReset) {
+  point_localtime_at("/usr/share/zoneinfo/Europe/Paris");
+  EXPECT_THAT(printed_by([] {
+                refusals = 1;
+                repair_localtime_link();
+              }),
+              lines(warning("localtime link invalid; resetting to "
+                            "America/Los_Angeles")));
+  EXPECT_EQ(link_at(local_time), default_localtime);
+}
+
+}  // namespace
