@@ -3,9 +3,10 @@
 the program is killed at every call. Together they take every way through a
 boot."""
 
-from model import (DEFAULT_LOCALTIME, Device, ICUTZ, LEGACY_ICUTZ, LOCALTIME,
-                   OLD_ICU, RECORD, SYSTEM_ICU, SYSTEM_ZONEINFO, TZ_LATEST,
-                   ZONEINFO)
+from model import (Device, ICUTZ, LEGACY_ICUTZ, LOCALTIME, OLD_ICU, RECORD,
+                   SYSTEM_ICU, SYSTEM_ZONEINFO, TZ_LATEST, ZONEINFO)
+
+CHOSEN_LOCALTIME = ZONEINFO + "/Europe/Paris"
 
 
 def update_path(version):
@@ -28,12 +29,12 @@ def install_update(device, version, schema="44l"):
 
 
 def sound_device():
-  """A system partition, and links to it."""
+  """A system partition, links to it, and a zone that somebody chose."""
   device = Device()
   device.directory("/var/db/timezone/tz")
   install_system(device)
   device.link(ZONEINFO, SYSTEM_ZONEINFO)
-  device.link(LOCALTIME, DEFAULT_LOCALTIME)
+  device.link(LOCALTIME, CHOSEN_LOCALTIME)
   return device
 
 
@@ -57,7 +58,7 @@ def activation(current=None, update="2024a.1.0"):
   return device
 
 
-# --- Boots that end well ------------------------------------------------------
+# --- Boots that end well -----------------------------------------------------
 
 
 def nothing_to_do():
@@ -213,7 +214,8 @@ def localtime_directory():
 def long_version_file():
   """A word over several reads, and no line end behind the format."""
   device = activation()
-  device.file(f"{SYSTEM_ZONEINFO}/+VERSION", " " * 4000 + "2023c\n" + "x" * 5000)
+  device.file(f"{SYSTEM_ZONEINFO}/+VERSION",
+              " " * 4000 + "2023c\n" + "x" * 5000)
   device.file(f"{SYSTEM_ICU}/icutzformat.txt", "44l")
   return device
 
@@ -229,7 +231,7 @@ BOOTS = [
     localtime_corrected_in_vain, localtime_relative, localtime_file,
     localtime_directory, long_version_file]
 
-# --- Boots that end abnormally, as they have to --------------------------------
+# --- Boots that end abnormally, as they have to ------------------------------
 
 
 def no_timezone_directory():

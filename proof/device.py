@@ -18,8 +18,6 @@ import stat
 import subprocess
 import sys
 
-import model
-
 PROJECT = os.path.dirname(os.path.dirname(os.path.abspath(__file__)))
 INSIDE = "MARLIN_PRIVATE_DEVICE"
 PLACES = ("/usr/share", "/var/db")
@@ -37,7 +35,7 @@ def decoded(raw):
   return raw.decode("latin-1")
 
 
-# --- The command line, and the way in ---------------------------------------
+# --- The command line, and the way in ----------------------------------------
 
 
 def command_line(description):
@@ -117,10 +115,10 @@ def run_parts(parser, options):
              os.path.dirname(options.marlin), "--", script]
   environment = dict(os.environ, MARLIN=options.marlin)
   processes = [
-      subprocess.Popen(command + sys.argv[1:] + ["--part", f"{n}/{options.jobs}"],
-                       env=environment, stdout=subprocess.PIPE, text=True,
-                       errors="replace")
-      for n in range(options.jobs)]
+      subprocess.Popen(
+          command + sys.argv[1:] + ["--part", f"{part}/{options.jobs}"],
+          env=environment, stdout=subprocess.PIPE, text=True, errors="replace")
+      for part in range(options.jobs)]
   sums = collections.defaultdict(int)
   for process in processes:
     finished = False

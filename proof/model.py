@@ -42,7 +42,7 @@ FORMER_ZONEINFO = "/usr/share/zoneinfo"
 DEFAULT_ZONE = "America/Los_Angeles"
 DEFAULT_LOCALTIME = "/var/db/timezone/zoneinfo/America/Los_Angeles"
 
-# --- 1. The device ----------------------------------------------------------
+# --- 1. The device -----------------------------------------------------------
 
 
 class Failed(Exception):
@@ -173,7 +173,7 @@ class Device:
     return directory, name, way[-1]
 
 
-# --- 2. The file-system calls -----------------------------------------------
+# --- 2. The file-system calls ------------------------------------------------
 
 
 class Killed(BaseException):
@@ -385,7 +385,7 @@ class Boot:
   def warn(self, text, error=None):
     self.lines.append((text, error))
 
-  # --- 3. The primitives ------------------------------------------------------
+  # --- 3. The primitives -----------------------------------------------------
 
   def remove(self, path):
     try:
@@ -435,7 +435,7 @@ class Boot:
     """For a line that directly follows that of a call that failed."""
     return self.lines[-1][1]
 
-  # --- 4. The first word of a file --------------------------------------------
+  # --- 4. The first word of a file -------------------------------------------
 
   def first_word(self, path):
     """Empty where there is no such file, nothing that can be read, or no word.
@@ -462,7 +462,7 @@ class Boot:
     word = text.lstrip(WHITE_SPACE)
     return re.split(r"[ \t-\r]", word, maxsplit=1)[0]
 
-  # --- 5. The walk through a directory of ICU data ----------------------------
+  # --- 5. The walk through a directory of ICU data ---------------------------
 
   def icu_schema(self, dataset_path):
     """The schema of an update: that of the first data file, in listing order;
@@ -538,7 +538,7 @@ class Boot:
     kernel.close()
     return entered, entries
 
-  # --- 6. Version texts ---------------------------------------------------------
+  # --- 6. Version texts ------------------------------------------------------
 
   def parse_version(self, text):
     """(year, letters, major, minor), which compare as versions do."""
@@ -560,7 +560,7 @@ class Boot:
     year, letters, major, minor = match.groups()
     return number(year), letters, number(major), number(minor)
 
-  # --- 7. Components and data sets ----------------------------------------------
+  # --- 7. Components and data sets -------------------------------------------
 
   def data_set(self, path):
     """Builds the data set of a path, the empty one that of the system."""
@@ -603,7 +603,7 @@ class Boot:
   def reset_to_system_partition(self):
     self.activate(self.data_set(""))
 
-  # --- 8. The links that are read -----------------------------------------------
+  # --- 8. The links that are read --------------------------------------------
 
   def latest_update_path(self):
     return self.read_symlink(TZ_LATEST)
@@ -621,7 +621,7 @@ class Boot:
     self.warn(f"Bad zoneinfo link {target}")
     raise Thrown
 
-  # --- 9. The legacy link, local time, the record ---------------------------------
+  # --- 9. The legacy link, local time, the record ----------------------------
 
   def migrate_legacy_icu_link(self):
     if self.exists(LEGACY_ICUTZ) and not self.exists(ICUTZ):
@@ -672,7 +672,7 @@ class Boot:
       pass
     self.kernel.close()
 
-  # --- 10. The pass -----------------------------------------------------------
+  # --- 10. The pass ----------------------------------------------------------
 
   def run(self):
     # The protection classes: this platform has none.

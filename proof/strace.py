@@ -39,8 +39,8 @@ NAMES = {
 TRACED = ",".join("?" + name for name in NAMES)
 
 # `call` is the machine's name and `number` counts its calls by that name, as
-# strace does; `name` and `path` are the model's; `injected`: whether strace made
-# it fail.
+# strace does; `name` and `path` are the model's; `injected`: whether strace
+# made it fail.
 Call = collections.namedtuple("Call", "call number name path injected")
 
 
