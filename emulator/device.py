@@ -302,16 +302,15 @@ class Device:
             "-device", "virtio-blk-device,drive=system",
             "-blockdev", disk]
 
-  def start(self, scene="", options="", disk=None):
+  def start(self, scene="", options="", disk=None, more=()):
     self.console.unlink(missing_ok=True)
-    return subprocess.Popen(
-        self.command(scene, options, disk, f"file:{self.console}"),
-        stdin=subprocess.DEVNULL)
+    command = self.command(scene, options, disk, f"file:{self.console}")
+    return subprocess.Popen([*command, *more], stdin=subprocess.DEVNULL)
 
-  def boot(self, scene="", options="", disk=None, seconds=120):
+  def boot(self, scene="", options="", disk=None, more=(), seconds=120):
     """One boot from power on to power off. `scene` is what the device does
-    when it is up, in its shell's language."""
-    emulator = self.start(scene, options, disk)
+    when it is up, in its shell's language; `more` are words for the emulator."""
+    emulator = self.start(scene, options, disk, more)
     try:
       emulator.wait(seconds)
     except subprocess.TimeoutExpired:
@@ -330,6 +329,6 @@ class Device:
     while time.monotonic() < end and emulator.poll() is None:
       if self.console.exists() and Console(self.console).has(text):
         return
-      time.sleep(0.02)
+      time.sleep(0.05)
     raise RuntimeError(f"the console never said: {text}\n" +
                        self.console.read_text(errors="replace")[-4000:])

@@ -1,4 +1,4 @@
-#!/usr/bin/env python3
+#!/usr/bin/env -S python3 -B
 # SPDX-License-Identifier: BSD-2-Clause
 """Sequences of real boots of an emulated arm64 device, each on one disk.
 
