@@ -131,9 +131,13 @@ def check_names(tree):
 
 
 def check_record(tree):
+  """A record is written and never synced, so the disk may know of the file
+  but not of its bytes yet; the next activation writes it anew."""
   record = tree.get(TIMEZONE + "/TZVersionDiffRecord")
-  if record is None or record == b"":
-    return "none" if record is None else "empty"
+  if record is None:
+    return "none"
+  if not record.strip(b"\0"):
+    return "of NUL bytes" if record else "empty"
   expect(f"the record holds {record!r}", re.fullmatch(
       rb"(2023c\.1\.0|2024a\.1\.\d+)_2024a\.1\.\d+", record))
   return "whole"
@@ -239,10 +243,8 @@ def within_pass(console):
   return bool(said) and said[-1].endswith("begins")
 
 
-def run_cuts(count, victim):
-  """Prints a line for each cut; returns how often each state was found."""
-  table = collections.Counter()
-  totals = collections.Counter()
+def run_cuts(count, victim, table, totals):
+  """Prints a line for each cut; counts how often each state was found."""
   tree = emulated.tree(victim.device.var)
   started = time.monotonic()
   for number in range(1, count + 1):
@@ -263,8 +265,9 @@ def run_cuts(count, victim):
       raise
     state, healed = described(found), described(recovered(found))
     table[state, healed, inside] += 1
+    totals["cuts"] += 1
     totals["inside"] += inside
-    totals["empty records"] += record == "empty"
+    totals["record " + record] += 1
     totals["with losses"] += counts["lost"] > 0
     print(f"cut {number}/{count}, {time.monotonic() - started:.0f} s: "
           f"{'inside the pass' if inside else 'between passes'}, "
@@ -273,13 +276,14 @@ def run_cuts(count, victim):
   check_recovery(victim.device.boot(), recovered(links_of(tree)))
   complaint = emulated.check(victim.device.var)
   expect("fsck.ext4: " + complaint, complaint == "")
-  return table, totals
 
 
-def print_table(table, totals, count):
-  print(f"\n{count} power cuts, {totals['inside']} of them inside the pass; "
-        f"{totals['with losses']} lost written blocks; "
-        f"{totals['empty records']} left an empty record.")
+def print_table(table, totals):
+  print(f"\n{totals['cuts']} power cuts, {totals['inside']} of them inside the "
+        f"pass; {totals['with losses']} lost blocks that had been written.")
+  print("The record afterwards: " + ", ".join(
+      f"{totals['record ' + kind]} times {kind}"
+      for kind in ("whole", "none", "empty", "of NUL bytes")))
   print(f"\n{'links found after the cut':52}{'inside':>8}{'between':>8}"
         "  after the next boot")
   for state, healed in sorted({key[:2] for key in table}):
@@ -301,12 +305,14 @@ def main():
     return emulated.SKIPPED
   seed = options.seed if options.seed is not None else random.randrange(10**6)
   print(f"seed {seed}", flush=True)
+  table, totals = collections.Counter(), collections.Counter()
   try:
-    table, totals = run_cuts(options.count, Victim(seed))
+    run_cuts(options.count, Victim(seed), table, totals)
   except (Broken, RuntimeError) as reason:
     print(f"FAILED, with seed {seed}: {reason}")
     return 1
-  print_table(table, totals, options.count)
+  finally:
+    print_table(table, totals)
   return 0
 
 
