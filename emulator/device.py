@@ -55,12 +55,13 @@ def run(*command, **options):
 
 
 def prepare():
-  """Fetches the parts; raises Unavailable when a device cannot be had."""
+  """Fetches the parts; raises Unavailable when a device cannot be had, which a
+  program that nobody has built is no reason for."""
+  if not PROGRAM.is_file():
+    sys.exit(f"{PROGRAM.relative_to(PROJECT)} has not been built")
   fetched = subprocess.run([PROJECT / "emulator" / "parts", PARTS], check=False)
   if fetched.returncode != 0:
     raise Unavailable("the parts of a device cannot be had")
-  if not PROGRAM.is_file():
-    raise Unavailable(f"{PROGRAM.relative_to(PROJECT)} has not been built")
   for name in ("qemu-system-aarch64", "mke2fs", "e2fsck", "debugfs", "zic"):
     tool(name)
 
