@@ -7,6 +7,7 @@ privilege, by the tools of e2fsprogs; only the device's own kernel mounts them.
 Its console is a file, in which every line begins with the kernel's time.
 """
 
+import fcntl
 import hashlib
 import os
 import pathlib
@@ -54,11 +55,23 @@ def run(*command, **options):
   return done.stdout
 
 
+def build_program():
+  if subprocess.run([PROJECT / "scripts" / "packages", "cmake", "ninja-build",
+                     "g++-aarch64-linux-gnu"], check=False).returncode != 0:
+    raise Unavailable("no program for arm64 can be built")
+  print(f"Building {PROGRAM.relative_to(PROJECT)}", file=sys.stderr, flush=True)
+  WORK.mkdir(parents=True, exist_ok=True)
+  with open(WORK / "build.lock", "w", encoding="ascii") as lock:
+    fcntl.flock(lock, fcntl.LOCK_EX)
+    if not (PROGRAM.parent / "build.ninja").is_file():
+      run("cmake", "--preset", "arm64-release", cwd=PROJECT)
+    run("cmake", "--build", "--preset", "arm64-release", cwd=PROJECT)
+
+
 def prepare():
-  """Fetches the parts; raises Unavailable when a device cannot be had, which a
-  program that nobody has built is no reason for."""
-  if not PROGRAM.is_file():
-    sys.exit(f"{PROGRAM.relative_to(PROJECT)} has not been built")
+  """Builds the program and fetches the parts; raises Unavailable when a device
+  cannot be had."""
+  build_program()
   fetched = subprocess.run([PROJECT / "emulator" / "parts", PARTS], check=False)
   if fetched.returncode != 0:
     raise Unavailable("the parts of a device cannot be had")
