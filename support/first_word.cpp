@@ -64,7 +64,7 @@ void extract_word(input_file& file, std::string& word) {
       start = std::find_if_not(start, bytes.end(), is_white_space);
     const auto end = std::find_if(start, bytes.end(), is_white_space);
     word.append(start, end);
-    if (end != bytes.end() && !word.empty()) return;
+    if (end != bytes.end()) return;
   }
 }
 

@@ -41,15 +41,12 @@ std::string read_symlink(const std::string& path) {
 }
 
 int create_symlink(const std::string& target, const std::string& link) {
-  const int result = ::symlink(target.c_str(), link.c_str());
-  if (result != 0) {
-    // Deliberate: the new link stands after "from" and its target after "to",
-    // the reverse of the arguments; field logs are read by that order. Pinned
-    // by CreateSymlink.NamesTheLinkFirstAndTheTargetSecondOnFailure.
-    ::warn("create_symlink: from %s to %s", link.c_str(), target.c_str());
-    throw errno;
-  }
-  return result;
+  if (::symlink(target.c_str(), link.c_str()) == 0) return 0;
+  // Deliberate: the new link stands after "from" and its target after "to", the
+  // reverse of the arguments; field logs are read by that order. Pinned by
+  // CreateSymlink.NamesTheLinkFirstAndTheTargetSecondOnFailure.
+  ::warn("create_symlink: from %s to %s", link.c_str(), target.c_str());
+  throw errno;
 }
 
 }  // namespace fsutil

@@ -91,6 +91,27 @@ TEST_F(UntrustedData, OfAFifoInPlaceOfTheRecordIsLeftAlone) {
   EXPECT_EQ(file_at(record), "(something else)");
 }
 
+TEST_F(UntrustedData, IsOpenedSoThatNothingBlocksOrBecomesOurTerminal) {
+  const std::string trace = "/var/db/trace";
+  EXPECT_EQ(
+      run({"/usr/bin/strace", "-qq", "-o", trace, "-e", "trace=open,openat",
+           "-E", "ASAN_OPTIONS=detect_leaks=0", MARLIN_PROGRAM})
+          .exit_status,
+      0);
+  std::vector<std::string> opened;
+  for (const auto& line : outcome{0, 0, file_at(trace)}.lines()) {
+    for (const char* name : {"+VERSION", "icutzformat", "TZVersionDiffRecord"})
+      if (line.find(name) != std::string::npos) opened.push_back(line);
+  }
+  wipe(trace);
+  // Two data sets of the system, the update, the record.
+  EXPECT_EQ(opened.size(), 6u);
+  EXPECT_THAT(opened, ::testing::Each(
+                          ::testing::AllOf(::testing::HasSubstr("O_NONBLOCK"),
+                                           ::testing::HasSubstr("O_NOCTTY"),
+                                           ::testing::HasSubstr("O_CLOEXEC"))));
+}
+
 TEST_F(UntrustedData, OfA64MebibyteVersionOfTheSystemIsReadWhole) {
   const std::string word(64u << 20, '7');
   make_file(system_tree + "/+VERSION", word);

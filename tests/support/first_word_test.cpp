@@ -125,6 +125,20 @@ TEST_F(FirstWord, OfADeviceIsEmptyAndDoesNotBlock) {
   }
 }
 
+TEST_F(FirstWord, NeedsNoPermissionToWrite) {
+  make_file(path, "2016a", 0444);
+  EXPECT_EQ(read_first_word(path), "2016a");
+}
+
+TEST_F(FirstWord, IsReadThroughDescriptorZeroToo) {
+  make_file(path, "2016a");
+  const int standard_input = ::dup(0);
+  ::close(0);
+  EXPECT_EQ(read_first_word(path), "2016a");
+  ::dup2(standard_input, 0);
+  ::close(standard_input);
+}
+
 TEST_F(FirstWord, LeavesNoDescriptorOpen) {
   const int before = ::dup(0);
   ::close(before);
