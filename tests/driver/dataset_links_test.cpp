@@ -56,6 +56,15 @@ TEST_F(LatestUpdatePath, ThrowsWhenTheAnnouncementIsAFile) {
       lines(failure("read_symlink: /var/db/timezone/tz_latest", EINVAL)));
 }
 
+TEST_F(LatestUpdatePath, ThrowsTheReadingsErrorWithoutPermission) {
+  announce("2024a.1.0");
+  set_mode(timezone_root, 0);
+  EXPECT_THAT(
+      printed_by(
+          [] { EXPECT_EQ(thrown_by([] { latest_update_path(); }), EACCES); }),
+      lines(failure("read_symlink: /var/db/timezone/tz_latest", EACCES)));
+}
+
 TEST_F(CurrentDatasetPath, IsTheUpdateThatTheZoneinfoLinkNames) {
   point_zoneinfo_at("/var/db/timezone/tz/2024a.1.0/zoneinfo");
   EXPECT_EQ(current_dataset_path(), "/var/db/timezone/tz/2024a.1.0");
@@ -71,7 +80,7 @@ TEST_F(CurrentDatasetPath, IsRejectedWithoutAZoneinfoLink) {
   EXPECT_THAT(printed_by([] {
                 EXPECT_EQ(thrown_by([] { current_dataset_path(); }), -1);
               }),
-              lines(warning("Bad zoneinfo link ")));
+              lines(failure("Bad zoneinfo link ", ENOENT)));
 }
 
 TEST_F(CurrentDatasetPath, ThrowsTheReadingsErrorForAFileOrADirectory) {

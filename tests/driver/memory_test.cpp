@@ -81,6 +81,16 @@ TEST_F(WithoutMemory, TheLegacyLinkIsRemovedAndNotMigrated) {
   EXPECT_EQ(link_at(legacy_icutz), nothing);
 }
 
+TEST_F(WithoutMemory, TheMigrationEndsWhenItsOwnPathsDoNotFit) {
+  make_link(legacy_icutz, "/var/db");
+  EXPECT_THAT(printed_by([] {
+                refusals = 1;
+                EXPECT_THROW(migrate_legacy_icu_link(), std::bad_alloc);
+              }),
+              no_lines());
+  EXPECT_EQ(link_at(legacy_icutz), "/var/db");
+}
+
 TEST_F(WithoutMemory, TheLocalTimeIsReset) {
   point_localtime_at("/usr/share/zoneinfo/Europe/Paris");
   EXPECT_THAT(printed_by([] {

@@ -169,6 +169,37 @@ TEST_F(ReadSymlink, ThatCannotBeReachedPrintsAndThrowsTheErrorNumber) {
       lines(failure("read_symlink: /var/db/shut/link", EACCES)));
 }
 
+TEST_F(ReadSymlink, BelowAFileIsAFailureAndNotAMissingPath) {
+  make_file(path);
+  EXPECT_THAT(printed_by([] {
+                EXPECT_EQ(thrown_by([] { fsutil::read_symlink(path + "/x"); }),
+                          ENOTDIR);
+              }),
+              lines(failure("read_symlink: " + path + "/x", ENOTDIR)));
+}
+
+TEST_F(ReadSymlink, OfAnEndlessNameIsAFailureAndNotAMissingPath) {
+  const std::string endless = "/var/db/" + std::string(256, 'x');
+  EXPECT_THAT(printed_by([&] {
+                EXPECT_EQ(thrown_by([&] { fsutil::read_symlink(endless); }),
+                          ENAMETOOLONG);
+                EXPECT_FALSE(fsutil::exists(endless));
+              }),
+              lines(failure("read_symlink: " + endless, ENAMETOOLONG)));
+}
+
+TEST_F(ReadSymlink, TakesATrailingSlashAsItIs) {
+  make_link(path, "/var/db");
+  EXPECT_THAT(
+      printed_by([] {
+        EXPECT_EQ(thrown_by([] { fsutil::read_symlink(path + "/"); }), EINVAL);
+        EXPECT_EQ(thrown_by([] { fsutil::remove(path + "/"); }), ENOTDIR);
+      }),
+      lines(failure("read_symlink: " + path + "/", EINVAL),
+            failure("remove: could not remove " + path + "/", ENOTDIR)));
+  EXPECT_EQ(link_at(path), "/var/db");
+}
+
 TEST_F(ReadSymlink, CutsALongTargetToItsFirst1024Bytes) {
   const std::string start = std::string(1023, 'a');
   for (const std::string rest : {"", "b", "bc", "bcd"}) {

@@ -2,7 +2,9 @@
 #include "support/version.h"
 
 #include <algorithm>
+#include <array>
 #include <cerrno>
+#include <functional>
 #include <random>
 #include <stdexcept>
 
@@ -18,6 +20,13 @@ std::string shown(const mln_version& version) {
 }
 
 const std::string unset = "-1||-1|-1";
+
+TEST(VersionFields, StandInTheirOrder) {
+  const mln_version version;
+  const std::array<const void*, 4> fields = {&version.year, &version.letters,
+                                             &version.major, &version.minor};
+  EXPECT_TRUE(std::is_sorted(fields.begin(), fields.end(), std::less<>()));
+}
 
 TEST(VersionParse, FillsFourFields) {
   EXPECT_THAT(printed_by([] {

@@ -1,0 +1,85 @@
+// SPDX-License-Identifier: BSD-2-Clause
+//
+// In which order a boot looks at and changes the links, and what it never does:
+// rename, sync.
+#include "tests/device/device.h"
+
+using namespace device;
+
+namespace {
+
+class Calls : public DeviceTest {
+ protected:
+  void SetUp() override {
+    DeviceTest::SetUp();
+    install_system("2023c", "44l");
+    point_links_at_system();
+  }
+
+  // "call path" for every call on the device; on some processors a call is the
+  // variant of it that takes a directory.
+  static std::vector<std::string> of_a_boot() {
+    const outcome booted = run(
+        {"/usr/bin/strace", "-qq", "-o", trace, "-E",
+         "ASAN_OPTIONS=detect_leaks=0", "-e",
+         "trace=?access,faccessat,?readlink,readlinkat,?unlink,unlinkat,?rmdir,"
+         "?symlink,symlinkat,?link,linkat,?rename,?renameat,renameat2,?mkdir,"
+         "mkdirat,fsync,fdatasync,sync,syncfs,sync_file_range",
+         MARLIN_PROGRAM});
+    EXPECT_EQ(booted.exit_status, 0);
+    std::vector<std::string> calls;
+    for (const auto& line : outcome{0, 0, file_at(trace)}.lines()) {
+      std::string call = line.substr(0, line.find('('));
+      if (call.ends_with("at")) call.resize(call.size() - 2);
+      // readlink("path", "target"...), symlink("target", "path"), call("path")
+      const auto end = call == "readlink" ? line.find('"', line.find('"') + 1)
+                                          : line.rfind('"');
+      if (end == std::string::npos) {
+        calls.push_back(call);  // such as sync()
+        continue;
+      }
+      const auto begin = line.rfind('"', end - 1) + 1;
+      const std::string path = line.substr(begin, end - begin);
+      if (path.starts_with("/var/db/") || path.starts_with("/usr/share/"))
+        calls.push_back(call + " " + path);
+    }
+    return calls;
+  }
+
+  static inline const std::string trace = "/var/db/trace";
+};
+
+using ::testing::ElementsAre;
+
+TEST_F(Calls, OfAnActivationRemoveAndCreateEveryLinkInOrder) {
+  install_update("2024a.1.0", "44l");
+  announce("2024a.1.0");
+  point_localtime_at("/usr/share/zoneinfo/Europe/Paris");
+  EXPECT_THAT(
+      of_a_boot(),
+      ElementsAre("access /var/db/icutz", "access /var/db/icutz",
+                  "unlink /var/db/icu", "readlink /var/db/timezone/tz_latest",
+                  "readlink /var/db/timezone/zoneinfo",
+                  "unlink /var/db/timezone/zoneinfo",
+                  "symlink /var/db/timezone/zoneinfo",
+                  "unlink /var/db/timezone/icutz", "unlink /var/db/icutz",
+                  "symlink /var/db/timezone/icutz",
+                  "readlink /var/db/timezone/localtime",
+                  "access /var/db/timezone/zoneinfo/Europe/Paris",
+                  "unlink /var/db/timezone/localtime",
+                  "symlink /var/db/timezone/localtime"));
+}
+
+TEST_F(Calls, OfAMigrationTestTheLegacyLinkAnewBeforeItIsRemoved) {
+  make_link(legacy_icutz, "/usr/share/icu");
+  EXPECT_THAT(
+      of_a_boot(),
+      ElementsAre("access /var/db/icutz", "access /var/db/timezone/icutz",
+                  "readlink /var/db/icutz", "symlink /var/db/timezone/icutz",
+                  "access /var/db/icutz", "unlink /var/db/icutz",
+                  "unlink /var/db/icu", "readlink /var/db/timezone/tz_latest",
+                  "readlink /var/db/timezone/zoneinfo",
+                  "readlink /var/db/timezone/localtime"));
+}
+
+}  // namespace
