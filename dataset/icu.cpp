@@ -68,8 +68,8 @@ void mln_icu::initialize() {
   auto walk = open_walk(icu_path);
   if (!walk) {
     // Deliberate: the prefix is not the class's name, and the error text stands
-    // twice, because warn(3) appends it again; logs are searched for the line
-    // as it always was. Pinned by
+    // twice, because warn(3) appends it again; both belong to the line as
+    // whoever searches logs knows it. Pinned by
     // IcuWalk.ThatCannotBeStartedIsReportedAndThrown.
     ::warn("tz_icu::initialize: fts_open of %s failed, %s", icu_path.c_str(),
            std::strerror(errno));

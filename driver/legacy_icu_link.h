@@ -5,6 +5,6 @@
 // "/var/db/timezone/icutz", its text unchanged. A link that already resolves
 // there wins. The legacy link is then deleted; one that dangles counts as
 // absent and stays. Prints "Could not migrate /var/db/icutz to
-// /var/db/timezone/icutz" and "Could not remove /var/db/icutz"; throws only on
-// memory exhaustion.
+// /var/db/timezone/icutz" and "Could not remove /var/db/icutz"; throws only
+// when there is no memory for its own two paths.
 void migrate_legacy_icu_link();

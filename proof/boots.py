@@ -151,7 +151,9 @@ def crowded_icu_directory():
   real = f"{update_path('2024a.1.0')}/icu-data"
   device.file(f"{real}/icutz44l.dat", "ICU")
   device.file(f"{real}/icutz45l.dat", "ICU", 0o640)
-  device.file(f"{real}/readme", "x")
+  for name in ("readme", "icutzl.dat", "icutz44.dat", "icutz44L.dat",
+               "icutz43l.dat.bak", "xicutz43l.dat"):
+    device.file(f"{real}/{name}", "x")
   device.link(f"{real}/icutz46l.dat", "icutz44l.dat")
   device.file(f"{real}/icutz47l.dat/icutz48l.dat", "ICU")
   return device
@@ -212,10 +214,10 @@ def localtime_directory():
 
 
 def long_version_file():
-  """A word over several reads, and no line end behind the format."""
+  """A word that ends where a read does, and a format without a line end."""
   device = activation()
   device.file(f"{SYSTEM_ZONEINFO}/+VERSION",
-              " " * 4000 + "2023c\n" + "x" * 5000)
+              "2023c".rjust(4096) + "\n" + "x" * 5000)
   device.file(f"{SYSTEM_ICU}/icutzformat.txt", "44l")
   return device
 

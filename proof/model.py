@@ -334,7 +334,7 @@ class Kernel:
     return list(node.entries)
 
 
-# --- 10 holds the pass; these are what it is built of ------------------------
+# --- What the sections below share -------------------------------------------
 
 
 class Thrown(Exception):
@@ -553,7 +553,8 @@ class Boot:
     def number(digits):
       if digits is None:
         return -1
-      if int(digits) > INT_MAX:
+      digits = digits.lstrip("0") or "0"
+      if len(digits) > 10 or int(digits) > INT_MAX:
         raise Thrown
       return int(digits)
 

@@ -4,7 +4,7 @@
 #include <err.h>
 
 #include <charconv>
-#include <stdexcept>
+#include <string>
 #include <string_view>
 #include <system_error>
 #include <tuple>
@@ -17,7 +17,9 @@ std::int32_t to_number(std::string_view digits) {
   std::int32_t number{};
   const auto [end, error] =
       std::from_chars(digits.data(), digits.data() + digits.size(), number);
-  if (error == std::errc::result_out_of_range) throw std::out_of_range("stoi");
+  // What does not fit is for std::stoi to refuse, with its exception and the
+  // errno that it leaves.
+  if (error != std::errc()) return std::stoi(std::string(digits));
   return number;
 }
 
@@ -36,9 +38,10 @@ mln_version::mln_version(const std::string& text) { parse(text); }
 void mln_version::parse(const std::string& text) {
   const auto groups = match_version_text(text);
   if (!groups) {
-    // Deliberate: one malformed text prints two lines, and the first counts
-    // the groups of a failed match, always 0; log readers know the pair.
-    // Pinned by VersionParse.PrintsTwoLinesForAMalformedText.
+    // Deliberate: one malformed text prints two lines. The first tells that the
+    // text did not match at all, as no groups were counted; the second is the
+    // one to search a log for. Pinned by
+    // VersionParse.PrintsTwoLinesForAMalformedText.
     ::warn("Cannot parse version string %s, results.size() = %d", text.c_str(),
            0);
     ::warn("Cannot parse version string %s", text.c_str());

@@ -35,11 +35,11 @@ std::string_view take_dotted_number(std::string_view& text) {
 // Each run ends where a byte of another kind stands, and a lone dotted number
 // is the first of the two, so the longest choice is always the right one and
 // nothing is ever tried twice.
-std::optional<version_groups> match_version_text(std::string_view text) {
+std::optional<mln_version_groups> match_version_text(std::string_view text) {
   const std::string_view year = take_run(text, is_digit);
   const std::string_view letters = take_run(text, is_letter);
   const std::string_view major = take_dotted_number(text);
   const std::string_view minor = take_dotted_number(text);
   if (year.empty() || letters.empty() || !text.empty()) return std::nullopt;
-  return version_groups{year, letters, major, minor};
+  return mln_version_groups{year, letters, major, minor};
 }

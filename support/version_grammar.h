@@ -9,7 +9,7 @@
 
 // The four groups of a match, as parts of the matched text. A group that takes
 // no part in the match is empty, and only such a group is.
-struct version_groups {
+struct mln_version_groups {
   std::string_view year;
   std::string_view letters;
   std::string_view major{};
@@ -17,4 +17,4 @@ struct version_groups {
 };
 
 // Matches the whole of `text`, NUL bytes and all, in one pass over it.
-std::optional<version_groups> match_version_text(std::string_view text);
+std::optional<mln_version_groups> match_version_text(std::string_view text);

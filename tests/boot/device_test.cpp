@@ -4,6 +4,7 @@
 #include <gtest/gtest-spi.h>
 
 #include <cerrno>
+#include <iostream>
 
 #include "tests/device/device.h"
 
@@ -12,6 +13,11 @@ using namespace device;
 namespace {
 
 class PrivateDevice : public DeviceTest {};
+
+// Is started outside of a private device too, where it must find a reason.
+TEST(Guard, SaysWhyNot) {
+  std::cout << "guard: [" << why_not_private() << "]\n";
+}
 
 TEST_F(PrivateDevice, IsWhereTheTestsRun) { EXPECT_EQ(why_not_private(), ""); }
 
@@ -33,10 +39,10 @@ TEST_F(PrivateDevice, RefusesPermissionEvenToRoot) {
 }
 
 TEST_F(PrivateDevice, IsRecognisedByItsOwnFileSystems) {
-  const outcome outside = run({"/usr/bin/sh", "-c", R"(
+  const outcome mounts = run({"/usr/bin/sh", "-c", R"(
       grep -q ' /var/db tmpfs ' /proc/mounts &&
       grep -q ' /usr/share tmpfs ' /proc/mounts)"});
-  EXPECT_EQ(outside.exit_status, 0);
+  EXPECT_EQ(mounts.exit_status, 0);
 }
 
 TEST_F(PrivateDevice, ShowsEveryChangeInASnapshot) {

@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: BSD-2-Clause
 //
-// Whole boots with the program as it ships.
+// Whole boots with the real program.
 #include <sys/resource.h>
 
 #include <cerrno>
@@ -82,9 +82,13 @@ TEST_F(StartupPass, KeepsARecordOnBootsThatActivateNothing) {
   boot_changes_nothing_and_prints(no_lines());
 }
 
-TEST_F(StartupPass, IgnoresItsArguments) {
+TEST_F(StartupPass, IgnoresItsArgumentsAndEnvironment) {
   const auto before = look_at_everything();
-  const outcome booted = run({MARLIN_PROGRAM, "--help", "/var/db/timezone"});
+  const outcome booted =
+      run({MARLIN_PROGRAM, "--help", "/var/db/timezone"}, [] {
+        ::setenv("TZ", "Mars/Base", 1);
+        ::setenv("TZDIR", "/var/db", 1);
+      });
   EXPECT_EQ(booted.exit_status, 0);
   EXPECT_EQ(booted.log, "");
   EXPECT_EQ(look_at_everything(), before);

@@ -100,7 +100,7 @@ struct outcome {
 outcome run(const std::vector<std::string>& command,
             const std::function<void()>& in_the_child = {});
 
-// Boots: runs marlin, as the shipped program, and expects that no data set, no
+// Boots: runs marlin and expects that no data set, no
 // announcement and nothing on the system partition was changed by it.
 outcome boot();
 

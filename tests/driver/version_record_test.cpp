@@ -78,11 +78,6 @@ TEST_F(VersionRecord, IsQuietlyLeftOutWhenItCannotBeOpened) {
   EXPECT_EQ(file_at(record), nothing);
 }
 
-TEST_F(VersionRecord, IsNotWrittenToADevice) {
-  make_link(record, "/dev/full");
-  EXPECT_THAT(printed_by(write), no_lines());
-}
-
 TEST_F(VersionRecord, IsNotWrittenToAFifoThatNobodyReads) {
   make_fifo(record);
   EXPECT_THAT(printed_by(write), no_lines());

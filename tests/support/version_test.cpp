@@ -93,6 +93,15 @@ TEST(VersionParse, ThrowsOutOfRangeForALargerNumber) {
               no_lines());
 }
 
+TEST(VersionParse, LeavesTheErrnoOfTheStandardConversion) {
+  errno = EXDEV;
+  EXPECT_THROW(mln_version("99999999999999999999a"), std::out_of_range);
+  EXPECT_EQ(errno, ERANGE);
+  errno = EXDEV;
+  EXPECT_THROW(mln_version("2147483648a"), std::out_of_range);
+  EXPECT_EQ(errno, EXDEV);
+}
+
 TEST(VersionParse, KeepsTheFieldsBeforeANumberThatDoesNotFit) {
   mln_version version("2016a.1.2");
   EXPECT_THROW(version.parse("2147483648b.3.4"), std::out_of_range);
