@@ -11,6 +11,7 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <cstdio>
 #include <cstring>
@@ -88,12 +89,30 @@ bool is_memory_file_system(const char* path) {
   return ::statfs(path, &status) == 0 && status.f_type == TMPFS_MAGIC;
 }
 
+// The kernel starts no program that was built for another machine, nor does
+// strace.
+void put_emulator_before_program(std::vector<std::string>& words) {
+  const auto program =
+      std::find_if(words.begin(), words.end(), [](const std::string& word) {
+        return word.starts_with(MARLIN_BINARY_DIR);
+      });
+  if (program != words.end()) words.insert(program, MARLIN_EMULATOR);
+}
+
+// The emulator has a last word on a program that a signal ends.
+void remove_emulators_line(std::string& log) {
+  const auto start = log.rfind("qemu: uncaught target signal ");
+  if (start != std::string::npos) log.erase(start);
+}
+
 dev_t device_of(const char* path) {
   struct stat status {};
   return ::stat(path, &status) == 0 ? status.st_dev : 0;
 }
 
 }  // namespace
+
+bool emulated() { return *MARLIN_EMULATOR != '\0'; }
 
 std::string update(const std::string& version) {
   return downloads + "/" + version;
@@ -235,9 +254,10 @@ outcome run(const std::vector<std::string>& command,
             const std::function<void()>& in_the_child) {
   const int log = ::memfd_create("log", MFD_CLOEXEC);
   must(log >= 0, "create a log");
+  std::vector<std::string> words = command;
+  if (emulated()) put_emulator_before_program(words);
   std::vector<char*> arguments;
-  for (const auto& word : command)
-    arguments.push_back(const_cast<char*>(word.c_str()));
+  for (auto& word : words) arguments.push_back(word.data());
   arguments.push_back(nullptr);
 
   const pid_t child = ::fork();
@@ -252,8 +272,9 @@ outcome run(const std::vector<std::string>& command,
   }
   int status = 0;
   must(::waitpid(child, &status, 0) == child, "wait for " + command[0]);
-  const std::string printed = bytes_of("/proc/self/fd/" + std::to_string(log));
+  std::string printed = bytes_of("/proc/self/fd/" + std::to_string(log));
   ::close(log);
+  if (emulated() && WIFSIGNALED(status)) remove_emulators_line(printed);
   return {WIFEXITED(status) ? WEXITSTATUS(status) : -1,
           WIFSIGNALED(status) ? WTERMSIG(status) : 0, printed};
 }

@@ -96,6 +96,10 @@ struct outcome {
   std::vector<std::string> lines() const;
 };
 
+// Whether the program under test was built for another machine, and runs below
+// an emulator: what the kernel sees of it are the emulator's calls and memory.
+bool emulated();
+
 // Runs a program to its end.
 outcome run(const std::vector<std::string>& command,
             const std::function<void()>& in_the_child = {});
