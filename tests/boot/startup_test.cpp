@@ -25,6 +25,16 @@ std::string not_activated(const std::string& update,
          current;
 }
 
+// What a reset prints when the old "zoneinfo" cannot be removed.
+std::vector<::testing::Matcher<std::string>> lines_of_a_failed_reset(
+    int error) {
+  return {failure("remove: could not remove /var/db/timezone/zoneinfo", error),
+          failure("Unlink of zoneinfo softlink failed", error),
+          failure("create_symlink: from /var/db/timezone/zoneinfo to "
+                  "/usr/share/zoneinfo.default",
+                  EEXIST)};
+}
+
 // A sound device: system 2023c with ICU schema 44l, never updated.
 class StartupPass : public DeviceTest {
  protected:
@@ -463,12 +473,7 @@ TEST_F(StartupPass, EndsAbnormallyWhenTheLastResortFails) {
   wipe(local_time);
   const outcome booted = boot();
   EXPECT_EQ(booted.signal, SIGABRT);
-  const std::vector<::testing::Matcher<std::string>> reset = {
-      failure("remove: could not remove /var/db/timezone/zoneinfo", EISDIR),
-      failure("Unlink of zoneinfo softlink failed", EISDIR),
-      failure("create_symlink: from /var/db/timezone/zoneinfo to "
-              "/usr/share/zoneinfo.default",
-              EEXIST)};
+  const auto reset = lines_of_a_failed_reset(EISDIR);
   EXPECT_THAT(
       booted.lines(),
       lines(failure("read_symlink: /var/db/timezone/zoneinfo", EINVAL),
@@ -529,12 +534,7 @@ TEST_F(StartupPass, EndsAbnormallyInADirectoryThatCannotBeWritten) {
   const auto before = look_at_everything();
   const outcome booted = boot();
   EXPECT_EQ(booted.signal, SIGABRT);
-  const std::vector<::testing::Matcher<std::string>> reset = {
-      failure("remove: could not remove /var/db/timezone/zoneinfo", EACCES),
-      failure("Unlink of zoneinfo softlink failed", EACCES),
-      failure("create_symlink: from /var/db/timezone/zoneinfo to "
-              "/usr/share/zoneinfo.default",
-              EEXIST)};
+  const auto reset = lines_of_a_failed_reset(EACCES);
   EXPECT_THAT(booted.lines(),
               lines(warning("Bad zoneinfo link nonsense"),
                     warning(invalid_links), reset[0], reset[1], reset[2],
@@ -694,12 +694,7 @@ TEST_F(StartupPass, TakesTheLastResortWhenTheResetOfAnOldSetFails) {
   const auto before = look_at_everything();
   const outcome booted = boot();
   EXPECT_EQ(booted.signal, SIGABRT);
-  const std::vector<::testing::Matcher<std::string>> reset = {
-      failure("remove: could not remove /var/db/timezone/zoneinfo", EACCES),
-      failure("Unlink of zoneinfo softlink failed", EACCES),
-      failure("create_symlink: from /var/db/timezone/zoneinfo to "
-              "/usr/share/zoneinfo.default",
-              EEXIST)};
+  const auto reset = lines_of_a_failed_reset(EACCES);
   EXPECT_THAT(booted.lines(),
               lines(warning(incompatible), reset[0], reset[1], reset[2],
                     failure(unable_to_locate, EEXIST), reset[0], reset[1],
