@@ -209,7 +209,6 @@ TEST_F(StartupPass, ActivatesAnUpdateThoughItsAnnouncedDirectoryIsMissing) {
 }
 
 // --- Links that make no sense
-// -------------------------------------------------
 
 TEST_F(StartupPass, ResetsLinksThatWereWiped) {
   wipe(zoneinfo);
@@ -261,7 +260,6 @@ TEST_F(StartupPass, StillRefusesAnUpdateAfterResettingBadLinks) {
 }
 
 // --- A current set that cannot be used any more
-// -------------------------------
 
 TEST_F(StartupPass, ResetsAnUpdateThatASystemUpgradeOvertook) {
   install_update("2024a.1.0", "44l");
@@ -360,7 +358,6 @@ TEST_F(StartupPass, RefusesTheOvertakenUpdateThatIsStillAnnounced) {
 }
 
 // --- The last resort
-// ------------------------------------------------------------
 
 TEST_F(StartupPass, ResetsValidLinksWhenTheAnnouncementIsAFile) {
   install_update("2024a.1.0", "44l");
@@ -465,7 +462,6 @@ TEST_F(StartupPass, EndsWithADefaultLocalTimeWhenTheCorrectedLinkFails) {
 }
 
 // --- Ends that are not an exit
-// -----------------------------------------------------
 
 TEST_F(StartupPass, EndsAbnormallyWhenTheLastResortFails) {
   wipe(zoneinfo);
@@ -549,7 +545,6 @@ TEST_F(StartupPass, NeedsNoWritableDirectoryWhenThereIsNothingToDo) {
 }
 
 // --- The first steps
-// -----------------------------------------------------------------
 
 TEST_F(StartupPass, MovesTheLegacyLinkBeforeLookingAtAnyData) {
   install_update("2024a.1.0", "44l");
@@ -588,7 +583,6 @@ TEST_F(StartupPass, QuietlyLeavesANonEmptyObsoleteIcuDirectoryAtEveryBoot) {
 }
 
 // --- What is read, and how often
-// --------------------------------------------------------
 
 TEST_F(StartupPass, ReadsTheSystemPartitionAnewForEveryDataSetOfIts) {
   // As the system's, as the current set, and for the reset after "invalid".
