@@ -26,9 +26,8 @@ void write_whole_lines() {
 //  4. The system partition's data set is read, and what "tz_latest" announces.
 //  5. "zoneinfo" is resolved, and reset to the system partition if it makes no
 //     sense; the data set that it names is read.
-//  6. So is one reset that names data older than the system's, or of another
-//  ICU
-//     schema.
+//  6. It is reset as well if that set is older than the system's, or of another
+//     ICU schema.
 //  7. An announced update that is strictly newer, and of the system's schema,
 //     is linked into place and recorded.
 //  8. Whatever fails in 4 to 7 ends with links to the system partition.

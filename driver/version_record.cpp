@@ -11,9 +11,9 @@
 
 namespace {
 
-bool is_regular(int descriptor) {
+bool is_special(int descriptor) {
   struct stat status {};
-  return ::fstat(descriptor, &status) == 0 && S_ISREG(status.st_mode);
+  return ::fstat(descriptor, &status) == 0 && !S_ISREG(status.st_mode);
 }
 
 void write_all(int descriptor, std::string_view bytes) {
@@ -36,6 +36,6 @@ void record_version_change(const std::string& from, const std::string& to) {
       O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC | O_NONBLOCK | O_NOCTTY, 0666);
   if (descriptor < 0) return;
   // Whoever reads a FIFO or has a device there did not ask for a record.
-  if (is_regular(descriptor)) write_all(descriptor, record);
+  if (!is_special(descriptor)) write_all(descriptor, record);
   ::close(descriptor);
 }

@@ -23,10 +23,11 @@ The sections, from the bottom up:
  10. the pass
 """
 
+import functools
 import os
 import re
 from errno import (EACCES, EEXIST, EISDIR, EINVAL, ELOOP, ENAMETOOLONG, ENOENT,
-                   ENOTDIR, ENOTEMPTY, ENXIO, ESPIPE)
+                   ENOTDIR, ENOTEMPTY, ENXIO, ERANGE, ESPIPE)
 
 ZONEINFO = "/var/db/timezone/zoneinfo"
 ICUTZ = "/var/db/timezone/icutz"
@@ -180,8 +181,21 @@ class Killed(BaseException):
   """The process is gone; no handler sees this."""
 
 
+def system_call(method):
+  """A method that is one call: when it fails, that is the last error."""
+  @functools.wraps(method)
+  def noting(self, *arguments, **options):
+    try:
+      return method(self, *arguments, **options)
+    except Failed as failed:
+      self.last_error = failed.error
+      raise
+  return noting
+
+
 class Kernel:
-  """Carries out the calls of one boot and writes them down.
+  """Carries out the calls of one boot and writes them down. `last_error` is what
+  the last call that failed has left, and None where the model cannot know.
 
   `fault(number, name, path)` gives the error number with which a call fails, or
   None; calls are counted from 1. A call that fails so has no effect. The boot
@@ -193,6 +207,7 @@ class Kernel:
     self.fault = fault or (lambda number, name, path: None)
     self.killed_before = killed_before
     self.calls = []  # (name, path)
+    self.last_error = None  # the start-up of the process leaves anything
     self.changed = set()  # nodes that a call changed, made or removed
     # A walk that cannot be started takes a lack of memory, not a failing call.
     self.walk_error = lambda path: None
@@ -211,10 +226,12 @@ class Kernel:
       raise Failed(ENOENT)
     return directory, name, node
 
+  @system_call
   def access(self, path):
     self._call("access", path)
     self._existing(path, follow=True)
 
+  @system_call
   def readlink(self, path):
     self._call("readlink", path)
     node = self._existing(path, follow=False)[2]
@@ -222,6 +239,7 @@ class Kernel:
       raise Failed(EINVAL)
     return node.text
 
+  @system_call
   def symlink(self, target, path):
     self._call("symlink", path)
     if not target:
@@ -237,6 +255,7 @@ class Kernel:
     directory.entries[name] = made
     self.changed |= {directory, made}
 
+  @system_call
   def unlink(self, path):
     self._call("unlink", path)
     directory, name, node = self._existing(path, follow=False)
@@ -247,6 +266,7 @@ class Kernel:
     del directory.entries[name]
     self.changed |= {directory, node}
 
+  @system_call
   def rmdir(self, path):
     self._call("rmdir", path)
     directory, name, node = self._existing(path, follow=False)
@@ -259,6 +279,7 @@ class Kernel:
     del directory.entries[name]
     self.changed |= {directory, node}
 
+  @system_call
   def open(self, path):
     self._call("open", path)
     node = self._existing(path, follow=True)[2]
@@ -266,6 +287,7 @@ class Kernel:
       raise Failed(EACCES)
     return node
 
+  @system_call
   def create(self, path):
     """open(2) to write, with everything that was in the file thrown away."""
     self._call("create", path)
@@ -287,6 +309,7 @@ class Kernel:
     self.changed.add(node)
     return node
 
+  @system_call
   def pread(self, node, size, position):
     self._call("pread")
     if node.kind == "dir":
@@ -295,11 +318,13 @@ class Kernel:
       raise Failed(ESPIPE)
     return node.text[position:position + size]
 
+  @system_call
   def write(self, node, text):
     self._call("write")
     node.text += text
     self.changed.add(node)
 
+  @system_call
   def fstat(self):
     self._call("fstat")
 
@@ -307,28 +332,33 @@ class Kernel:
     """A descriptor is closed whatever this reports."""
     try:
       self._call("close")
-    except Failed:
-      pass
+    except Failed as failed:
+      self.last_error = failed.error
 
+  @system_call
   def stat(self, path):
     self._call("stat", path)
     return self._existing(path, follow=True)[2]
 
+  @system_call
   def lstat(self, path):
     self._call("lstat", path)
     return self._existing(path, follow=False)[2]
 
+  @system_call
   def entry_status(self, directory, name):
     """lstat(2) of a name in the working directory."""
     self._call("lstat", name)
     return directory.entries[name]
 
+  @system_call
   def fchdir(self, node=None):
     """To a directory, or back to where the process started."""
     self._call("fchdir")
     if node is not None and not node.permits(1):
       raise Failed(EACCES)
 
+  @system_call
   def getdents(self, node):
     self._call("getdents")
     return list(node.entries)
@@ -358,6 +388,7 @@ def shown(text):
 UNSET_VERSION = (-1, "", -1, -1)
 WHITE_SPACE = " \t\n\v\f\r"
 INT_MAX = 2147483647
+LONG_MAX = 9223372036854775807
 # How much is read at a time; the outcome does not depend on it.
 READ_SIZE = 4096
 
@@ -374,16 +405,15 @@ class Boot:
   """One pass over one kernel.
 
   `lines` gets (text, error) for every line that is printed, without the name of
-  the program. Where `error` is not None, a call has just failed and its text
-  ends the line; otherwise the line ends in whatever was left.
+  the program. The text of `error` ends the line; None: it may be any.
   """
 
   def __init__(self, kernel):
     self.kernel = kernel
     self.lines = []
 
-  def warn(self, text, error=None):
-    self.lines.append((text, error))
+  def warn(self, text):
+    self.lines.append((text, self.kernel.last_error))
 
   # --- 3. The primitives -----------------------------------------------------
 
@@ -393,7 +423,7 @@ class Boot:
     except Failed as failed:
       if failed.error == ENOENT:
         return
-      self.warn(f"remove: could not remove {path}", failed.error)
+      self.warn(f"remove: could not remove {path}")
       raise Thrown from failed
 
   def exists(self, path):
@@ -409,14 +439,14 @@ class Boot:
     except Failed as failed:
       if failed.error == ENOENT:
         return ""
-      self.warn(f"read_symlink: {path}", failed.error)
+      self.warn(f"read_symlink: {path}")
       raise Thrown from failed
 
   def create_symlink(self, target, link):
     try:
       self.kernel.symlink(target, link)
     except Failed as failed:
-      self.warn(f"create_symlink: from {link} to {target}", failed.error)
+      self.warn(f"create_symlink: from {link} to {target}")
       raise Thrown from failed
 
   def c_library_remove(self, path):
@@ -430,10 +460,6 @@ class Boot:
           self.kernel.rmdir(path)
         except Failed:
           pass
-
-  def error_of_last_line(self):
-    """For a line that directly follows that of a call that failed."""
-    return self.lines[-1][1]
 
   # --- 4. The first word of a file -------------------------------------------
 
@@ -450,7 +476,8 @@ class Boot:
       while True:
         some = self.kernel.pread(file, READ_SIZE, len(text))
         if not text and len(some) == READ_SIZE:
-          self.kernel.fstat()  # whether this is a regular file after all
+          # Whether this is a device. If that cannot be told, it is none.
+          quietly(self.kernel.fstat)
         text += some
         word_has_ended = re.compile(r"[^ \t-\r][ \t-\r]").search(
             text, max(0, len(text) - len(some) - 1))
@@ -471,8 +498,9 @@ class Boot:
     error = self.kernel.walk_error(icu_path)
     if error is not None:
       # The text of the error stands twice: once here, once from warn itself.
+      self.kernel.last_error = error
       self.warn(f"tz_icu::initialize: fts_open of {icu_path} failed, "
-                f"{os.strerror(error)}", error)
+                f"{os.strerror(error)}")
       raise Thrown
     schema = self.walk(icu_path, schema_of_data_file)
     if not schema:
@@ -503,12 +531,14 @@ class Boot:
     def go_back():
       return not moves or quietly(kernel.fchdir)
 
-    found = ""
-    if go_back() and directory is not None and directory.kind == "dir":
+    found, to_the_end = "", go_back()
+    if to_the_end and directory is not None and directory.kind == "dir":
       entered, entries = self.list_entries(root, directory, moves)
       found = next((schema for schema in map(schema_of, entries) if schema), "")
       if entered and not found:
-        go_back()  # from the last entry
+        to_the_end = go_back()  # from the last entry
+    if to_the_end and not found:
+      kernel.last_error = 0  # so fts(3) tells the end from a failure
     go_back()
     if moves:
       kernel.close()
@@ -524,6 +554,7 @@ class Boot:
     entered = is_directory and (not moves or (
         quietly(kernel.fstat) and quietly(kernel.fchdir, directory)))
     if entered:
+      last_error = kernel.last_error
       try:
         for name in kernel.getdents(directory):
           try:
@@ -533,8 +564,9 @@ class Boot:
           except Failed:
             pass
         kernel.getdents(directory)  # the end of the list
-      except Failed:
-        pass
+      except Failed as failed:
+        if failed.error == ENOENT:
+          kernel.last_error = last_error  # deleted: that is an end, too
     kernel.close()
     return entered, entries
 
@@ -555,6 +587,8 @@ class Boot:
         return -1
       digits = digits.lstrip("0") or "0"
       if len(digits) > 10 or int(digits) > INT_MAX:
+        if len(digits) > 19 or int(digits) > LONG_MAX:
+          self.kernel.last_error = ERANGE  # as strtol(3) leaves it
         raise Thrown
       return int(digits)
 
@@ -588,8 +622,7 @@ class Boot:
     try:
       self.remove(ZONEINFO)
     except Thrown:
-      self.warn("Unlink of zoneinfo softlink failed",
-                self.error_of_last_line())
+      self.warn("Unlink of zoneinfo softlink failed")
     self.create_symlink(zoneinfo_path(data_set.path), ZONEINFO)
 
   def activate_icu(self, data_set):
@@ -597,7 +630,7 @@ class Boot:
       self.remove(ICUTZ)
       self.remove(LEGACY_ICUTZ)
     except Thrown:
-      self.warn("unlink of ICU softlink failed", self.error_of_last_line())
+      self.warn("unlink of ICU softlink failed")
     if data_set.path != "":
       self.create_symlink(data_set.path + "/icutz", ICUTZ)
 
@@ -629,17 +662,14 @@ class Boot:
       try:
         self.create_symlink(self.read_symlink(LEGACY_ICUTZ), ICUTZ)
       except Thrown:
-        self.warn(f"Could not migrate {LEGACY_ICUTZ} to {ICUTZ}",
-                  self.error_of_last_line())
+        self.warn(f"Could not migrate {LEGACY_ICUTZ} to {ICUTZ}")
     if self.exists(LEGACY_ICUTZ):
       try:
         self.remove(LEGACY_ICUTZ)
       except Thrown:
-        self.warn(f"Could not remove {LEGACY_ICUTZ}",
-                  self.error_of_last_line())
+        self.warn(f"Could not remove {LEGACY_ICUTZ}")
 
   def repair_localtime_link(self):
-    lines_before = len(self.lines)
     try:
       target = self.read_symlink(LOCALTIME)
       if target[:25] == ZONEINFO:
@@ -653,10 +683,7 @@ class Boot:
       self.c_library_remove(LOCALTIME)
       self.create_symlink(corrected, LOCALTIME)
     except Thrown:
-      # A primitive's line, if there is one, directly precedes this.
-      printed = len(self.lines) > lines_before
-      self.warn(f"localtime link invalid; resetting to {DEFAULT_ZONE}",
-                self.error_of_last_line() if printed else None)
+      self.warn(f"localtime link invalid; resetting to {DEFAULT_ZONE}")
       self.c_library_remove(LOCALTIME)
       self.create_symlink(DEFAULT_LOCALTIME, LOCALTIME)
 
@@ -667,7 +694,7 @@ class Boot:
     except Failed:
       return
     try:
-      self.kernel.fstat()
+      quietly(self.kernel.fstat)  # as in first_word()
       self.kernel.write(file, old.version_text + "_" + new.version_text)
     except Failed:
       pass

@@ -36,18 +36,18 @@ class input_file {
     const ssize_t count = ::pread(descriptor_, buffer, size, position_);
     if (count <= 0) return {};
     const auto length = static_cast<std::size_t>(count);
-    // A device that does have positions, such as /dev/zero, fills any buffer.
-    // A first read that falls short is a small file, as these files are, and
-    // is spared the call.
-    if (position_ == 0 && length == size && !is_regular()) return {};
+    // A device that has positions, such as /dev/zero, may never come to an end.
+    // Only one that fills the buffer at once can do harm; these files are too
+    // small for it and are spared the question.
+    if (position_ == 0 && length == size && is_special()) return {};
     position_ += count;
     return {buffer, length};
   }
 
  private:
-  bool is_regular() const {
+  bool is_special() const {
     struct stat status {};
-    return ::fstat(descriptor_, &status) == 0 && S_ISREG(status.st_mode);
+    return ::fstat(descriptor_, &status) == 0 && !S_ISREG(status.st_mode);
   }
 
   int descriptor_;
