@@ -16,8 +16,9 @@ class mln_dataset_component {
   // component at the same position in another data set.
   virtual bool compatible_schema(const mln_dataset_component& other) const = 0;
 
-  // Replaces this component's link by one to its own data. Throws the errno of
-  // a link that could not be created.
+  // Replaces this component's link by one to its own data, or by none where
+  // that is how the data is found. Throws the errno of a link that could not be
+  // created.
   virtual void activate() const = 0;
 
   // The directory of the data set, as given; empty: the system partition.

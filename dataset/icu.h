@@ -12,20 +12,21 @@ class mln_icu final : public mln_dataset_component {
   // The system partition's data, "/usr/share/icu".
   mln_icu();
   // The data in "icutz" below the data set's directory; an empty path means the
-  // system partition. For an update without a usable data file prints "No ICU
-  // schema found for PATH"; when the directory walk cannot be started prints
-  // "tz_icu::initialize: fts_open of PATH/icutz failed, REASON" and throws
-  // errno. fts(3).
+  // system partition. For an update without a usable data file prints
+  // "No ICU schema found for PATH"; when the directory walk cannot be started
+  // prints "tz_icu::initialize: fts_open of PATH/icutz failed, REASON" and
+  // throws errno. fts(3).
   explicit mln_icu(const std::string& path);
 
   // Whether `other` is an mln_icu of the same schema; two without a schema are
-  // compatible. Prints "mln_icu::compatible_schema: could not dynamic_cast
-  // other component" for a component of another class.
+  // compatible. For a component of another class prints
+  // "mln_icu::compatible_schema: could not dynamic_cast other component".
   bool compatible_schema(const mln_dataset_component& other) const override;
 
-  // Removes "/var/db/timezone/icutz" and the legacy "/var/db/icutz", then, for
-  // an update only, creates the former as a link to `icu_path`. Prints "unlink
-  // of ICU softlink failed" when either stays, and goes on.
+  // Removes "/var/db/timezone/icutz" and then the legacy "/var/db/icutz"; the
+  // first that cannot be removed ends that and prints
+  // "unlink of ICU softlink failed". Either way, for an update only, it creates
+  // the former as a link to `icu_path`.
   void activate() const override;
 
   std::string schema{};  // such as 44l; empty when none was found

@@ -17,8 +17,9 @@ std::string current_dataset_path() {
 std::string dataset_path_from_link(const std::string& target) {
   constexpr auto root_length = paths::length(paths::download_root);
   if (target.starts_with(paths::download_root)) {
-    // Deliberate: neither the name after the last "/" nor the depth is looked
-    // at, because the data set that is built from the path settles both.
+    // Deliberate: the name after the last "/" is compared with nothing, because
+    // only the data set counts here. The depth is not looked at because a path
+    // further down gives no version, and a data set without one is given up.
     // Pinned by DatasetPathFromLink.AcceptsAnyNameAfterTheLastSlash and
     // DatasetPathFromLink.AcceptsATargetSeveralLevelsDown.
     const auto last_slash = target.rfind('/');

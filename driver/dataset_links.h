@@ -17,7 +17,7 @@ std::string current_dataset_path();
 
 // The data-set directory in the target of a "zoneinfo" link: for a target below
 // "/var/db/timezone/tz/" all before its last "/", which must stand behind at
-// least one byte of name; for exactly "/usr/share/zoneinfo.default" the empty
-// text. Prints "Bad zoneinfo link TARGET" and throws fsutil::link_rejected for
-// any other target.
+// least one more byte, be it a "/"; for exactly "/usr/share/zoneinfo.default"
+// the empty text. Prints "Bad zoneinfo link TARGET" and throws
+// fsutil::link_rejected for any other target.
 std::string dataset_path_from_link(const std::string& target);

@@ -4,7 +4,8 @@
 // Moves the ICU link from its legacy place, "/var/db/icutz", to
 // "/var/db/timezone/icutz", its text unchanged. A link that already resolves
 // there wins. The legacy link is then deleted; one that dangles counts as
-// absent and stays. Prints "Could not migrate /var/db/icutz to
-// /var/db/timezone/icutz" and "Could not remove /var/db/icutz"; throws only
-// when there is no memory for its own two paths.
+// absent and stays. Prints
+// "Could not migrate /var/db/icutz to /var/db/timezone/icutz" and
+// "Could not remove /var/db/icutz"; throws only when there is no memory for its
+// own two paths.
 void migrate_legacy_icu_link();

@@ -5,8 +5,9 @@
 // through "/var/db/timezone/zoneinfo", whichever data set that names. A link
 // into "/usr/share/zoneinfo", where it pointed on older systems, is rewritten
 // to the same zone, if that can be reached; any other becomes a link to
-// "America/Los_Angeles", whether or not that exists. Prints "Correcting
-// localtime link to TARGET" and "localtime link invalid; resetting to
-// America/Los_Angeles". Throws only when that last resort fails: what
-// fsutil::create_symlink() throws.
+// "America/Los_Angeles", whether or not that exists. Prints
+// "Correcting localtime link to TARGET" and
+// "localtime link invalid; resetting to America/Los_Angeles". Throws only when
+// that last resort fails: what fsutil::create_symlink() throws, or
+// std::bad_alloc when there is no memory for its paths.
 void repair_localtime_link();

@@ -4,8 +4,9 @@
 #pragma once
 
 // Makes the links below "/var/db/timezone/" consistent; see main() for the way
-// of a boot. Whatever fails ends in a warning and in links to the system
-// partition. Throws only what the last resorts throw: the final reset to the
-// system partition (the local-time link is then not looked at) and the default
-// local-time link.
+// of a boot. What fails while a data set is chosen and linked into place ends
+// in a warning and in links to the system partition. Throws only what the last
+// resorts throw: the final reset to the system partition (the local-time link
+// is then not looked at) and the default local-time link; and std::bad_alloc
+// when there is no memory for a fixed path.
 void run_startup_pass();

@@ -21,9 +21,9 @@ namespace fsutil {
 // What callers throw, in the same way, when they reject what a link says.
 inline constexpr int link_rejected = -1;
 
-// unlink(2). A missing path is quiet. Otherwise prints "remove: could not
-// remove PATH" and throws errno; so also for a directory.
-// Returns whether errno is zero afterwards, which no caller uses.
+// unlink(2). A missing path is quiet. Otherwise, so also for a directory,
+// prints "remove: could not remove PATH" and throws errno. Returns whether
+// errno is zero afterwards, which no caller uses.
 bool remove(const std::string& path);
 
 // access(2) with F_OK: whether the path can be reached, through any links, so

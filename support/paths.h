@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: BSD-2-Clause
 //
-// Every place on the device that the program knows: who writes it, who reads
-// it, when it exists. All are absolute and fixed; nothing can move them.
+// Every place on the device that the program knows, and whose it is. All are
+// absolute and fixed; nothing can move them.
 #pragma once
 
 #include <cstddef>
@@ -14,7 +14,8 @@ inline constexpr char timezone_directory[] = "/var/db/timezone/";
 // version text. Written by whoever installs updates.
 inline constexpr char download_root[] = "/var/db/timezone/tz/";
 
-// The links that readers of time-zone data follow. marlin owns them.
+// The links that readers of time-zone data follow. marlin owns them; the user's
+// choice of a zone is written to the last one by others, too.
 inline constexpr char zoneinfo_link[] = "/var/db/timezone/zoneinfo";
 inline constexpr char icu_link[] = "/var/db/timezone/icutz";  // updates only
 inline constexpr char localtime_link[] = "/var/db/timezone/localtime";
@@ -25,8 +26,8 @@ inline constexpr char latest_update_link[] = "/var/db/timezone/tz_latest";
 // Written here whenever an update is activated; it outlives later boots.
 inline constexpr char version_record[] = "/var/db/timezone/TZVersionDiffRecord";
 
-// Left behind by older systems, and removed: where the ICU link used to be, and
-// a place without the two last letters. Both are meant.
+// Left behind by older systems, and removed. The second is no slip for the
+// first.
 inline constexpr char legacy_icu_link[] = "/var/db/icutz";
 inline constexpr char obsolete_icu[] = "/var/db/icu";
 
@@ -42,7 +43,7 @@ constexpr std::size_t length(const char (&)[size]) {
   return size - 1;
 }
 
-// A slip of the keyboard in one of these would accept the wrong links.
+// A byte too many or too few in one of these would accept the wrong links.
 static_assert(length(download_root) == 20);
 static_assert(length(zoneinfo_link) == 25);
 static_assert(length(former_zoneinfo) == 19);

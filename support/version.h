@@ -9,8 +9,8 @@
 // The fields of a version text such as 2024a.1.0. One that was never parsed, or
 // whose text was malformed, is unset, and older than every parsed one.
 struct mln_version {
-  // `major` and `minor` are function-like macros on some systems: only braces
-  // or "=" may follow them.
+  // `major` and `minor` are function-like macros on some systems, so no "(" may
+  // follow them.
   std::int32_t year{-1};
   std::string letters{};
   std::int32_t major{-1};  // -1: the text has none
@@ -19,11 +19,12 @@ struct mln_version {
   mln_version() = default;
   explicit mln_version(const std::string& text);
 
-  // Fills all four fields from `text`. A malformed text prints "Cannot parse
-  // version string TEXT, results.size() = 0" and "Cannot parse version string
-  // TEXT", and leaves the unset value; nothing is thrown. A number that does
-  // not fit throws std::out_of_range and prints nothing; the fields before it
-  // keep their new values.
+  // Fills all four fields from `text`. A malformed text throws nothing, leaves
+  // the unset value, and prints
+  // "Cannot parse version string TEXT, results.size() = 0" and
+  // "Cannot parse version string TEXT". A number that does not fit throws
+  // std::out_of_range and prints nothing; the fields before it keep their new
+  // values.
   void parse(const std::string& text);
 };
 

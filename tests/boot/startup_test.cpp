@@ -208,7 +208,45 @@ TEST_F(StartupPass, ActivatesAnUpdateThoughItsAnnouncedDirectoryIsMissing) {
   expect_links_at_update("2024a.1.0");
 }
 
+// --- The end of a line that follows no failing call
+
+TEST_F(StartupPass, EndsALineInTheErrorOfTheLastCallThatFailed) {
+  install_update("2023b.1.0", "44l");
+  announce("2023b.1.0");
+  // The legacy link was looked for, and "/var/db/icu".
+  boot_prints(lines(failure(not_activated("2023b.1.0", "2023c.1.0"), ENOENT)));
+  point_links_at_update("2023b.1.0");
+  boot_prints(lines(failure(incompatible, ENOENT),
+                    failure(not_activated("2023b.1.0", "2023b.1.0"), ENOENT)));
+
+  make_file(old_icu + "/file");
+  boot_prints(
+      lines(failure(not_activated("2023b.1.0", "2023c.1.0"), ENOTEMPTY)));
+  make_link(tz_latest, "nonsense");
+  boot_prints(lines(
+      failure("mln_dataset::create_components: bad path nonsense", ENOENT),
+      failure(unable_to_locate, ENOENT)));
+  wipe(tz_latest);
+  point_zoneinfo_at("nonsense");
+  boot_prints(lines(failure("Bad zoneinfo link nonsense", ENOENT),
+                    failure(invalid_links, ENOENT)));
+}
+
+TEST_F(StartupPass, EndsALineInSuccessAfterAWalkToTheEnd) {
+  make_directory(update("2024a.1.0") + "/icutz");
+  announce("2024a.1.0");
+  boot_prints(
+      lines(failure("No ICU schema found for /var/db/timezone/tz/2024a.1.0", 0),
+            failure(not_activated("2024a.1.0", "2023c.1.0"), 0)));
+}
+
 // --- Links that make no sense
+
+TEST_F(StartupPass, KeepsALinkToAnotherNameInTheDataSet) {
+  install_update("2024a.1.0", "44l");
+  point_zoneinfo_at(update("2024a.1.0") + "/icutz");
+  boot_changes_nothing_and_prints(no_lines());
+}
 
 TEST_F(StartupPass, ResetsLinksThatWereWiped) {
   wipe(zoneinfo);

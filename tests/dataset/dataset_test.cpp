@@ -253,6 +253,23 @@ TEST_F(Dataset, OfListsOfDifferentLengthsIsNotCompatible) {
   EXPECT_FALSE(system.compatible_with(shorter));
 }
 
+TEST_F(Dataset, AsksItsOwnComponents) {
+  struct scripted final : mln_dataset_component {
+    explicit scripted(bool answer) : answer_(answer) {}
+    bool compatible_schema(const mln_dataset_component&) const override {
+      return answer_;
+    }
+    void activate() const override {}
+    bool answer_;
+  };
+  mln_dataset accepting;
+  mln_dataset refusing;
+  accepting.components = {std::make_shared<scripted>(true)};
+  refusing.components = {std::make_shared<scripted>(false)};
+  EXPECT_TRUE(accepting.compatible_with(refusing));
+  EXPECT_FALSE(refusing.compatible_with(accepting));
+}
+
 TEST_F(DatasetActivate, LinksTheZoneinfoTreeThenTheIcuData) {
   install_update("2024a.1.0", "44l");
   EXPECT_THAT(printed_by([] { mln_dataset(update("2024a.1.0")).activate(); }),

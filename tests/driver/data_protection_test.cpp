@@ -1,8 +1,4 @@
 // SPDX-License-Identifier: BSD-2-Clause
-#include "driver/data_protection.h"
-
-#include <cerrno>
-
 #include "tests/device/device.h"
 
 using namespace device;
@@ -58,23 +54,38 @@ TEST_F(DataProtection, AsksForClassDOnBothDirectoriesBeforeAllElse) {
 
 TEST_F(DataProtection, IsQuietlyLeftOutForADirectoryThatCannotBeOpened) {
   if (emulated()) GTEST_SKIP() << "strace would show the emulator's calls";
+  const auto second_fails = [](const std::string& error) {
+    return ElementsAre(
+        HasSubstr("\"/var/db/timezone/\", O_RDONLY|O_CLOEXEC) = 3"),
+        StartsWith("fcntl(3, 0x40"), StartsWith("close(3)"),
+        HasSubstr("\"/var/db/timezone/tz/\", O_RDONLY|O_CLOEXEC) = -1 " +
+                  error),
+        HasSubstr("\"/var/db/icutz\""));
+  };
   wipe(downloads);
+  EXPECT_THAT(first_calls(5), second_fails("ENOENT"));
+  EXPECT_EQ(link_at(downloads), nothing);
+  make_file(downloads);
+  EXPECT_THAT(first_calls(5), second_fails("ENOTDIR"));
+
+  wipe(downloads);
+  make_directory(downloads);
+  set_mode(timezone_root, 0311);
   EXPECT_THAT(
       first_calls(5),
-      ElementsAre(HasSubstr("\"/var/db/timezone/\", O_RDONLY|O_CLOEXEC) = 3"),
-                  StartsWith("fcntl(3, 0x40"), StartsWith("close(3)"),
-                  HasSubstr("\"/var/db/timezone/tz/\", O_RDONLY|O_CLOEXEC) "
-                            "= -1 ENOENT"),
-                  HasSubstr("\"/var/db/icutz\"")));
+      ElementsAre(
+          HasSubstr("\"/var/db/timezone/\", O_RDONLY|O_CLOEXEC) = -1 EACCES"),
+          HasSubstr("\"/var/db/timezone/tz/\", O_RDONLY|O_CLOEXEC) = 3"),
+          StartsWith("fcntl(3, 0x40"), StartsWith("close(3)"),
+          HasSubstr("\"/var/db/icutz\"")));
 }
 
-TEST_F(DataProtection, CreatesPrintsAndThrowsNothing) {
+TEST_F(DataProtection, CreatesNoDirectoryAndReportsNone) {
   wipe(timezone_root);
-  const auto before = look_at_everything();
-  EXPECT_THAT(printed_by(relax_data_protection), no_lines());
-  EXPECT_THAT(printed_by([] { set_protection_class_d("/var/db/none"); }),
-              no_lines());
-  EXPECT_EQ(look_at_everything(), before);
+  const outcome booted = run({MARLIN_WITH_CLASSES});
+  EXPECT_THAT(booted.lines().front(),
+              StartsWith("marlin_with_classes: Bad zoneinfo link : "));
+  EXPECT_EQ(link_at(timezone_root), nothing);
 }
 
 }  // namespace

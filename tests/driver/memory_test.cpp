@@ -9,6 +9,8 @@
 #include "dataset/zoneinfo.h"
 #include "driver/legacy_icu_link.h"
 #include "driver/localtime_link.h"
+#include "driver/startup.h"
+#include "driver/version_record.h"
 #include "support/first_word.h"
 #include "tests/device/device.h"
 
@@ -89,6 +91,27 @@ TEST_F(WithoutMemory, TheMigrationEndsWhenItsOwnPathsDoNotFit) {
               }),
               no_lines());
   EXPECT_EQ(link_at(legacy_icutz), "/var/db");
+}
+
+TEST_F(WithoutMemory, ThePassEndsWhereTheMigrationDoes) {
+  EXPECT_THAT(printed_by([] {
+                refusals = 1;
+                EXPECT_THROW(run_startup_pass(), std::bad_alloc);
+              }),
+              no_lines());
+  EXPECT_EQ(link_at(zoneinfo), nothing);
+}
+
+TEST_F(WithoutMemory, TheRecordIsLeftAloneAndItsCallerTold) {
+  make_file(record, "2022a.1.0_2023c.1.0");
+  const std::string from = "2023c.1.0";
+  const std::string to = "2024abcdefghi.1.0";
+  EXPECT_THAT(printed_by([&] {
+                refusals = 1;
+                EXPECT_THROW(record_version_change(from, to), std::bad_alloc);
+              }),
+              no_lines());
+  EXPECT_EQ(file_at(record), "2022a.1.0_2023c.1.0");
 }
 
 TEST_F(WithoutMemory, TheLocalTimeIsReset) {
