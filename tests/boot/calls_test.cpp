@@ -2,6 +2,8 @@
 //
 // In which order a boot looks at and changes the links, and what it never does:
 // rename, sync.
+#include <algorithm>
+
 #include "tests/device/device.h"
 
 using namespace device;
@@ -81,6 +83,29 @@ TEST_F(Calls, OfAMigrationTestTheLegacyLinkAnewBeforeItIsRemoved) {
                   "unlink /var/db/icu", "readlink /var/db/timezone/tz_latest",
                   "readlink /var/db/timezone/zoneinfo",
                   "readlink /var/db/timezone/localtime"));
+}
+
+// Without fstat(2) a record, and a word behind more white space than one read
+// takes, are those of any file.
+TEST_F(Calls, ThatCannotTellAFileFromADeviceCountItAsAFile) {
+  make_file(system_tree + "/+VERSION", std::string(5000, ' ') + "2023c\n");
+  install_update("2024a.1.0", "44l");
+  announce("2024a.1.0");
+  const outcome booted =
+      run({"/usr/bin/strace", "-qq", "-o", trace, "-E",
+           "ASAN_OPTIONS=detect_leaks=0", "-P", record, "-P",
+           system_tree + "/+VERSION", "-e",
+           "inject=?fstat,?fstat64,?newfstatat,?fstatat64,?statx:error=EIO",
+           MARLIN_PROGRAM});
+  EXPECT_EQ(booted.exit_status, 0);
+  EXPECT_EQ(booted.log, "");
+  EXPECT_EQ(file_at(record), "2023c.1.0_2024a.1.0");
+  const auto traced = outcome{0, 0, file_at(trace)}.lines();
+  EXPECT_EQ(std::count_if(traced.begin(), traced.end(),
+                          [](const std::string& line) {
+                            return line.ends_with("(INJECTED)");
+                          }),
+            3);  // the system's word is read twice: it is also the current
 }
 
 }  // namespace
