@@ -108,4 +108,24 @@ TEST_F(Calls, ThatCannotTellAFileFromADeviceCountItAsAFile) {
             3);  // the system's word is read twice: it is also the current
 }
 
+// What was only said to be written is missing from the record.
+TEST_F(Calls, OfAShortWriteGoOnBehindWhatWasTaken) {
+  install_update("2024a.1.0", "44l");
+  announce("2024a.1.0");
+  const auto boot_with_first_write_taking = [](const std::string& bytes) {
+    const outcome booted =
+        run({"/usr/bin/strace", "-qq", "-o", trace, "-E",
+             "ASAN_OPTIONS=detect_leaks=0", "-P", record, "-e",
+             "inject=write:retval=" + bytes + ":when=1", MARLIN_PROGRAM});
+    EXPECT_EQ(booted.exit_status, 0);
+    EXPECT_EQ(booted.log, "");
+  };
+  boot_with_first_write_taking("1");
+  EXPECT_EQ(file_at(record), "023c.1.0_2024a.1.0");
+
+  point_links_at_system();
+  boot_with_first_write_taking("0");
+  EXPECT_EQ(file_at(record), "");
+}
+
 }  // namespace

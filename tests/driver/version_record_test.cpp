@@ -56,6 +56,13 @@ TEST_F(VersionRecord, KeepsThePermissionsOfAFileThatIsThere) {
   EXPECT_EQ(look_at({record}).at(record).mode, S_IFREG | 0600u);
 }
 
+TEST_F(VersionRecord, NeedsNoPermissionToRead) {
+  make_file(record, "", 0200);
+  write();
+  set_mode(record, 0600);
+  EXPECT_EQ(file_at(record), "2023c.1.0_2024a.1.0");
+}
+
 TEST_F(VersionRecord, FollowsALink) {
   make_link(record, "/var/db/elsewhere");
   write();
