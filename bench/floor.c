@@ -38,14 +38,28 @@ static inline void read_system(void) {
   read_file("/usr/share/icu/icutzformat.txt");
 }
 
-// The first name is a data file's; whether others may read it is asked.
+// The calls of a walk by fts(3) to the only file of a directory.
+static inline void walk(const char* path, const char* file) {
+  stat(path, &status);
+  const int start = open(".", O_RDONLY);
+  IGNORE(fchdir(start));
+  const int directory =
+      open(path, O_RDONLY | O_NONBLOCK | O_CLOEXEC | O_DIRECTORY);
+  fstat(directory, &status);
+  fstat(directory, &status);
+  IGNORE(fchdir(directory));
+  IGNORE(syscall(SYS_getdents64, directory, buffer, sizeof buffer));
+  lstat(file, &status);
+  IGNORE(syscall(SYS_getdents64, directory, buffer, sizeof buffer));
+  close(directory);
+  IGNORE(fchdir(start));
+  close(start);
+}
+
 static inline void read_update(const char* version, const char* icu,
                                const char* data_file) {
   read_file(version);
-  const int directory = open(icu, O_RDONLY | O_CLOEXEC | O_DIRECTORY);
-  IGNORE(syscall(SYS_getdents64, directory, buffer, sizeof buffer));
-  fstatat(directory, data_file, &status, AT_SYMLINK_NOFOLLOW);
-  close(directory);
+  walk(icu, data_file);
 }
 
 #define READ_UPDATE(path) \
@@ -93,6 +107,7 @@ int main(void) {
   IGNORE(symlink(UPDATE "/icutz", DB "icutz"));
   const int record = open(DB "TZVersionDiffRecord",
                           O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0666);
+  fstat(record, &status);
   IGNORE(write(record, "2023c.1.0_2024a.1.0", 19));
   close(record);
 #endif

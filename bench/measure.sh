@@ -279,18 +279,18 @@ growth() {
   : >"$results/growth.tsv"
   place_programs update "$1"
   prepare_scene update
-  for size in 10 100 1000 10000 100000 1000000; do
+  for size in 10 250000 500000 750000 1000000; do
     for match in first last absent; do
       fill_icu_directory "$match" "$((size - 1))" "$populate"
       measure_point "icu-$match" "$size"
     done
   done
-  for size in 100 1000 10000 100000; do
+  for size in 100 25000 50000 75000 100000; do
     fill_with_a_tree "$size"
     measure_point icu-tree "$size"
   done
   prepare_scene quiet
-  for size in 10 100 1000 10000 100000 1000000 10000000 67108864; do
+  for size in 10 16777216 33554432 50331648 67108864; do
     make_version "$size" >"$tree/+VERSION"
     measure_point version "$size"
   done
