@@ -16,6 +16,11 @@
 
 namespace {
 
+std::string directory_of(const std::string& dataset_path) {
+  if (dataset_path.empty()) return paths::system_icu;
+  return dataset_path + "/icutz";
+}
+
 struct close_walk {
   void operator()(FTS* walk) const { ::fts_close(walk); }
 };
@@ -55,8 +60,7 @@ std::string first_schema(FTS& walk) {
 mln_icu::mln_icu() : mln_icu(std::string()) {}
 
 mln_icu::mln_icu(const std::string& path)
-    : mln_dataset_component(path),
-      icu_path(path.empty() ? paths::system_icu : path + "/icutz") {
+    : mln_dataset_component(path), icu_path(directory_of(path)) {
   initialize();
 }
 

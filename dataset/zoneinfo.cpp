@@ -7,12 +7,19 @@
 #include "support/fsutil.h"
 #include "support/paths.h"
 
+namespace {
+
+std::string tree_of(const std::string& dataset_path) {
+  if (dataset_path.empty()) return paths::system_zoneinfo;
+  return dataset_path + "/zoneinfo";
+}
+
+}  // namespace
+
 mln_zoneinfo::mln_zoneinfo() : mln_zoneinfo(std::string()) {}
 
 mln_zoneinfo::mln_zoneinfo(const std::string& path)
-    : mln_dataset_component(path),
-      zoneinfo_path(path.empty() ? paths::system_zoneinfo
-                                 : path + "/zoneinfo") {
+    : mln_dataset_component(path), zoneinfo_path(tree_of(path)) {
   read_version();
 }
 

@@ -6,7 +6,6 @@
 #include <charconv>
 #include <string>
 #include <string_view>
-#include <system_error>
 #include <tuple>
 
 #include "support/version_grammar.h"
@@ -14,12 +13,11 @@
 namespace {
 
 std::int32_t to_number(std::string_view digits) {
+  // Up to nine digits always fit. Whether more do is for std::stoi to say, with
+  // its exception and the errno that it leaves.
+  if (digits.size() > 9) return std::stoi(std::string(digits));
   std::int32_t number{};
-  const auto [end, error] =
-      std::from_chars(digits.data(), digits.data() + digits.size(), number);
-  // What does not fit is for std::stoi to refuse, with its exception and the
-  // errno that it leaves.
-  if (error != std::errc()) return std::stoi(std::string(digits));
+  std::from_chars(digits.data(), digits.data() + digits.size(), number);
   return number;
 }
 
