@@ -2,7 +2,9 @@
 """One boot as it has to be, in Python.
 
 Written from what the program has to do, not from its code, so that a reader can
-check the one and the proofs then compare it with the other. In goes a device, a
+check the one and the proofs then compare it with the other. Only where several
+ways would do are the calls those that the program chose: how much it reads at
+a time, that it asks what kind of file it has open, the walk. In goes a device, a
 tree of nodes; out come the device afterwards, the lines that are printed, how
 the process ends, and every file-system call on the way, in order, any of which
 can be made to fail.
