@@ -447,8 +447,10 @@ def as_format(text):
       else f"\\{ord(char):03o}" for char in text) + "'"
 
 
-def as_shell(device, boots=1):
-  """The device as commands for a shell inside a private device."""
+def as_shell(device, boots, after, outcome):
+  """A device, booted so often, as a test for a shell: what it builds, boots and
+  then expects of the last boot: the lines, the way of ending, the device below
+  "/var/db", and the record."""
   lines, modes = [], []
 
   def below(path, node):
@@ -471,7 +473,41 @@ def as_shell(device, boots=1):
     below(place, device.find(place))
   lines += [f"chmod {mode:o} {quoted(path)}"
             for path, mode, usual in modes if mode != usual]
-  lines += ["build/release/marlin"] * boots
-  lines.append("ls -lR /var/db")
+  lines += ['"$1" 2>/dev/null'] * (boots - 1)
   return "\n".join(
-      ["scripts/private-device bash <<'END'"] + lines + ["END"])
+      ['marlin=$(realpath "${MARLIN:-build/release/marlin}")',
+       'LC_ALL=C scripts/private-device --readable "${marlin%/*}" '
+       """bash -s "$marlin" <<'END'""", "umask 022"] +
+      lines + expectations(after, outcome) + ["END"])
+
+
+def expectations(device, outcome):
+  """Commands for one more boot, and for what is not as expected after it."""
+  status = 0 if outcome.ending == "exit 0" else 128 + signal.SIGABRT
+  log = "".join(
+      quoted(f"marlin: {text}: ") +
+      ("*" if error is None else quoted(os.strerror(error))) + r"$'\n'"
+      for text, error in outcome.lines)
+  if outcome.ending == "abort":
+    log += "*"  # the runtime's own words may follow
+  below_var = [(path, node) for path, node in device.everything()
+               if path.startswith("/var/db")]
+  listing = [
+      quoted(f"{path} {'p' if node.kind == 'fifo' else node.kind[0]} " +
+             (node.text if node.kind == "link" else ""))
+      for path, node in below_var]
+  files = [(path, node) for path, node in below_var if node.kind == "file" and
+           re.fullmatch("/var/db/[^/]+/[^/]+", path)]
+  return [
+      "failed=0",
+      '"$1" 2>/tmp/log',
+      f"status=$?; ((status == {status})) ||",
+      f"  {{ echo \"status $status, expected {status}\"; failed=1; }}",
+      f"[[ $(cat /tmp/log; echo .) == {log}. ]] ||",
+      "  { echo 'unexpected log:'; cat /tmp/log; failed=1; }",
+      "chmod -R u+rwx /var/db",
+      r"find /var/db -printf '%p %y %l\n' | sort >/tmp/found",
+      " \\\n  ".join([r"printf '%s\n'"] + listing) + " |",
+      "  sort | diff - /tmp/found || failed=1"] + [
+          f"printf {as_format(node.text)} | cmp - {quoted(path)} || failed=1"
+          for path, node in files] + ["exit $failed"]
