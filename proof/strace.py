@@ -6,6 +6,7 @@ for one, there is only unlinkat for unlink and rmdir.
 """
 
 import collections
+import errno
 import re
 
 import device as real
@@ -48,6 +49,12 @@ def run(marlin, *options):
   """Boots under strace; every line of the log has one whole call."""
   return real.boot(["/usr/bin/strace", "-o", LOG, "-s", "0",
                     *options, marlin])
+
+
+def failing(call, error, when):
+  """The options that make a machine's call fail: `when` is its number, or "3+"
+  for the third and all that follow. Not every machine has every call."""
+  return ["-e", f"inject=?{call}:error={errno.errorcode[error]}:when={when}"]
 
 
 def calls():
@@ -100,7 +107,11 @@ def calls_of_the_pass():
 
 
 def pass_of(traced):
-  start = next((index for index, call in enumerate(traced)
-                if call.path and call.path.startswith("/var/db/")), len(traced))
-  return [call for call in traced[start:] if call.name != "print"
-          and call.call in NAMES]
+  return [call for call in traced[beginning(traced):]
+          if call.name != "print" and call.call in NAMES]
+
+
+def beginning(traced):
+  """Where in a trace the pass begins."""
+  return next((index for index, call in enumerate(traced)
+               if call.path and call.path.startswith("/var/db/")), len(traced))
