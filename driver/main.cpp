@@ -11,7 +11,8 @@ namespace {
 void survive_a_lost_log() { std::signal(SIGPIPE, SIG_IGN); }
 
 // warn(3) writes a line in three pieces to an unbuffered stream; a log that
-// takes every write for a record, as the kernel's does, would tear it apart.
+// takes every write for a record, as the kernel's does, would tear it apart. A
+// line longer than the buffer still comes in pieces.
 void write_whole_lines() {
   static char line[BUFSIZ];
   std::setvbuf(stderr, line, _IOLBF, sizeof line);

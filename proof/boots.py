@@ -266,10 +266,6 @@ ABNORMAL_BOOTS = [no_timezone_directory, localtime_blocked, zoneinfo_blocked,
                   system_release_too_great]
 
 
-def usual_boots():
-  return {boot.__name__.replace("_", " "): boot for boot in BOOTS}
-
-
 def all_boots():
   return {boot.__name__.replace("_", " "): boot
           for boot in BOOTS + ABNORMAL_BOOTS}
