@@ -46,7 +46,7 @@ tree=/usr/share/zoneinfo.default
 scenes=(quiet update activation reset localtime)
 
 # What the programs get: nothing, but for the script's sake a path to its tools.
-# A variable more or less is a thousand instructions of the C library's start-up.
+# A variable more is some 550 instructions more in the C library's start-up.
 boot_environment=(PATH=/usr/bin)
 
 # --- The device -----------------------------------------------------------

@@ -31,8 +31,8 @@ void write_whole_lines() {
 //     ICU schema.
 //  7. An announced update that is strictly newer, and of the system's schema,
 //     is linked into place and recorded.
-//  8. What fails in 4, 6 or 7, but for the record, ends with links to the
-//     system partition.
+//  8. What fails in 4 to 7 and is not mended there, but for the record, ends
+//     with links to the system partition.
 //  9. "localtime" is repaired.
 int main() {
   survive_a_lost_log();
