@@ -334,6 +334,21 @@ TEST_F(StartupPass, ResetsACurrentSetWhoseNameIsNoVersion) {
   expect_links_at_system();
 }
 
+TEST_F(StartupPass, ReadsTheSystemsDataAnewForAReset) {
+  install_update("2024a.1.0", "45l");
+  wipe(system_tree + "/+VERSION");
+  const auto first =
+      warning("Cannot parse version string .1.0, results.size() = 0");
+  const auto second = warning("Cannot parse version string .1.0");
+
+  point_links_at_update("2024a.1.0");
+  boot_prints(lines(first, second, warning(incompatible), first, second));
+  // Here the current data set becomes the system's, and is read as well.
+  point_zoneinfo_at("nonsense");
+  boot_prints(lines(first, second, warning("Bad zoneinfo link nonsense"),
+                    warning(invalid_links), first, second, first, second));
+}
+
 TEST_F(StartupPass, StillComparesWithTheOldCurrentSetAfterAReset) {
   // 2024b is newer than the 2024a that was current, so it is activated, though
   // the system's 2025a, to which the links were just reset, is newer still.
