@@ -19,8 +19,9 @@ std::string dataset_path_from_link(const std::string& target) {
   if (target.starts_with(paths::download_root)) {
     // Deliberate: the name after the last "/" is compared with nothing, because
     // only the data set counts here. The depth is not looked at because a path
-    // further down gives no version, and a data set without one is given up.
-    // Pinned by DatasetPathFromLink.AcceptsAnyNameAfterTheLastSlash and
+    // further down gives no version, and a data set without one is older than
+    // any that has one. Pinned by
+    // DatasetPathFromLink.AcceptsAnyNameAfterTheLastSlash and
     // DatasetPathFromLink.AcceptsATargetSeveralLevelsDown.
     const auto last_slash = target.rfind('/');
     if (last_slash > root_length) return target.substr(0, last_slash);

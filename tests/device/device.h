@@ -104,8 +104,8 @@ bool emulated();
 outcome run(const std::vector<std::string>& command,
             const std::function<void()>& in_the_child = {});
 
-// Boots: runs marlin and expects that no data set, no
-// announcement and nothing on the system partition was changed by it.
+// Boots: runs marlin and expects that no data set, no announcement and nothing
+// on the system partition was changed by it.
 outcome boot();
 
 // The lines that `act` prints to standard error in this process.
