@@ -1,0 +1,94 @@
+# SPDX-License-Identifier: BSD-2-Clause
+"""Every file-system call of every chosen boot fails, in turn, with every error number
+that such a call can return; for good, too; with a file system that turns read-only,
+fills up or runs out of quota; with a record of which a write takes only a part; and
+with memory refused wherever the program asks the system for more."""
+
+from errno import (EACCES, EAGAIN, EBUSY, EDQUOT, EEXIST, EFBIG, EINTR, EINVAL, EIO,
+                   EISDIR, ELOOP, EMFILE, ENAMETOOLONG, ENFILE, ENODEV, ENOENT, ENOMEM,
+                   ENOSPC, ENOTDIR, ENOTEMPTY, ENXIO, EOVERFLOW, EPERM, EROFS, ESPIPE,
+                   ETXTBSY, errorcode)
+
+from lab import boot
+from lab.conditions import (Condition, Fails, FailsForGood, WritesInPart,
+                            storage_conditions)
+from lab.devices import CHOSEN
+from lab.trial import trial, undisturbed
+
+# What a walk along a path can fail with.
+WALK = [EACCES, EIO, ELOOP, ENAMETOOLONG, ENOENT, ENOMEM, ENOTDIR]
+# What a change of a directory can fail with, too. Where files are copied when they are
+# written, a removal as well takes space.
+CHANGE = WALK + [EDQUOT, ENOSPC, EPERM, EROFS]
+OPEN = WALK + [EAGAIN, EINTR, EMFILE, ENFILE, ENODEV, ENXIO, EOVERFLOW, EPERM]
+
+ERRORS = {
+    "access": WALK,
+    "readlink": WALK + [EINVAL],
+    "symlink": CHANGE + [EEXIST],
+    "unlink": CHANGE + [EBUSY, EISDIR],
+    "rmdir": CHANGE + [EBUSY, EINVAL, ENOTEMPTY],
+    "open": OPEN,
+    "create": OPEN + [EBUSY, EDQUOT, EISDIR, ENOSPC, EROFS, ETXTBSY],
+    "pread": [EAGAIN, EINTR, EINVAL, EIO, EISDIR, ENOMEM, ESPIPE],
+    "write": [EAGAIN, EDQUOT, EFBIG, EINTR, EIO, ENOMEM, ENOSPC, EPERM],
+    "close": [EDQUOT, EINTR, EIO, ENOSPC],
+    "stat": WALK + [EOVERFLOW],
+    "lstat": WALK + [EOVERFLOW],
+    "fstat": [EIO, ENOMEM, EOVERFLOW],
+    "fchdir": [EACCES, EIO, ENOTDIR],
+    "getdents": [EINVAL, EIO, ENOENT, ENOMEM],
+}
+# Those that do not go away by themselves.
+LASTING = {EACCES, EDQUOT, EIO, EMFILE, ENFILE, ENOMEM, ENOSPC, EPERM, EROFS}
+# Those that mean something of their own, and one that does not; a quick run takes
+# these, and one more in turn.
+QUICK = {ENOENT, EISDIR, EEXIST, EIO}
+
+
+def disturbances(quick):
+    """The tables: (test, device, condition)."""
+    count = 0
+    for name, make in CHOSEN.items():
+        calls = boot.pass_of(undisturbed(name).calls)
+        for number, call in enumerate(calls, start=1):
+            count += 1
+            once = ERRORS[call.name]
+            for_good = [error for error in once if error in LASTING]
+            if quick:
+                turn = once[count % len(once)]
+                once = [error for error in once if error in QUICK or error == turn]
+                for_good = [for_good[count % len(for_good)]]
+            for error in once:
+                yield "call", name, Fails(number, call, error)
+            for error in for_good:
+                yield "good", name, FailsForGood(number, call, error)
+            if call.name == "write":
+                for taken in (0, 1, 8):
+                    yield "part", name, WritesInPart(number, call, taken)
+        for condition in storage_conditions(make(), calls):
+            yield "storage", name, condition
+
+
+def pytest_generate_tests(metafunc):
+    kind = metafunc.function.__name__
+    table = [(name, condition) for test, name, condition
+             in disturbances(metafunc.config.getoption("quick")) if test in kind]
+    if "condition" in metafunc.fixturenames:
+        metafunc.parametrize("name, condition", table, ids=[f"{n}: {c.name}" for n, c in table])
+
+
+def test_a_call_that_fails(name, condition):
+    trial(CHOSEN[name](), condition)
+
+
+def test_a_failure_for_good(name, condition):
+    trial(CHOSEN[name](), condition)
+
+
+def test_storage(name, condition):
+    trial(CHOSEN[name](), condition)
+
+
+def test_a_write_in_part(name, condition):
+    trial(CHOSEN[name](), condition)

@@ -1,0 +1,201 @@
+# SPDX-License-Identifier: BSD-2-Clause
+"""The program is killed at every system call of every chosen boot, before the call
+takes effect (and therefore also after the one before it), and boots again.
+
+After one undisturbed boot the device holds what every reader needs, and nothing that
+is not the program's has changed (`properties`). After three boots it is what it would
+have been without the kill, except for the windows that are named and pinned below.
+The full run kills the next boot as well, for every pair of changes to a link; then
+the device has to settle in the same way.
+"""
+
+import collections
+from typing import NamedTuple
+
+from lab import boot, model, properties
+from lab.carriers import namespace
+from lab.conditions import Killed
+from lab.device import Device
+from lab.devices import ABNORMAL, CHOSEN
+from lab.paths import (DEFAULT_LOCALTIME, ICUTZ, LEGACY_ICUTZ, LOCALTIME, RECORD,
+                       ZONEINFO)
+from lab.seen import Entries
+from lab.trial import entry_differences, fail, trial, undisturbed
+
+# As many as it takes until a device is settled: an update that was activated after a
+# reset, though older than the system's data, is reset once more.
+BOOTS_TO_SETTLE = 3
+
+# --- The windows -----------------------------------------------------------------
+
+
+class Window(NamedTuple):
+    """From which the next boots do not fully recover. It is open after a kill between
+    two changes: after the last call `opened` that was carried out, and before `closed`.
+    `left` is what is then different for good."""
+    name: str
+    path: str
+    opened: tuple
+    closed: tuple
+    left: callable
+
+
+WINDOWS = [
+    Window("an update's zoneinfo without its ICU data",
+           ICUTZ, ("symlink", ZONEINFO), ("symlink", ICUTZ),
+           lambda left, usual, _: usual is not None),
+    Window("the system's zoneinfo with an update's ICU data",
+           ICUTZ, ("symlink", ZONEINFO), ("unlink", ICUTZ),
+           lambda left, usual, _: left is not None and usual is None),
+    Window("a legacy link that dangles is kept",
+           LEGACY_ICUTZ, ("symlink", ZONEINFO), ("unlink", LEGACY_ICUTZ),
+           lambda left, usual, _: usual is None),
+    Window("an update older than the system's data is not activated",
+           RECORD, ("unlink", ZONEINFO), ("create", RECORD),
+           lambda left, usual, calls: left is None and usual == "2023c.1.0_2023b.1.0"
+           and calls.count(("symlink", ZONEINFO)) < 2),
+    Window("an activation without a record",
+           RECORD, ("symlink", ZONEINFO), ("create", RECORD),
+           lambda left, usual, _: left is None or left.endswith("_2023d.1.0")),
+    Window("an empty record",
+           RECORD, ("create", RECORD), ("write", None),
+           lambda left, usual, _: left == ""),
+    Window("a record that starts from the system's release",
+           RECORD, ("unlink", ZONEINFO), ("symlink", ZONEINFO),
+           lambda left, usual, _: left is not None and
+           left.startswith("2023c.1.0_") and not usual.startswith("2023c")),
+    Window("a corrected localtime becomes the default",
+           LOCALTIME, ("unlink", LOCALTIME), ("symlink", LOCALTIME),
+           lambda left, usual, _: left == DEFAULT_LOCALTIME),
+]
+
+
+def window_of(path, left, usual, carried_out):
+    """The window that explains a difference after a kill, or None."""
+    for window in WINDOWS:
+        if (window.path == path and window.left(left, usual, carried_out)
+                and window.opened in carried_out):
+            since = carried_out[len(carried_out) -
+                                carried_out[::-1].index(window.opened):]
+            if window.closed not in since:
+                return window.name
+    return None
+
+
+# --- Every kill --------------------------------------------------------------------
+
+CHANGES = ("symlink", "unlink", "rmdir", "create", "write")
+
+
+def kills(name: str, quick: bool):
+    """One before every call of a chosen boot; a quick run takes those next to a change.
+    strace makes the first call itself."""
+    traced = undisturbed(name).calls
+    in_the_pass = boot.pass_of(traced)
+    carried_out = 0
+    for call in traced[1:]:
+        within = call in in_the_pass
+        carried_out += within
+        near = in_the_pass[max(0, carried_out - 2):carried_out]
+        if not quick or any(other.name in CHANGES for other in near):
+            yield Killed(call.call, call.number, carried_out + (not within))
+
+
+class Change(NamedTuple):
+    call: str
+    number: int
+    killed_before: int
+
+    def kill(self):
+        return Killed(*self)
+
+
+def link_changes(device: Device):
+    """The changes to links in the next boot of a described device."""
+    families = {"symlink": "?symlink,?symlinkat", "unlink": "?unlink,?unlinkat"}
+    counts = collections.Counter()
+    for number, (name, _) in enumerate(model.boot(device).calls, start=1):
+        if name == "rmdir":  # some machines have no such call and use unlink's
+            return
+        if name in families:
+            counts[name] += 1
+            yield Change(families[name], counts[name], number)
+
+
+def pairs(name: str):
+    for first in link_changes(CHOSEN[name]()):
+        device = CHOSEN[name]()
+        model.boot(device, killed_before=first.killed_before)
+        for second in link_changes(device):
+            yield first.kill(), second.kill()
+
+
+def pytest_generate_tests(metafunc):
+    quick = metafunc.config.getoption("quick")
+    if "kill" in metafunc.fixturenames:
+        table = [(name, kill) for name in CHOSEN for kill in kills(name, quick)]
+        metafunc.parametrize("name, kill", table,
+                             ids=[f"{name}: {kill.name}" for name, kill in table])
+    elif "second" in metafunc.fixturenames:
+        table = [(name, *pair) for name in CHOSEN
+                 for pair in ([] if quick else pairs(name))]
+        metafunc.parametrize(
+            "name, first, second", table,
+            ids=[f"{name}: {first.name}, then {second.name}"
+                 for name, first, second in table])
+
+
+def killed(device: Device, kill: Killed, start: Entries, whole_log="") -> model.Outcome:
+    """A boot that is killed, really and in the model."""
+    outcome = model.boot(device, killed_before=kill.killed_before)
+    booted = boot.traced(*kill.options(outcome))
+    found = entry_differences(device, namespace.look())
+    if booted.ending != "killed":
+        found.append(f"ended with {booted.ending}")
+    if whole_log and not whole_log.startswith(booted.log):
+        found.append(f"printed {booted.log!r}")
+    if found:
+        fail(kill.name, found, start)
+    return outcome
+
+
+def settles(name: str, device: Device, start: Entries):
+    """Boots until the device has settled, and once more."""
+    for number in range(1, BOOTS_TO_SETTLE + 2):
+        again, seen = trial(device, tell=f"boot {number} after the kill", again=True)
+        found = properties.data_changes(start, seen.after)
+        if name not in ABNORMAL:
+            found += properties.not_ready(seen)
+        if number > BOOTS_TO_SETTLE:
+            found += properties.changed_by_a_settled_boot(properties.Judged(seen))
+        if found:
+            fail(f"boot {number} after the kill", found, start)
+
+
+def test_a_kill(name, kill, count):
+    usual = CHOSEN[name]()
+    for _ in range(BOOTS_TO_SETTLE + 1):
+        model.boot(usual)
+    usual = usual.contents()
+    device = CHOSEN[name]()
+    namespace.build(device)
+    start = namespace.look()
+    outcome = killed(device, kill, start, undisturbed(name).log)
+    settles(name, device, start)
+    left = device.contents()
+    for path in sorted(left.keys() | usual.keys()):
+        if left.get(path) != usual.get(path):
+            window = window_of(path, left.get(path), usual.get(path), outcome.calls)
+            if not window:
+                fail(kill.name, [f"leaves {path} as {left.get(path)!r} for good, "
+                                 f"not as {usual.get(path)!r}"], start)
+            count(f"kills leave {window}")
+
+
+def test_two_kills(name, first, second):
+    device = CHOSEN[name]()
+    namespace.build(device)
+    start = namespace.look()
+    killed(device, first, start)
+    killed(device, second, start)
+    settles(name, device, start)
