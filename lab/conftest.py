@@ -11,9 +11,17 @@ import pytest
 
 sys.path.insert(0, os.path.dirname(os.path.dirname(os.path.abspath(__file__))))
 
+from lab import devices, properties, test_kills  # noqa: E402
 from lab.carriers import namespace  # noqa: E402
 
-TALLY = collections.Counter()
+TALLY = {}
+
+
+def added_up(figures):
+    sums = collections.Counter()
+    for title, number in figures:
+        sums[title] = (max if title.startswith("most ") else sum)((sums[title], number))
+    return sums
 
 
 def pytest_addoption(parser):
@@ -31,10 +39,11 @@ def pytest_sessionstart(session):
 
 @pytest.fixture
 def count(request):
-    """count(title, n=1) adds to a figure that is printed at the end."""
-    tally = collections.Counter()
-    yield lambda title, n=1: tally.update({title: n})
-    request.node.user_properties.extend(tally.items())
+    """count(title, n=1) adds to a figure that is printed at the end; of a "most ..." the
+    greatest counts."""
+    tally = []
+    yield lambda title, n=1: tally.append((title, n))
+    request.node.user_properties.extend(added_up(tally).items())
 
 
 @pytest.hookimpl(hookwrapper=True)
@@ -46,12 +55,34 @@ def pytest_runtest_makereport(item, call):
 
 def pytest_runtest_logreport(report):
     if report.when == "call" and report.passed:
-        TALLY[report.nodeid.partition("[")[0].partition("::")[2]] += 1
+        name = report.nodeid.partition("[")[0].partition("::")[2]
+        TALLY[name] = TALLY.get(name, 0) + 1
     if report.when == "teardown":
-        for title, number in report.user_properties:
-            TALLY[title] += number
+        TALLY.update(added_up([*TALLY.items(), *report.user_properties]))
 
 
+def never_seen() -> list[str]:
+    """What a run of this size has to have met, and has not."""
+    wanted = []
+    if TALLY.get("test_a_kill", 0) >= 200:
+        wanted += [f"kills leave {window.name}" for window in test_kills.WINDOWS]
+    if TALLY.get("states", 0) >= 2000:
+        wanted += [f"of them: {outcome}" for outcome in properties.OUTCOMES]
+    if TALLY.get("test_memory_is_refused", 0) == len(devices.CHOSEN):
+        wanted.append("refusals after which a walk is not started")
+    return [title for title in wanted if not TALLY.get(title)]
+
+
+@pytest.hookimpl(tryfirst=True)
+def pytest_sessionfinish(session):
+    if never_seen() and not session.exitstatus:
+        session.exitstatus = 1
+
+
+@pytest.hookimpl(trylast=True)
 def pytest_terminal_summary(terminalreporter):
-    for title, number in sorted(TALLY.items()):
-        terminalreporter.line(f"{number:8} {title.removeprefix('test_').replace('_', ' ')}")
+    for title in never_seen():
+        terminalreporter.line(f"FAILED: never seen: {title}")
+    terminalreporter.line("; ".join(
+        f"{title.removeprefix('test_').replace('_', ' ')}: {number}"
+        for title, number in TALLY.items()))
