@@ -1,0 +1,83 @@
+# SPDX-License-Identifier: BSD-2-Clause
+"""What the demonstration looks like: headings, paragraphs, and the device before and
+after a boot side by side. With colours on a terminal."""
+
+import locale
+import os
+import sys
+import textwrap
+from collections.abc import Iterable
+
+WIDTH, NAME = 100, 13  # columns: of the whole, and of the names of rows
+LEAST_BEFORE = 41  # of what was there before the boot
+
+COLOURED = "FORCE_COLOR" in os.environ or (
+    sys.stdout.isatty() and "NO_COLOR" not in os.environ
+    and os.environ.get("TERM", "dumb") != "dumb")
+BOLD, DIM, RED, GREEN, YELLOW = (
+    (f"\x1b[{code}m" if COLOURED else "") for code in (1, 2, 31, 32, 33))
+DASH = "─" if locale.nl_langinfo(locale.CODESET) == "UTF-8" else "-"
+
+
+def paint(colour: str, text: str) -> str:
+    return f"{colour}{text}\x1b[0m" if colour else text
+
+
+def rule(title: str):
+    """A heading, across the screen."""
+    line = DASH * (WIDTH - len(title) - 4)
+    print(f"\n{DASH * 2} {paint(BOLD, title)} {line}")
+
+
+def say(text: str, colour=""):
+    """A paragraph, however it is broken in the source."""
+    print("\n" + paint(colour, textwrap.fill(
+        " ".join(text.split()), WIDTH - 3, initial_indent="  ", subsequent_indent="  ",
+        break_on_hyphens=False)))
+
+
+def field(name: str, text: str):
+    print(f"  {name:<{NAME - 2}}{text}")
+
+
+def row(name: str, before: str, after: str, width=LEAST_BEFORE, marker=" ", colour=DIM):
+    print(paint(colour, f"{marker} {name:<{NAME - 2}}") +
+          paint(colour if marker == " " else "", f"{before:<{width}}") +
+          paint(colour, after))
+
+
+def changes(was: dict[str, str], found: dict[str, str], remade: set[str]):
+    """A row for everything found before and after a boot. "+" marks what is new, "-"
+    what is gone, "~" what has changed; `remade` are those that were made again."""
+    width = max(LEAST_BEFORE, *(len(text) + 2 for text in was.values()))
+    print()
+    row("", "before the boot", "after it", width)
+    for name, before in was.items():
+        after, marker, colour = found[name], "~", GREEN
+        if before == after and name in remade:
+            after = "made again, the same"
+        elif before == after:
+            marker, colour = " ", DIM
+            after = "none" if after == "none" else "unchanged"
+        elif before == "none":
+            marker = "+"
+        elif after == "none":
+            marker, colour = "-", YELLOW
+        row(name, before, after, width, marker, colour)
+
+
+def printed(lines: Iterable[str]):
+    """Lines of a boot. One that is too long is broken before the system's text, which
+    follows the last colon."""
+    name, room = "printed", WIDTH - NAME
+    if not lines:
+        field(name, "nothing")
+    for line in lines:
+        head, colon, text = line.rpartition(": ")
+        head, text = (head + ":", " " + text) if colon else (line, "")
+        if len(line) > room:
+            indent = "\n" + " " * NAME
+            head = indent.join(textwrap.wrap(head, room, break_on_hyphens=False))
+            text = indent + " " + text
+        field(name, paint(YELLOW, head) + paint(DIM, text))
+        name = ""

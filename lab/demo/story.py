@@ -1,0 +1,262 @@
+# SPDX-License-Identifier: BSD-2-Clause
+"""The story of the demonstration: eight boots of one device. A scene is a title, what
+led to it, and one boot. What it claims of the device afterwards stands in `facts`.
+
+Told on a private device, where `scripts/demo` starts it; with --facts nothing is
+printed but what was found, to be the same as the file.
+"""
+
+from __future__ import annotations
+
+import contextlib
+import difflib
+import os
+import signal
+import subprocess
+import sys
+import time
+from collections.abc import Iterable
+from pathlib import Path
+
+from lab import boot, lines
+from lab.carriers import namespace
+from lab.demo import data, screen
+from lab.device import Device, decoded
+from lab.paths import (DOWNLOADS, FORMER_ZONEINFO, ICUTZ, LOCALTIME, RECORD, SYSTEM_ICU,
+                       SYSTEM_ZONEINFO, TIMEZONE, TZ_LATEST, ZONEINFO, update_path)
+from lab.seen import Entries, Seen, as_device
+
+ROWS = {"zoneinfo": ZONEINFO, "icutz": ICUTZ, "localtime": LOCALTIME,
+        "tz_latest": TZ_LATEST, "record": RECORD}
+CLAIMS = Path(__file__).with_name("facts").read_text(encoding="ascii").splitlines()
+CLAIMED = {claim.partition(" -> ")[0] for claim in CLAIMS}
+
+
+def tell(story: Story):
+    device, names, year = story.device, story.names, story.year
+    put_off = f"1 January {year + 1}"
+    screen.rule("marlin, eight boots of one device")
+    screen.say(f"""At every boot marlin decides which time-zone data a device uses:
+        what its system partition holds, or an update downloaded since. Whoever
+        reads time-zone data follows the links that marlin keeps in {TIMEZONE}:""")
+    print(f"""
+  zoneinfo    the tree of zone files in use
+  icutz       the ICU data in use; only for an update
+  localtime   the user's zone, a file in that tree
+  tz_latest   the newest download; set by whatever downloads, only read by marlin
+
+  {screen.paint(screen.DIM, "Shown beside them:")}
+  record      the file TZVersionDiffRecord: from which version to which the last \
+update led
+  clock       "date" with TZ=:{LOCALTIME}, at noon UTC on 1 February {year}""")
+    screen.say("""The device is private and gone when this ends. Its data is real,
+        that of this machine, but for one invention in the later releases: Lisbon
+        goes from Western European Time, WET, to Central European Time, CET. The ICU
+        data is the same in all; one download has it under the name of another
+        format.""")
+    print(f"""
+  {screen.paint(screen.DIM, " " * 12 + "ICU format   Lisbon changes   what it is")}
+  {names.system:<11} {names.icu:<12} never            the system partition at first
+  {names.update:<11} {names.icu:<12} 1 January {year}   a download
+  {names.refused:<11} {names.other_icu:<12} {put_off}   a later download
+  {names.upgrade:<11} {names.icu:<12} {put_off}   the system partition after \
+an upgrade""")
+
+    device.directory(DOWNLOADS)
+    story.install_system("system")
+    story.scene("A first boot", """A new device: the system partition holds its
+        data, but there is no link yet. Nothing says which data is in use, so marlin
+        links the system partition's and, in it, the default zone.""")
+    screen.say("""The words after the last colon are the system's text for whatever
+        call failed last; they need not have to do with the line in which they
+        stand.""", screen.DIM)
+
+    seen = story.scene("A quiet boot", """Nothing has happened since. The links name
+        data that fits, so marlin touches nothing: the links and their directory are
+        the very ones that they were, to the nanosecond.""")
+    print()
+    for name, path in {"zoneinfo": ZONEINFO, "localtime": LOCALTIME,
+                       "directory": TIMEZONE}.items():
+        screen.row(name, identity(seen.before, path), identity(seen.after, path))
+
+    device.choose_zone("Europe/Lisbon")
+    story.download_and_announce("update")
+    story.scene("An update is activated", f"""The user has moved to Lisbon, and
+        {names.update} has been downloaded: Lisbon changes to CET as {year} begins. The
+        update is newer than {names.system} and its ICU data has the system's format, so
+        marlin links it. On 1 February noon UTC was to be 12:00 in Lisbon; now it is
+        13:00.""", clock_before="12:00 WET")
+
+    story.scene("The same update again", f"""tz_latest still announces {names.update},
+        which is in use by now. Equal is not newer, so marlin says so, as at every
+        boot from now on, and touches nothing.""")
+
+    story.download_and_announce("refused")
+    story.scene("An update that does not fit is refused", f"""{names.refused} puts
+        Lisbon's change off by a year. It is newer, but its ICU data has the format
+        {names.other_icu} and the system reads {names.icu}, so marlin refuses it and
+        stays with {names.update}.""")
+
+    story.install_system("upgrade")
+    story.scene("A system upgrade overtakes the update", f"""The system partition
+        has been upgraded and now holds {names.upgrade}, newer than the update in
+        use. So marlin goes back to the system partition, where Lisbon's change is
+        put off too. The refused update is still announced, and refused
+        again.""", clock_before="13:00 CET")
+
+    device.link(ZONEINFO, "/nowhere")
+    device.file(LOCALTIME, "damaged\n")
+    device.drop(TZ_LATEST)
+    story.scene("Damaged links are repaired", """The links are damaged: zoneinfo
+        names nothing known, localtime has become a plain file, and tz_latest is
+        lost. So marlin links the system partition's data again, and the default
+        zone, as nothing tells any more which one was the
+        user's.""", clock_before="12:00, no zone")
+
+    device.link(LOCALTIME, f"{FORMER_ZONEINFO}/Europe/Lisbon")
+    story.scene("A link from an older system is corrected", """A backup has brought
+        back the user's localtime link, but as an older system wrote it, into a tree
+        that this one does not have. The zone is known, so marlin points the link at
+        the same zone of the tree in use.""", clock_before="12:00, no zone")
+    story.summary()
+
+
+class Story:
+    """A device, its boots, and what was found after them."""
+
+    def __init__(self):
+        self.device = Device()  # as it is to be at the next boot
+        self.names = data.names()
+        self.year = int(self.names.system[:4]) + 1
+        self.endings = []  # of scenes, in the words of the summary
+        self.facts = []  # as they were found
+        self.wrong = []  # where that is not as claimed
+
+    def bring(self, source: str, target: str):
+        """Has the device hold what stands somewhere in the data."""
+        source = decoded(os.fsencode(data.TARGET.absolute() / source))
+        entries: Entries = {}
+        namespace.look_below(source, entries)
+        self.device.put(target, as_device(entries).find(source))
+
+    def install_system(self, data_set: str):
+        self.bring(f"{data_set}/zoneinfo", SYSTEM_ZONEINFO)
+        self.bring(f"{data_set}/icu", SYSTEM_ICU)
+
+    def download_and_announce(self, data_set: str):
+        version = getattr(self.names, data_set)
+        self.bring(data_set, update_path(version))
+        self.device.announce(version)
+
+    def scene(self, title: str, words: str, clock_before="") -> Seen:
+        screen.rule(f"{len(self.endings) + 1}  {title}")
+        screen.say(words)
+        # What is there already, from the boot before, is not made anew.
+        if self.device.contents() != as_device(namespace.look()).contents():
+            namespace.build(self.device)
+        before = namespace.look()
+        was = self.rows(before)
+        booted = boot.boot()
+        seen = Seen(before, namespace.look(), *booted)
+        found = self.rows(seen.after)
+        self.device.root = as_device(seen.after).root
+
+        status, log = seen.ending.removeprefix("exit "), seen.log.splitlines()
+        touched = seen.changed()
+        screen.changes(was, found, {row for row in ROWS if ROWS[row] in touched})
+        print()
+        screen.printed(log)
+        screen.field("exit", f"status {status}")
+        self.endings.append(f"{title:<42}{data_in_use(seen.after):<26}{found['clock']}")
+
+        warned = [f"warned '{line.removeprefix(lines.NAME).rpartition(': ')[0]}'"
+                  for line in log] or ["no warning"]
+        facts = [f"status -> {status}", *["nothing touched"][:not touched], *warned,
+                 *(f"{name} -> {value}" for name, value in found.items())]
+        self.note(f"{title.lower()}: {fact}" for fact in facts)
+        if clock_before not in ("", was["clock"]):
+            self.wrong.append(f"{title.lower()}: clock was {was['clock']} before it")
+        return seen
+
+    def note(self, found: Iterable[str]):
+        """Keeps what was found after a boot: all warnings, and what else there is a
+        claim about."""
+        for fact in found:
+            # The same words for the releases of every machine.
+            fact = fact.replace(self.names.update, "<update>")
+            fact = fact.replace(self.names.refused, "<refused>")
+            fact = fact.replace(f"{self.names.system}.1.0", "<system>")
+            if fact.partition(" -> ")[0] in CLAIMED or ": warned '" in fact:
+                self.facts.append(fact)
+
+    def rows(self, entries: Entries) -> dict[str, str]:
+        """What is shown of the device as it is now, with these entries."""
+        rows = {name: stands(entries, path) for name, path in ROWS.items()}
+        if rows["record"] == "(a plain file)":
+            rows["record"] = entries[RECORD].text
+        clock = subprocess.run(
+            ["date", "-d", f"{self.year}-02-01 12:00 UTC", "+%H:%M %Z"], check=True,
+            env={"TZ": f":{LOCALTIME}"}, stdout=subprocess.PIPE, text=True
+        ).stdout.rstrip("\n")
+        # Without a zone file there is no name of a zone, and the hour is UTC's.
+        rows["clock"] = clock[:-1] + ", no zone" if clock.endswith(" ") else clock
+        return rows
+
+    def summary(self):
+        screen.rule("In short")
+        heading = f"   {'boot':<42}{'data in use after it':<26}clock"
+        print("\n  " + screen.paint(screen.DIM, heading))
+        for number, ending in enumerate(self.endings, start=1):
+            print(f"  {number}  {ending}")
+        self.wrong += [line for line in difflib.ndiff(CLAIMS, self.facts)
+                       if line[0] in "+-"]
+        if self.wrong:
+            screen.say("Not all is as claimed.", screen.RED)
+            print("Not as claimed:", *self.wrong, sep="\n", file=sys.stderr)
+        else:
+            screen.say(f"All {len(CLAIMS)} facts told above were found on the device.",
+                       screen.GREEN)
+        print()
+
+
+def stands(entries: Entries, path: str) -> str:
+    if path not in entries:
+        return "none"
+    here = entries[path]
+    return here.text if here.kind == "link" else f"(a plain {here.kind})"
+
+
+def data_in_use(entries: Entries) -> str:
+    """As "2025b.1.0, system" or "2025c.1.0, downloaded"."""
+    tree = stands(entries, ZONEINFO)
+    if tree == SYSTEM_ZONEINFO:
+        return entries[f"{tree}/+VERSION"].text.strip() + ".1.0, system"
+    if tree.startswith(DOWNLOADS):
+        return tree.removeprefix(DOWNLOADS).partition("/")[0] + ", downloaded"
+    return "none"
+
+
+def identity(entries: Entries, path: str) -> str:
+    if path not in entries:
+        return "none"
+    inode, _, changed = entries[path].identity
+    moment = time.strftime("%H:%M:%S", time.localtime(changed // 10**9))
+    return f"inode {inode}, changed {moment}.{changed % 10**9:09}"
+
+
+def main() -> int:
+    namespace.insist_on_private_device()
+    signal.signal(signal.SIGPIPE, signal.SIG_DFL)
+    os.umask(0o022)
+    story = Story()
+    if sys.argv[1:] == ["--facts"]:
+        with open(os.devnull, "w") as nothing, contextlib.redirect_stdout(nothing):
+            tell(story)
+        print(*story.facts, sep="\n")
+    else:
+        tell(story)
+    return 1 if story.wrong else 0
+
+
+if __name__ == "__main__":
+    sys.exit(main())
