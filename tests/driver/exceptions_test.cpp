@@ -2,8 +2,8 @@
 //
 // An exception of any type, from anything that the pass calls, ends as it has
 // to: handled in place while the current links are resolved, otherwise in the
-// last resort. This program's own functions stand in for those of the libraries;
-// each does its job, except where it is told to throw.
+// last resort. This program's own functions stand in for those of the
+// libraries; each does its job, except where it is told to throw.
 #include <cerrno>
 #include <functional>
 #include <map>
