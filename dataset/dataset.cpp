@@ -7,8 +7,6 @@
 #include <stdexcept>
 #include <utility>
 
-#include "dataset/icu.h"
-#include "dataset/zoneinfo.h"
 #include "support/paths.h"
 
 mln_dataset::mln_dataset() : mln_dataset(std::string()) {}

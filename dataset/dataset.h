@@ -26,6 +26,10 @@ class mln_dataset {
   mln_dataset(const mln_dataset&) = delete;
   mln_dataset& operator=(const mln_dataset&) = delete;
 
+  // Builds the components and sets `version_string` and `version`; called by
+  // the constructors, whose messages and exceptions are its own.
+  void create_components();
+
   // Whether every component of this data set accepts its counterpart in
   // `other`; see compatible_components().
   bool compatible_with(const mln_dataset& other) const;
@@ -41,9 +45,6 @@ class mln_dataset {
   std::string version_string{};
   std::string path;             // as given; empty: the system partition
   component_list components{};  // mln_zoneinfo, then mln_icu
-
- private:
-  void create_components();
 };
 
 // Whether both stand for the same path. Two that were built from one path are

@@ -8,6 +8,7 @@
 #include <cerrno>
 #include <cstring>
 #include <memory>
+#include <utility>
 
 #include "dataset/icu_file_name.h"
 #include "support/first_word.h"
@@ -66,7 +67,8 @@ mln_icu::mln_icu(const std::string& path)
 
 void mln_icu::initialize() {
   if (dataset_path.empty()) {
-    schema = read_first_word(icu_path + "/icutzformat.txt");
+    std::string word = read_first_word(icu_path + "/icutzformat.txt");
+    if (!word.empty()) schema = std::move(word);
     return;
   }
   auto walk = open_walk(icu_path);
@@ -79,7 +81,7 @@ void mln_icu::initialize() {
            std::strerror(errno));
     throw errno;
   }
-  schema = first_schema(*walk);
+  if (schema.empty()) schema = first_schema(*walk);
   walk.reset();
   if (schema.empty())
     ::warn("No ICU schema found for %s", dataset_path.c_str());

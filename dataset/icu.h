@@ -5,7 +5,7 @@
 
 #include <string>
 
-#include "dataset/components.h"
+#include "dataset/component.h"
 
 class mln_icu final : public mln_dataset_component {
  public:
@@ -29,9 +29,10 @@ class mln_icu final : public mln_dataset_component {
   // the former as a link to `icu_path`.
   void activate() const override;
 
+  // Finds the schema; called by the constructors. Where there is none, or one
+  // is known already, `schema` stays as it is.
+  void initialize();
+
   std::string schema{};  // such as 44l; empty when none was found
   std::string icu_path;  // the directory of the data files
-
- private:
-  void initialize();
 };

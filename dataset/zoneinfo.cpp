@@ -3,6 +3,8 @@
 
 #include <err.h>
 
+#include <utility>
+
 #include "support/first_word.h"
 #include "support/fsutil.h"
 #include "support/paths.h"
@@ -24,7 +26,8 @@ mln_zoneinfo::mln_zoneinfo(const std::string& path)
 }
 
 void mln_zoneinfo::read_version() {
-  version_string = read_first_word(zoneinfo_path + "/+VERSION");
+  std::string word = read_first_word(zoneinfo_path + "/+VERSION");
+  if (!word.empty()) version_string = std::move(word);
 }
 
 std::string mln_zoneinfo::version() const { return version_string; }

@@ -5,7 +5,7 @@
 
 #include <string>
 
-#include "dataset/components.h"
+#include "dataset/component.h"
 
 class mln_zoneinfo final : public mln_dataset_component {
  public:
@@ -26,9 +26,10 @@ class mln_zoneinfo final : public mln_dataset_component {
   // "+VERSION" file when the component was built; empty if it had none.
   std::string version() const;
 
+  // Reads that word; called by the constructors. Where there is none,
+  // `version_string` stays as it is.
+  void read_version();
+
   std::string zoneinfo_path;
   std::string version_string;
-
- private:
-  void read_version();
 };

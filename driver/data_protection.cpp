@@ -11,10 +11,10 @@ void relax_data_protection() {
   set_protection_class_d(paths::download_root);
 }
 
-void set_protection_class_d([[maybe_unused]] const char* directory) {
+void set_protection_class_d([[maybe_unused]] const std::string& directory) {
 #ifdef F_SETPROTECTIONCLASS
   constexpr int class_d = 4;
-  const int descriptor = ::open(directory, O_RDONLY | O_CLOEXEC);
+  const int descriptor = ::open(directory.c_str(), O_RDONLY | O_CLOEXEC);
   if (descriptor < 0) return;
   // A refusal is nothing to report: the file system may know no classes.
   ::fcntl(descriptor, F_SETPROTECTIONCLASS, class_d);

@@ -4,10 +4,12 @@
 // data-protection classes: what they hold is needed before anything else.
 #pragma once
 
+#include <string>
+
 // Puts "/var/db/timezone/" and "/var/db/timezone/tz/" into class D.
 void relax_data_protection();
 
 // Asks for class D, "no protection", on a directory. open(2), fcntl(2) with
 // F_SETPROTECTIONCLASS; nothing on platforms without it. Creates nothing,
 // prints nothing, never fails.
-void set_protection_class_d(const char* directory);
+void set_protection_class_d(const std::string& directory);

@@ -7,11 +7,6 @@
 #include <string>
 
 #include "dataset/dataset.h"
-#include "driver/data_protection.h"
-#include "driver/dataset_links.h"
-#include "driver/legacy_icu_link.h"
-#include "driver/localtime_link.h"
-#include "driver/version_record.h"
 #include "support/paths.h"
 
 namespace {

@@ -1,7 +1,13 @@
 // SPDX-License-Identifier: BSD-2-Clause
 //
-// The one pass of a boot. Every decision of the program is taken here.
+// The one pass of a boot, and the operations of which it consists.
 #pragma once
+
+#include "driver/data_protection.h"
+#include "driver/dataset_links.h"
+#include "driver/legacy_icu_link.h"
+#include "driver/localtime_link.h"
+#include "driver/version_record.h"
 
 // Makes the links below "/var/db/timezone/" consistent; see main() for the way
 // of a boot. What fails while a data set is chosen and linked into place ends

@@ -2,23 +2,18 @@
 #include "driver/version_record.h"
 
 #include <fcntl.h>
-#include <sys/stat.h>
 #include <unistd.h>
 
 #include <string_view>
 
 #include "support/paths.h"
+#include "support/special_file.h"
 
 namespace {
 
-bool is_special(int descriptor) {
-  struct stat status {};
-  return ::fstat(descriptor, &status) == 0 && !S_ISREG(status.st_mode);
-}
-
-void write_all(int descriptor, std::string_view bytes) {
+void write_all(int file, std::string_view bytes) {
   while (!bytes.empty()) {
-    const ssize_t written = ::write(descriptor, bytes.data(), bytes.size());
+    const ssize_t written = ::write(file, bytes.data(), bytes.size());
     // A full disk costs the record and nothing else.
     if (written <= 0) return;
     bytes.remove_prefix(static_cast<std::size_t>(written));
@@ -29,13 +24,11 @@ void write_all(int descriptor, std::string_view bytes) {
 
 void record_version_change(const std::string& from, const std::string& to) {
   const std::string record = from + "_" + to;
-  // Without O_NONBLOCK a FIFO in the record's place would hold up the boot;
-  // without O_NOCTTY a terminal could become ours.
-  const int descriptor = ::open(
-      paths::version_record,
-      O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC | O_NONBLOCK | O_NOCTTY, 0666);
-  if (descriptor < 0) return;
-  // Whoever reads a FIFO or has a device there did not ask for a record.
-  if (!is_special(descriptor)) write_all(descriptor, record);
-  ::close(descriptor);
+  // Whoever has a FIFO or a device there did not ask for a record.
+  if (is_special_file(paths::version_record)) return;
+  const int file = ::open(paths::version_record,
+                          O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0666);
+  if (file < 0) return;
+  write_all(file, record);
+  ::close(file);
 }

@@ -29,7 +29,7 @@ def failure(number: int) -> OSError:
 
 
 class Node:
-    """Whatever can stand at a path. `kind` is dir, file, link or fifo."""
+    """Whatever can stand at a path. `kind` is dir, file, link, fifo, socket or device."""
 
     def __init__(self, kind: str, mode=0o777, text="", entries=None):
         self.kind = kind
@@ -81,6 +81,9 @@ class Device:
 
     def fifo(self, path: str, mode=0o644):
         self.put(path, Node("fifo", mode))
+
+    def socket(self, path: str, mode=0o644):
+        self.put(path, Node("socket", mode))
 
     def drop(self, path: str):
         parent, _, name = path.rpartition("/")
@@ -204,7 +207,8 @@ def described(entry) -> str:
         "dir": f"a directory, mode {entry.mode:04o}",
         "file": f"a file, mode {entry.mode:04o}, {text!r}",
         "link": f"a link to {text!r}",
-        "fifo": f"a FIFO, mode {entry.mode:04o}"
+        "fifo": f"a FIFO, mode {entry.mode:04o}",
+        "socket": f"a socket, mode {entry.mode:04o}"
     }.get(entry.kind, entry.kind)
 
 

@@ -29,7 +29,7 @@ import functools
 import os
 import re
 from errno import EACCES, EEXIST, EINVAL, EISDIR, ENOENT, ENAMETOOLONG, ENOTDIR
-from errno import ENOTEMPTY, ENXIO, ERANGE, ESPIPE
+from errno import ENOTEMPTY, ERANGE
 
 from lab import lines
 from lab.device import Device, Node, failure
@@ -166,19 +166,15 @@ class Kernel:
             raise failure(EISDIR)
         if not node.permits(2):
             raise failure(EACCES)
-        if node.kind == "fifo":
-            raise failure(ENXIO)  # without waiting for a reader
         node.text = ""
         self.changed.add(node)
         return node
 
     @system_call
-    def pread(self, node, size, position):
-        self._call("pread")
+    def read(self, node, size, position):
+        self._call("read")
         if node.kind == "dir":
             raise failure(EISDIR)
-        if node.kind == "fifo":
-            raise failure(ESPIPE)
         return node.text[position:position + size]
 
     @system_call
@@ -327,10 +323,18 @@ class Boot:
 
     # --- 3. The first word of a file --------------------
 
+    def is_special(self, path):
+        """A FIFO, a socket or a device, which is never opened."""
+        try:
+            return self.kernel.stat(path).kind not in ("file", "dir")
+        except OSError:
+            return False
+
     def first_word(self, path):
-        """Empty where there is no such file, nothing that can be read, or no word.
-        What is no regular file cannot be read. When reading fails midway the word
-        is what came before."""
+        """Empty where there is no such file, nothing that can be read, or no word. When
+        reading fails midway the word is what came before."""
+        if self.is_special(path):
+            return ""
         try:
             file = self.kernel.open(path)
         except OSError:
@@ -338,14 +342,10 @@ class Boot:
         text = ""
         try:
             while True:
-                some = self.kernel.pread(file, READ_SIZE, len(text))
-                if not text and len(some) == READ_SIZE:
-                    # Whether this is a device. If that cannot be told, it is none.
-                    quietly(self.kernel.fstat)
+                some = self.kernel.read(file, READ_SIZE, len(text))
                 text += some
                 word_has_ended = re.compile(r"[^ \t-\r][ \t-\r]").search(
-                    text, max(0,
-                              len(text) - len(some) - 1))
+                    text, max(0, len(text) - len(some) - 1))
                 if not some or word_has_ended:
                     break
         except OSError:
@@ -551,13 +551,14 @@ class Boot:
             self.create_symlink(DEFAULT_LOCALTIME, LOCALTIME)
 
     def write_record(self, old, new):
-        """Quiet, whatever fails. What is no regular file is not written to."""
+        """Quiet, whatever fails."""
+        if self.is_special(RECORD):
+            return
         try:
             file = self.kernel.create(RECORD)
         except OSError:
             return
         try:
-            quietly(self.kernel.fstat)  # as in first_word()
             self.kernel.write(file, old.version_text + "_" + new.version_text)
         except OSError:
             pass

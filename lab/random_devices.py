@@ -110,6 +110,7 @@ def compose_file(choose, device, path, content):
                             content.strip().rjust(4096) + "\n" + content),
         lambda: device.directory(path),
         lambda: device.fifo(path),
+        lambda: device.socket(path),
         lambda: device.link(path, choose.any(["gone", path, ".", "/var/db"])),
         lambda:
         (device.file(path + ".real", content), device.link(path, path + ".real")),
@@ -247,7 +248,8 @@ def place_link(choose, device, path, usual, targets):
         return
     kind = choose.any(
         ["target"] * 8 +
-        ["missing", "missing", "file", "directory", "full directory", "fifo"])
+        ["missing", "missing", "file", "directory", "full directory", "fifo",
+         "socket"])
     if kind == "target":
         device.link(path, choose.any(targets))
     elif kind == "file":
@@ -257,8 +259,8 @@ def place_link(choose, device, path, usual, targets):
     elif kind == "full directory":
         device.file(path + "/America/Los_Angeles", "x")
         device.directory(path, choose.of(MODES, ODD_MODES))
-    elif kind == "fifo":
-        device.fifo(path)
+    elif kind in ("fifo", "socket"):
+        device.put(path, Node(kind, 0o644))
 
 
 def zoneinfo_targets(versions):
@@ -337,6 +339,7 @@ def compose_record(choose, device):
         lambda: device.directory(RECORD),
         lambda: device.file(RECORD + "/inside", "x"),
         lambda: device.fifo(RECORD),
+        lambda: device.socket(RECORD),
         lambda: device.link(RECORD, "record.real"),
         lambda: device.link(RECORD, "gone/record.real"),
         lambda: device.link(RECORD, "/var/db/"),

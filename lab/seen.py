@@ -11,7 +11,7 @@ from typing import NamedTuple
 from lab.device import Device, Node
 
 KINDS = {stat.S_IFDIR: "dir", stat.S_IFREG: "file", stat.S_IFLNK: "link",
-         stat.S_IFIFO: "fifo"}
+         stat.S_IFIFO: "fifo", stat.S_IFSOCK: "socket"}
 
 
 @dataclass

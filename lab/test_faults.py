@@ -6,7 +6,7 @@ with memory refused wherever the program asks the system for more."""
 
 from errno import (EACCES, EAGAIN, EBUSY, EDQUOT, EEXIST, EFBIG, EINTR, EINVAL, EIO,
                    EISDIR, ELOOP, EMFILE, ENAMETOOLONG, ENFILE, ENODEV, ENOENT, ENOMEM,
-                   ENOSPC, ENOTDIR, ENOTEMPTY, ENXIO, EOVERFLOW, EPERM, EROFS, ESPIPE,
+                   ENOSPC, ENOTDIR, ENOTEMPTY, ENXIO, EOVERFLOW, EPERM, EROFS,
                    ETXTBSY, errorcode)
 
 from lab import boot
@@ -30,7 +30,7 @@ ERRORS = {
     "rmdir": CHANGE + [EBUSY, EINVAL, ENOTEMPTY],
     "open": OPEN,
     "create": OPEN + [EBUSY, EDQUOT, EISDIR, ENOSPC, EROFS, ETXTBSY],
-    "pread": [EAGAIN, EINTR, EINVAL, EIO, EISDIR, ENOMEM, ESPIPE],
+    "read": [EAGAIN, EINTR, EINVAL, EIO, EISDIR, ENOMEM],
     "write": [EAGAIN, EDQUOT, EFBIG, EINTR, EIO, ENOMEM, ENOSPC, EPERM],
     "close": [EDQUOT, EINTR, EIO, ENOSPC],
     "stat": WALK + [EOVERFLOW],

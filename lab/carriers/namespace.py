@@ -4,6 +4,7 @@
 
 import functools
 import os
+import stat
 
 from lab.device import Device, Node, decoded, encoded
 from lab.paths import PLACES
@@ -92,7 +93,7 @@ def build_below(path: str, node: Node, exists=False):
     elif node.kind == "link":
         os.symlink(encoded(node.text), raw)
     else:
-        os.mkfifo(raw)
+        os.mknod(raw, {"fifo": stat.S_IFIFO, "socket": stat.S_IFSOCK}[node.kind] | 0o600)
         os.chmod(raw, node.mode)
 
 

@@ -13,6 +13,7 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <csignal>
 #include <cstdio>
 #include <cstring>
 #include <filesystem>
@@ -138,6 +139,11 @@ void make_fifo(const std::string& path) {
   must(::mkfifo(path.c_str(), 0644) == 0, "make the FIFO " + path);
 }
 
+void make_socket(const std::string& path) {
+  must(::mknod(path.c_str(), S_IFSOCK | 0644, 0) == 0,
+       "make the socket " + path);
+}
+
 void make_link(const std::string& path, const std::string& target) {
   ::unlink(path.c_str());
   must(::symlink(target.c_str(), path.c_str()) == 0, "link " + path);
@@ -154,6 +160,44 @@ void wipe(const std::string& path) {
     empty_directory(path);
   }
   fs::remove(path);
+}
+
+lease::lease(const std::string& path) {
+  int ready[2];
+  must(::pipe(ready) == 0, "make a pipe");
+  sigset_t asked;
+  sigemptyset(&asked);
+  sigaddset(&asked, SIGIO);
+  sigset_t before;
+  ::sigprocmask(SIG_BLOCK, &asked, &before);
+  holder_ = ::fork();
+  must(holder_ >= 0, "fork");
+  if (holder_ == 0) {
+    const int file = ::open(path.c_str(), O_RDWR);
+    const char took = ::fcntl(file, F_SETLEASE, F_WRLCK) == 0 ? 'y' : 'n';
+    if (::write(ready[1], &took, 1) != 1) ::_exit(2);
+    int signal = 0;
+    ::sigwait(&asked, &signal);
+    ::fcntl(file, F_SETLEASE, F_UNLCK);
+    ::_exit(0);
+  }
+  ::sigprocmask(SIG_SETMASK, &before, nullptr);
+  char took = 'n';
+  must(::read(ready[0], &took, 1) == 1 && took == 'y', "lease " + path);
+  ::close(ready[0]);
+  ::close(ready[1]);
+}
+
+lease::~lease() {
+  ::kill(holder_, SIGKILL);
+  ::waitpid(holder_, nullptr, 0);
+}
+
+bool lease::was_asked_for() const {
+  siginfo_t ended{};
+  return ::waitid(P_PID, static_cast<id_t>(holder_), &ended,
+                  WEXITED | WNOWAIT) == 0 &&
+         ended.si_code == CLD_EXITED && ended.si_status == 0;
 }
 
 void install_system(const std::string& release, const std::string& format) {

@@ -43,6 +43,7 @@ void make_directory(const std::string& path, mode_t mode = 0755);
 void make_file(const std::string& path, const std::string& content = {},
                mode_t mode = 0644);
 void make_fifo(const std::string& path);
+void make_socket(const std::string& path);
 void make_link(const std::string& path, const std::string& target);
 void set_mode(const std::string& path, mode_t mode);
 // Removes whatever is there, with all that is in it.
@@ -59,6 +60,20 @@ void point_links_at_update(const std::string& version);
 void point_links_at_system();
 void point_zoneinfo_at(const std::string& target);
 void point_localtime_at(const std::string& target);
+
+// Another process has a lease on a file, and gives it up when it is asked to,
+// as a conflicting open(2) asks.
+class lease {
+ public:
+  explicit lease(const std::string& path);
+  ~lease();
+  lease(const lease&) = delete;
+  lease& operator=(const lease&) = delete;
+  bool was_asked_for() const;
+
+ private:
+  pid_t holder_;
+};
 
 // --- Looking at it ---------------------------------------------------------
 

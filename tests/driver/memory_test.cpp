@@ -2,6 +2,7 @@
 //
 // Handlers take every exception, not only the numbers of failed calls: here the
 // next request for memory is refused.
+#include <algorithm>
 #include <cstdlib>
 #include <new>
 
@@ -59,9 +60,17 @@ TEST_F(WithoutMemory, IcuActivationGoesOn) {
   EXPECT_EQ(link_at(icutz), update("2024a.1.0") + "/icutz");
 }
 
-TEST_F(WithoutMemory, AFirstWordIsCut) {
-  make_file("/usr/share/file", std::string(100, 'x'));
+// What was read before the refusal stays: the first 4096 bytes are there when
+// room for those behind them is refused.
+TEST_F(WithoutMemory, AFirstWordIsCutWhereMemoryEnds) {
   const std::string path = "/usr/share/file";
+  make_file(path, std::string(4096, 'x') + std::string(4096, 'y'));
+  accepted = 1;
+  refusals = 1;
+  const std::string word = read_first_word(path);
+  EXPECT_EQ(refusals, 0);
+  EXPECT_EQ(word, std::string(4096, 'x'));
+
   refusals = 1;
   EXPECT_EQ(read_first_word(path), "");
   EXPECT_EQ(refusals, 0);
@@ -112,6 +121,61 @@ TEST_F(WithoutMemory, TheRecordIsLeftAloneAndItsCallerTold) {
               }),
               no_lines());
   EXPECT_EQ(file_at(record), "2022a.1.0_2023c.1.0");
+}
+
+// Every single request of a boot that activates an update is refused in turn.
+TEST_F(WithoutMemory, ABootActivatesTheUpdateOrResetsTheLinks) {
+  const std::string last_resort =
+      "Unable to locate data; resetting to system partition";
+  install_system("2023c", "44l");
+  install_update("2024a.1.0", "44l");
+  announce("2024a.1.0");
+  const std::string at_update = update("2024a.1.0") + "/zoneinfo";
+  int activations = 0, resets = 0, ends = 0;
+  for (int granted = 0;; ++granted) {
+    SCOPED_TRACE("after " + std::to_string(granted) + " requests");
+    wipe(record);
+    point_links_at_system();
+    bool ended = false;
+    bool refused = false;
+    const auto printed = printed_by([&] {
+      accepted = granted;
+      refusals = 1;
+      try {
+        run_startup_pass();
+      } catch (const std::bad_alloc&) {
+        ended = true;
+      }
+      refused = refusals == 0;
+      accepted = refusals = 0;
+    });
+    const bool gave_up = std::any_of(
+        printed.begin(), printed.end(), [&](const std::string& line) {
+          return line.starts_with("marlin: " + last_resort + ": ");
+        });
+    if (ended && gave_up) {
+      ADD_FAILURE() << "the last resort failed";
+    } else if (ended && link_at(zoneinfo) == system_tree) {
+      ++ends;  // the paths of the migration, before the first handler
+      EXPECT_THAT(printed, no_lines());
+      EXPECT_EQ(file_at(record), nothing);
+    } else if (gave_up) {
+      ++resets;
+      EXPECT_EQ(link_at(zoneinfo), system_tree);
+      EXPECT_EQ(link_at(icutz), nothing);
+    } else {
+      ++activations;
+      EXPECT_EQ(link_at(zoneinfo), at_update);
+      EXPECT_EQ(link_at(icutz), update("2024a.1.0") + "/icutz");
+      EXPECT_EQ(file_at(record).substr(file_at(record).find('_')),
+                "_2024a.1.0");
+    }
+    EXPECT_EQ(link_at(local_time), default_localtime);
+    if (!refused) break;
+  }
+  EXPECT_GT(activations, 1);
+  EXPECT_GT(resets, 10);
+  EXPECT_GT(ends, 0);
 }
 
 TEST_F(WithoutMemory, TheLocalTimeIsReset) {

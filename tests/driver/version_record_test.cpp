@@ -113,6 +113,20 @@ TEST_F(VersionRecord, IsNotWrittenToATerminal) {
   ::close(terminal);
 }
 
+TEST_F(VersionRecord, IsNotWrittenToASocket) {
+  make_socket(record);
+  EXPECT_THAT(printed_by(write), no_lines());
+  EXPECT_EQ(file_at(record), "(something else)");
+}
+
+TEST_F(VersionRecord, OfALeasedFileIsWrittenOnceTheLeaseIsGivenUp) {
+  make_file(record, "old");
+  const lease held(record);
+  write();
+  EXPECT_TRUE(held.was_asked_for());
+  EXPECT_EQ(file_at(record), "2023c.1.0_2024a.1.0");
+}
+
 TEST_F(VersionRecord, LeavesNoDescriptorOpen) {
   const int before = ::dup(0);
   ::close(before);

@@ -54,6 +54,13 @@ TEST_F(FirstWord, IsEmptyWhenTheFileHasNone) {
   EXPECT_EQ(of(std::string(100'000, ' ')), "");
 }
 
+TEST_F(FirstWord, KeepsAByteOrderMark) {
+  EXPECT_EQ(of("\xEF\xBB\xBF"
+               "2016a\n"),
+            "\xEF\xBB\xBF"
+            "2016a");
+}
+
 TEST_F(FirstWord, KeepsNulBytes) {
   const std::string word("20\0a", 4);
   EXPECT_EQ(of(word + " x"), word);
@@ -114,6 +121,24 @@ TEST_F(FirstWord, OfAFifoWithAWriterIsEmptyAndTakesNothingFromIt) {
   char left[8];
   EXPECT_EQ(::read(fifo, left, sizeof left), 6);
   ::close(fifo);
+}
+
+TEST_F(FirstWord, OfASocketIsEmpty) {
+  make_socket(path);
+  EXPECT_EQ(read_first_word(path), "");
+}
+
+TEST_F(FirstWord, OfAFileWithoutASizeIsRead) {
+  EXPECT_EQ(read_first_word("/proc/sys/kernel/ostype"), "Linux");
+}
+
+// Somebody else's lease holds up the opening until it is given up; the file
+// does not count as empty.
+TEST_F(FirstWord, OfALeasedFileIsReadOnceTheLeaseIsGivenUp) {
+  make_file(path, "2016a");
+  const lease held(path);
+  EXPECT_EQ(read_first_word(path), "2016a");
+  EXPECT_TRUE(held.was_asked_for());
 }
 
 TEST_F(FirstWord, OfADeviceIsEmptyAndDoesNotBlock) {

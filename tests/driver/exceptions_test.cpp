@@ -1,0 +1,196 @@
+// SPDX-License-Identifier: BSD-2-Clause
+//
+// An exception of any type, from anything that the pass calls, ends as it has
+// to: handled in place while the current links are resolved, otherwise in the
+// last resort. This program's own functions stand in for those of the
+// libraries; each does its job, except where it is told to throw.
+#include <cerrno>
+#include <functional>
+#include <map>
+#include <new>
+#include <stdexcept>
+
+#include "dataset/dataset.h"
+#include "driver/dataset_links.h"
+#include "driver/startup.h"
+#include "driver/version_record.h"
+#include "support/first_word.h"
+#include "support/version_grammar.h"
+#include "tests/device/device.h"
+
+using namespace device;
+
+namespace {
+
+struct of_no_known_type {};
+
+const std::map<std::string, std::function<void()>> exceptions = {
+    {"int", [] { throw 5; }},
+    {"long", [] { throw 5l; }},
+    {"bad_alloc", [] { throw std::bad_alloc(); }},
+    {"out_of_range", [] { throw std::out_of_range("too great"); }},
+    {"invalid_argument", [] { throw std::invalid_argument("badpath"); }},
+    {"a class of its own", [] { throw of_no_known_type(); }},
+};
+
+// Which call of which function is to throw, and what.
+std::string thrower;
+int countdown = 0;
+std::function<void()> raise;
+
+void called(const std::string& function) {
+  if (function == thrower && --countdown == 0) raise();
+}
+
+}  // namespace
+
+std::string read_first_word(const std::string& path) {
+  called("read_first_word");
+  std::string word = file_at(path);
+  word.resize(std::min(word.find('\n'), word.size()));
+  return word;
+}
+
+std::optional<mln_version_groups> match_version_text(std::string_view text) {
+  called("match_version_text");
+  return mln_version_groups{text.substr(0, 4), text.substr(4, 1), "1", "0"};
+}
+
+bool compatible_components(const component_list& receivers,
+                           const component_list& others) {
+  called("compatible_components");
+  return receivers[1]->compatible_schema(*others[1]);
+}
+
+std::string latest_update_path() {
+  called("latest_update_path");
+  return link_at(tz_latest);
+}
+
+std::string current_dataset_path() {
+  called("current_dataset_path");
+  const std::string target = link_at(zoneinfo);
+  return target == system_tree ? "" : target.substr(0, target.rfind('/'));
+}
+
+void record_version_change(const std::string& from, const std::string& to) {
+  called("record_version_change");
+  make_file(record, from + "_" + to);
+}
+
+namespace {
+
+const std::string invalid_links =
+    "Invalid current symlinks; resetting to system partition";
+const std::string unable_to_locate =
+    "Unable to locate data; resetting to system partition";
+
+// An announced update; in use is the system's data, or an update that no longer
+// fits and is reset in the same boot.
+class Exceptions : public DeviceTest {
+ protected:
+  void SetUp() override {
+    DeviceTest::SetUp();
+    install_system("2023c", "44l");
+    install_update("2022a.1.0", "45l");
+    install_update("2024a.1.0", "44l");
+    announce("2024a.1.0");
+  }
+
+  // Boots as often as `function` is called, each time with another call that
+  // throws, once for each type. Gives the number of its calls.
+  template <typename Expected>
+  static int sweep(const std::string& function, const std::string& in_use,
+                   Expected expected) {
+    for (int calls = 0;; ++calls) {
+      for (const auto& [type, act] : exceptions) {
+        SCOPED_TRACE(function + ", call " + std::to_string(calls + 1) +
+                     ", throws " + type);
+        wipe(record);
+        in_use.empty() ? point_links_at_system()
+                       : point_links_at_update(in_use);
+        wipe(local_time);
+        thrower = function;
+        countdown = calls + 1;
+        raise = act;
+        const auto printed = printed_by(run_startup_pass);
+        if (countdown > 0) return calls;
+        expected(printed);
+        // The boot went on to its end.
+        EXPECT_EQ(link_at(local_time), default_localtime);
+      }
+    }
+  }
+
+  static void expect_last_resort(const std::vector<std::string>& printed) {
+    EXPECT_THAT(printed, ::testing::Contains(warning(unable_to_locate)));
+    EXPECT_EQ(link_at(zoneinfo), system_tree);
+    EXPECT_EQ(link_at(icutz), nothing);
+    EXPECT_EQ(file_at(record), nothing);
+  }
+  static void expect_reset_and_activation(
+      const std::vector<std::string>& printed) {
+    EXPECT_THAT(printed, ::testing::Contains(warning(invalid_links)));
+    EXPECT_THAT(printed,
+                ::testing::Not(::testing::Contains(warning(unable_to_locate))));
+    EXPECT_EQ(link_at(zoneinfo), update("2024a.1.0") + "/zoneinfo");
+    EXPECT_EQ(file_at(record), "2023c.1.0_2024a.1.0");
+  }
+};
+
+TEST_F(Exceptions, FromTheAnnouncementTakeTheLastResort) {
+  EXPECT_EQ(sweep("latest_update_path", "", expect_last_resort), 1);
+}
+
+TEST_F(Exceptions, FromTheCurrentLinksResetThemAndTheBootGoesOn) {
+  EXPECT_EQ(sweep("current_dataset_path", "", expect_reset_and_activation), 1);
+}
+
+// The words of the system's set, of the current one, the update's, and before
+// it those of a reset.
+TEST_F(Exceptions, FromReadingADataSetTakeTheLastResort) {
+  EXPECT_EQ(sweep("read_first_word", "", expect_last_resort), 5);
+  EXPECT_EQ(sweep("read_first_word", "2022a.1.0", expect_last_resort), 6);
+}
+
+TEST_F(Exceptions, FromParsingAVersionTakeTheLastResort) {
+  EXPECT_EQ(sweep("match_version_text", "", expect_last_resort), 3);
+  EXPECT_EQ(sweep("match_version_text", "2022a.1.0", expect_last_resort), 4);
+}
+
+TEST_F(Exceptions, FromComparingSchemasTakeTheLastResort) {
+  EXPECT_EQ(sweep("compatible_components", "", expect_last_resort), 2);
+  EXPECT_EQ(sweep("compatible_components", "2022a.1.0", expect_last_resort), 2);
+}
+
+TEST_F(Exceptions, FromTheRecordTakeTheLastResort) {
+  EXPECT_EQ(sweep("record_version_change", "", expect_last_resort), 1);
+  EXPECT_EQ(sweep("record_version_change", "2022a.1.0", expect_last_resort), 1);
+}
+
+// With "zoneinfo" in the way every activation fails, that of a reset as well.
+TEST_F(Exceptions, FromTheLastResortLeaveThePass) {
+  make_directory(zoneinfo);
+  thrower = "latest_update_path";
+  for (const auto& [type, act] : exceptions) {
+    SCOPED_TRACE(type);
+    countdown = 1;
+    raise = act;
+    printed_by([] { EXPECT_EQ(thrown_by(run_startup_pass), EEXIST); });
+    EXPECT_EQ(link_at(local_time), nothing);
+  }
+}
+
+TEST_F(Exceptions, FromAResetWithinThePassTakeTheLastResort) {
+  thrower = "current_dataset_path";
+  for (const auto& [type, act] : exceptions) {
+    SCOPED_TRACE(type);
+    wipe(zoneinfo);
+    make_directory(zoneinfo);
+    countdown = 1;
+    raise = act;
+    printed_by([] { EXPECT_EQ(thrown_by(run_startup_pass), EEXIST); });
+  }
+}
+
+}  // namespace
