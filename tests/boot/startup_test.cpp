@@ -2,6 +2,7 @@
 //
 // Whole boots with the real program.
 #include <sys/resource.h>
+#include <sys/stat.h>
 
 #include <cerrno>
 #include <csignal>
@@ -767,6 +768,18 @@ TEST_F(StartupPass, KeepsARecordThroughEveryReset) {
   reset();
   make_file(tz_latest);
   reset();
+}
+
+TEST_F(StartupPass, CreatesTheRecordWithTheDefaultPermissions) {
+  install_update("2024a.1.0", "44l");
+  announce("2024a.1.0");
+  for (const mode_t mask : {0022u, 0077u, 0u}) {
+    point_links_at_system();
+    wipe(record);
+    const outcome booted = run({MARLIN_PROGRAM}, [mask] { ::umask(mask); });
+    EXPECT_EQ(booted.exit_status, 0);
+    EXPECT_EQ(look_at({record}).at(record).mode, S_IFREG | (0666u & ~mask));
+  }
 }
 
 TEST_F(StartupPass, GoesOnWhenTheRecordCannotBeWrittenWhole) {

@@ -1,6 +1,8 @@
 // SPDX-License-Identifier: BSD-2-Clause
 #include "dataset/icu.h"
 
+#include <unistd.h>
+
 #include <cerrno>
 
 #include "dataset/zoneinfo.h"
@@ -140,6 +142,30 @@ TEST_F(IcuSchema, IsTakenOnlyFromAFileThatOthersMayRead) {
   EXPECT_EQ(of_update(), "44l");
 }
 
+TEST_F(IcuSchema, IsTakenFromAHardLinkedFileAndFromOneWithSpecialBits) {
+  make_file("/var/db/timezone/tz/data");
+  make_directory(icu_directory);
+  ASSERT_EQ(::link("/var/db/timezone/tz/data",
+                   (icu_directory + "/icutz44l.dat").c_str()),
+            0);
+  EXPECT_EQ(of_update(), "44l");
+  set_mode(icu_directory + "/icutz44l.dat", 07604);
+  EXPECT_EQ(of_update(), "44l");
+}
+
+TEST_F(IcuSchema, IsTakenFromAnEmptyFileAndFromOneThatItsOwnerMayNotRead) {
+  make_file(icu_directory + "/icutz44l.dat", "", 0004);
+  EXPECT_EQ(of_update(), "44l");
+}
+
+TEST_F(IcuSchema, IsLookedForInThePathAsItIsGiven) {
+  make_file(icu_directory + "/icutz44l.dat");
+  const mln_icu icu(update_path + "/");
+  EXPECT_EQ(icu.dataset_path, update_path + "/");
+  EXPECT_EQ(icu.icu_path, update_path + "//icutz");
+  EXPECT_EQ(icu.schema, "44l");
+}
+
 TEST_F(IcuSchema, OfAnUpdateWithoutAnIcuDirectoryIsEmpty) {
   make_directory(update_path);
   EXPECT_THAT(printed_by([] { EXPECT_EQ(of_update(), ""); }),
@@ -262,6 +288,19 @@ TEST_F(IcuActivate, LinksAnUpdatesDirectory) {
 TEST_F(IcuActivate, CreatesAMissingLinkQuietly) {
   EXPECT_THAT(printed_by([] { mln_icu(update_path).activate(); }), no_lines());
   EXPECT_EQ(link_at(icutz), "/var/db/timezone/tz/2024a.1.0/icutz");
+}
+
+TEST_F(IcuActivate, MakesALinkThatIsRightAnew) {
+  const mln_icu icu(update_path);
+  icu.activate();
+  const auto before = look_at({icutz});
+  icu.activate();
+  const auto after = look_at({icutz});
+  EXPECT_EQ(after.at(icutz).content, before.at(icutz).content);
+  EXPECT_NE(after.at(icutz).inode, before.at(icutz).inode);
+
+  set_mode(timezone_root, 0555);
+  printed_by([&] { EXPECT_EQ(thrown_by([&] { icu.activate(); }), EEXIST); });
 }
 
 TEST_F(IcuActivate, CanBeRepeated) {

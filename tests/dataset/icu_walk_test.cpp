@@ -113,15 +113,17 @@ TEST_F(IcuWalk, FollowsOnlyTheRootAndStaysOnItsDeviceInDirectoryOrder) {
 }
 
 TEST_F(IcuWalk, ThatCannotBeStartedIsReportedAndThrown) {
-  walk.open_error = ENOMEM;
-  const std::string reason = std::strerror(ENOMEM);
-  EXPECT_THAT(
-      printed_by([] { EXPECT_EQ(thrown_by([] { schema(); }), ENOMEM); }),
-      lines(failure("tz_icu::initialize: fts_open of "
-                    "/var/db/timezone/tz/2024a.1.0/icutz failed, " +
-                        reason,
-                    ENOMEM)));
-  EXPECT_EQ(walk.closed, 0);
+  for (const int error : {ENOMEM, EMFILE, EIO, EINVAL}) {
+    walk.open_error = error;
+    const std::string reason = std::strerror(error);
+    EXPECT_THAT(
+        printed_by([error] { EXPECT_EQ(thrown_by([] { schema(); }), error); }),
+        lines(failure("tz_icu::initialize: fts_open of "
+                      "/var/db/timezone/tz/2024a.1.0/icutz failed, " +
+                          reason,
+                      error)));
+    EXPECT_EQ(walk.closed, 0);
+  }
 }
 
 TEST_F(IcuWalk, EndsAtTheFirstMatch) {

@@ -85,6 +85,19 @@ TEST_F(ZoneinfoActivate, CreatesAMissingLinkQuietly) {
   EXPECT_EQ(link_at(zoneinfo), "/usr/share/zoneinfo.default");
 }
 
+TEST_F(ZoneinfoActivate, MakesALinkThatIsRightAnew) {
+  mln_zoneinfo().activate();
+  const auto before = look_at({zoneinfo});
+  mln_zoneinfo().activate();
+  const auto after = look_at({zoneinfo});
+  EXPECT_EQ(after.at(zoneinfo).content, before.at(zoneinfo).content);
+  EXPECT_NE(after.at(zoneinfo).inode, before.at(zoneinfo).inode);
+
+  set_mode(timezone_root, 0555);
+  printed_by(
+      [] { EXPECT_EQ(thrown_by([] { mln_zoneinfo().activate(); }), EEXIST); });
+}
+
 TEST_F(ZoneinfoActivate, LinksATreeThatDoesNotExist) {
   mln_zoneinfo("/var/db/timezone/tz/none").activate();
   EXPECT_EQ(link_at(zoneinfo), "/var/db/timezone/tz/none/zoneinfo");

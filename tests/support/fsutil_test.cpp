@@ -66,6 +66,18 @@ TEST_F(Remove, WithoutPermissionPrintsAndThrowsTheErrorNumber) {
   EXPECT_EQ(file_at(path), "");
 }
 
+// Printing comes before the number is read: with no standard error to print to
+// the number is the printing's own.
+TEST_F(Remove, ThrowsTheNumberThatStandsAfterItsLineIsPrinted) {
+  make_directory(path);
+  printed_by([] {
+    ::close(STDERR_FILENO);
+    EXPECT_EQ(thrown_by([] { fsutil::remove(path); }), EBADF);
+    EXPECT_EQ(thrown_by([] { fsutil::read_symlink(path); }), EBADF);
+    EXPECT_EQ(thrown_by([] { fsutil::create_symlink("x", path); }), EBADF);
+  });
+}
+
 TEST_F(Remove, BelowAFileIsAFailureAndNotAMissingPath) {
   make_file(path);
   EXPECT_THAT(

@@ -146,6 +146,14 @@ TEST(VersionOrder, ComparesLettersAsTexts) {
   expect_newer("2016b", "2016az");
 }
 
+TEST(VersionOrder, ComparesLettersOfAnyLengthByTheFirstByteThatDiffers) {
+  const std::string many(1500, 'm');
+  expect_newer("2016" + many + "b", "2016" + many + "a");
+  expect_newer("2016" + many + "a", "2016" + many);
+  expect_newer("2016z", "2016" + many);
+  expect_newer("2016" + many + "b.1", "2016" + many + "az.9");
+}
+
 TEST(VersionOrder, ComparesLettersByUnsignedBytes) {
   mln_version low;
   mln_version high;

@@ -1,0 +1,167 @@
+// SPDX-License-Identifier: BSD-2-Clause
+//
+// The program from outside: five headers bring every operation and field, under
+// the names and with the types, order and slots that others build upon.
+#include "dataset/components.h"
+#include "dataset/dataset.h"
+#include "driver/startup.h"
+#include "support/fsutil.h"
+#include "support/version.h"
+
+// The device of the tests, and nothing else of this project.
+#include "tests/device/device.h"
+
+#include <cstring>
+#include <stdexcept>
+#include <type_traits>
+
+using namespace device;
+
+namespace {
+
+class Interface : public DeviceTest {
+ protected:
+  void SetUp() override {
+    DeviceTest::SetUp();
+    install_system("2023c", "44l");
+    install_update("2024a.1.0", "44l");
+    point_links_at_system();
+  }
+};
+
+// Where members stand, in the order of their addresses.
+template <typename... Members>
+bool stand_in_order(const Members&... members) {
+  const void* const places[] = {&members...};
+  return std::is_sorted(std::begin(places), std::end(places));
+}
+
+// The slot of a virtual operation, as the common C++ ABI for the processors
+// that this is built for stores it.
+template <typename Operation>
+std::ptrdiff_t slot_of(Operation operation) {
+  std::ptrdiff_t offset = 0;
+  std::memcpy(&offset, &operation, sizeof offset);
+  return offset / static_cast<std::ptrdiff_t>(sizeof(void*));
+}
+
+TEST_F(Interface, OfTheFileSystem) {
+  const std::string path = "/var/db/timezone/link";
+  EXPECT_EQ(fsutil::create_symlink("/usr/share", path), 0);
+  EXPECT_TRUE(fsutil::exists(path));
+  EXPECT_EQ(fsutil::read_symlink(path), "/usr/share");
+  static_assert(std::is_same_v<decltype(fsutil::remove(path)), bool>);
+  fsutil::remove(path);
+  EXPECT_FALSE(fsutil::exists(path));
+}
+
+TEST_F(Interface, OfVersions) {
+  mln_version version("2024a.1.0");
+  version.parse("2025b.2");
+  static_assert(std::is_same_v<decltype(version.year), std::int32_t>);
+  static_assert(std::is_same_v<decltype(version.letters), std::string>);
+  static_assert(std::is_same_v<decltype(version.major), std::int32_t>);
+  static_assert(std::is_same_v<decltype(version.minor), std::int32_t>);
+  static_assert(!std::is_polymorphic_v<mln_version>);
+  static_assert(std::is_copy_constructible_v<mln_version> &&
+                std::is_copy_assignable_v<mln_version>);
+  EXPECT_TRUE(stand_in_order(version.year, version.letters, version.major,
+                             version.minor));
+  EXPECT_TRUE(version > mln_version());
+  EXPECT_TRUE(version == mln_version("2025b.2"));
+}
+
+TEST_F(Interface, OfComponents) {
+  static_assert(std::is_abstract_v<mln_dataset_component>);
+  static_assert(std::is_base_of_v<mln_dataset_component, mln_zoneinfo>);
+  static_assert(std::is_base_of_v<mln_dataset_component, mln_icu>);
+  static_assert(!std::has_virtual_destructor_v<mln_zoneinfo> &&
+                !std::has_virtual_destructor_v<mln_icu>);
+  // One pointer, to the table of virtual operations, and the fields.
+  static_assert(sizeof(mln_zoneinfo) ==
+                sizeof(void*) + 3 * sizeof(std::string));
+  static_assert(sizeof(mln_icu) == sizeof(void*) + 3 * sizeof(std::string));
+
+  mln_zoneinfo tree("/var/db/timezone/tz/2024a.1.0");
+  static_assert(std::is_same_v<decltype(tree.version()), std::string>);
+  EXPECT_TRUE(stand_in_order(tree.dataset_path, tree.zoneinfo_path,
+                             tree.version_string));
+  EXPECT_EQ(tree.version(), "2024a");
+  mln_icu icu("/var/db/timezone/tz/2024a.1.0");
+  EXPECT_TRUE(stand_in_order(icu.dataset_path, icu.schema, icu.icu_path));
+
+  EXPECT_TRUE(tree.compatible_schema(mln_zoneinfo()));
+  EXPECT_TRUE(icu.compatible_schema(mln_icu()));
+  tree.activate();
+  icu.activate();
+  EXPECT_EQ(link_at(zoneinfo), update("2024a.1.0") + "/zoneinfo");
+  EXPECT_EQ(link_at(icutz), update("2024a.1.0") + "/icutz");
+}
+
+TEST_F(Interface, OfTheVirtualOperationsHasSlotsInTheirOrder) {
+  EXPECT_EQ(slot_of(&mln_dataset_component::compatible_schema), 0);
+  EXPECT_EQ(slot_of(&mln_dataset_component::activate), 1);
+}
+
+// A second reading leaves what a first one found where now there is nothing.
+TEST_F(Interface, OfReadingKeepsWhatWasFound) {
+  mln_zoneinfo tree;
+  mln_icu system;
+  mln_icu icu(update("2024a.1.0"));
+  wipe(system_tree);
+  wipe(system_icu);
+  wipe(update("2024a.1.0") + "/icutz");
+  EXPECT_THAT(printed_by([&] {
+                tree.read_version();
+                system.initialize();
+                icu.initialize();
+              }),
+              no_lines());
+  EXPECT_EQ(tree.version_string, "2023c");
+  EXPECT_EQ(system.schema, "44l");
+  EXPECT_EQ(icu.schema, "44l");
+}
+
+TEST_F(Interface, OfDataSets) {
+  static_assert(!std::is_polymorphic_v<mln_dataset>);
+  const mln_dataset system;
+  mln_dataset update("/var/db/timezone/tz/2024a.1.0");
+  EXPECT_TRUE(stand_in_order(update.version, update.version_string, update.path,
+                             update.components));
+  static_assert(std::is_same_v<decltype(update.version), mln_version>);
+  EXPECT_TRUE(update > system);
+  EXPECT_FALSE(update == system);
+  EXPECT_TRUE(update.compatible_with(system));
+  const std::shared_ptr<mln_dataset_component>& first =
+      update.components.front();
+  EXPECT_NE(dynamic_cast<const mln_zoneinfo*>(first.get()), nullptr);
+  update.activate();
+  EXPECT_EQ(link_at(zoneinfo), device::update("2024a.1.0") + "/zoneinfo");
+  reset_to_system_partition();
+  EXPECT_EQ(link_at(zoneinfo), system_tree);
+
+  mln_dataset again;
+  again.create_components();
+  EXPECT_EQ(again.components.size(), 4u);
+}
+
+TEST_F(Interface, OfTheDriver) {
+  const std::string directory = "/var/db/timezone/";
+  set_protection_class_d(directory);
+  relax_data_protection();
+  make_link(legacy_icutz, "/usr/share/icu");
+  migrate_legacy_icu_link();
+  EXPECT_EQ(link_at(icutz), "/usr/share/icu");
+  announce("2024a.1.0");
+  EXPECT_EQ(latest_update_path(), update("2024a.1.0"));
+  EXPECT_EQ(current_dataset_path(), "");
+  EXPECT_EQ(dataset_path_from_link("/var/db/timezone/tz/2024a.1.0/zoneinfo"),
+            update("2024a.1.0"));
+  wipe(local_time);
+  repair_localtime_link();
+  EXPECT_EQ(link_at(local_time), default_localtime);
+  run_startup_pass();
+  EXPECT_EQ(link_at(zoneinfo), update("2024a.1.0") + "/zoneinfo");
+}
+
+}  // namespace
