@@ -133,7 +133,7 @@ TEST_F(StartupPass, ReportsTheActiveUpdateAnnouncedAgainOnEveryBoot) {
   boot();
   for (int boots = 0; boots < 3; ++boots) {
     boot_changes_nothing_and_prints(
-        lines(warning(not_activated("2024a.1.0", "2024a.1.0"))));
+        lines(failure(not_activated("2024a.1.0", "2024a.1.0"), ENOENT)));
   }
 }
 
@@ -143,7 +143,7 @@ TEST_F(StartupPass, RefusesAnUpdateThatIsNotNewer) {
   for (const std::string version : {"2023b.1.0", "2023c.1.0"}) {
     announce(version);
     boot_changes_nothing_and_prints(
-        lines(warning(not_activated(version, "2023c.1.0"))));
+        lines(failure(not_activated(version, "2023c.1.0"), ENOENT)));
   }
 }
 
@@ -151,7 +151,7 @@ TEST_F(StartupPass, RefusesAnUpdateOfAnotherSchema) {
   install_update("2024a.1.0", "45l");
   announce("2024a.1.0");
   boot_changes_nothing_and_prints(
-      lines(warning(not_activated("2024a.1.0", "2023c.1.0"))));
+      lines(failure(not_activated("2024a.1.0", "2023c.1.0"), ENOENT)));
 }
 
 TEST_F(StartupPass, RefusesAnUpdateWithoutIcuData) {
@@ -159,35 +159,36 @@ TEST_F(StartupPass, RefusesAnUpdateWithoutIcuData) {
   wipe(update("2024a.1.0") + "/icutz");
   announce("2024a.1.0");
   boot_changes_nothing_and_prints(
-      lines(warning("No ICU schema found for /var/db/timezone/tz/2024a.1.0"),
-            warning(not_activated("2024a.1.0", "2023c.1.0"))));
+      lines(failure("No ICU schema found for /var/db/timezone/tz/2024a.1.0", 0),
+            failure(not_activated("2024a.1.0", "2023c.1.0"), 0)));
 }
 
 TEST_F(StartupPass, ActivatesAnUpdateWithoutASchemaOnASystemWithoutOne) {
   wipe(system_icu);
   make_directory(update("2024a.1.0"));
   announce("2024a.1.0");
-  boot_prints(
-      lines(warning("No ICU schema found for /var/db/timezone/tz/2024a.1.0")));
+  boot_prints(lines(
+      failure("No ICU schema found for /var/db/timezone/tz/2024a.1.0", 0)));
   expect_links_at_update("2024a.1.0");
 }
 
 TEST_F(StartupPass, RefusesAnUpdateWhoseNameIsNoVersion) {
   install_update("newest", "44l");
   announce("newest");
-  boot_changes_nothing_and_prints(
-      lines(warning("Cannot parse version string newest, results.size() = 0"),
-            warning("Cannot parse version string newest"),
-            warning(not_activated("newest", "2023c.1.0"))));
+  boot_changes_nothing_and_prints(lines(
+      failure("Cannot parse version string newest, results.size() = 0", ENOENT),
+      failure("Cannot parse version string newest", ENOENT),
+      failure(not_activated("newest", "2023c.1.0"), ENOENT)));
 }
 
 TEST_F(StartupPass, RefusesAnAnnouncementWithATrailingSlashAsUnparseable) {
   install_update("2024a.1.0", "44l");
   make_link(tz_latest, update("2024a.1.0") + "/");
   boot_changes_nothing_and_prints(lines(
-      warning("Cannot parse version string 2024a.1.0/, results.size() = 0"),
-      warning("Cannot parse version string 2024a.1.0/"),
-      warning(not_activated("2024a.1.0/", "2023c.1.0"))));
+      failure("Cannot parse version string 2024a.1.0/, results.size() = 0",
+              ENOENT),
+      failure("Cannot parse version string 2024a.1.0/", ENOENT),
+      failure(not_activated("2024a.1.0/", "2023c.1.0"), ENOENT)));
 }
 
 TEST_F(StartupPass, ComparesTheUpdateWithTheCurrentSetAndNotWithTheSystem) {
@@ -196,7 +197,7 @@ TEST_F(StartupPass, ComparesTheUpdateWithTheCurrentSetAndNotWithTheSystem) {
   point_links_at_update("2024b.1.0");
   announce("2024a.1.0");
   boot_changes_nothing_and_prints(
-      lines(warning(not_activated("2024a.1.0", "2024b.1.0"))));
+      lines(failure(not_activated("2024a.1.0", "2024b.1.0"), ENOENT)));
 }
 
 TEST_F(StartupPass, ActivatesAnUpdateThoughItsAnnouncedDirectoryIsMissing) {
@@ -204,8 +205,8 @@ TEST_F(StartupPass, ActivatesAnUpdateThoughItsAnnouncedDirectoryIsMissing) {
   // nowhere, and the next boot finds nothing wrong with them.
   wipe(system_icu);
   make_link(tz_latest, update("2024a.1.0"));
-  boot_prints(
-      lines(warning("No ICU schema found for /var/db/timezone/tz/2024a.1.0")));
+  boot_prints(lines(
+      failure("No ICU schema found for /var/db/timezone/tz/2024a.1.0", 0)));
   expect_links_at_update("2024a.1.0");
 }
 
@@ -253,8 +254,9 @@ TEST_F(StartupPass, ResetsLinksThatWereWiped) {
   wipe(zoneinfo);
   wipe(local_time);
   boot_prints(lines(
-      warning("Bad zoneinfo link "), warning(invalid_links),
-      warning("localtime link invalid; resetting to America/Los_Angeles")));
+      failure("Bad zoneinfo link ", ENOENT), failure(invalid_links, ENOENT),
+      failure("localtime link invalid; resetting to America/Los_Angeles",
+              ENOENT)));
   expect_links_at_system();
   EXPECT_EQ(link_at(local_time), default_localtime);
   EXPECT_EQ(file_at(record), nothing);
@@ -264,8 +266,8 @@ TEST_F(StartupPass, ResetsLinksThatWereWiped) {
 TEST_F(StartupPass, ResetsAZoneinfoLinkThatNamesNoDataSet) {
   point_zoneinfo_at("/usr/share/zoneinfo");
   make_link(icutz, "/var/db/old");
-  boot_prints(lines(warning("Bad zoneinfo link /usr/share/zoneinfo"),
-                    warning(invalid_links)));
+  boot_prints(lines(failure("Bad zoneinfo link /usr/share/zoneinfo", ENOENT),
+                    failure(invalid_links, ENOENT)));
   expect_links_at_system();
 }
 
@@ -281,8 +283,8 @@ TEST_F(StartupPass, StillActivatesAnUpdateAfterResettingBadLinks) {
   point_zoneinfo_at("nonsense");
   install_update("2024a.1.0", "44l");
   announce("2024a.1.0");
-  boot_prints(
-      lines(warning("Bad zoneinfo link nonsense"), warning(invalid_links)));
+  boot_prints(lines(failure("Bad zoneinfo link nonsense", ENOENT),
+                    failure(invalid_links, ENOENT)));
   expect_links_at_update("2024a.1.0");
   EXPECT_EQ(file_at(record), "2023c.1.0_2024a.1.0");
 }
@@ -291,9 +293,9 @@ TEST_F(StartupPass, StillRefusesAnUpdateAfterResettingBadLinks) {
   point_zoneinfo_at("nonsense");
   install_update("2024a.1.0", "45l");
   announce("2024a.1.0");
-  boot_prints(lines(warning("Bad zoneinfo link nonsense"),
-                    warning(invalid_links),
-                    warning(not_activated("2024a.1.0", "2023c.1.0"))));
+  boot_prints(lines(failure("Bad zoneinfo link nonsense", ENOENT),
+                    failure(invalid_links, ENOENT),
+                    failure(not_activated("2024a.1.0", "2023c.1.0"), ENOENT)));
   expect_links_at_system();
   EXPECT_EQ(file_at(record), nothing);
 }
@@ -304,7 +306,7 @@ TEST_F(StartupPass, ResetsAnUpdateThatASystemUpgradeOvertook) {
   install_update("2024a.1.0", "44l");
   point_links_at_update("2024a.1.0");
   install_system("2024b", "44l");
-  boot_prints(lines(warning(incompatible)));
+  boot_prints(lines(failure(incompatible, ENOENT)));
   expect_links_at_system();
   EXPECT_EQ(file_at(record), nothing);
   boot_changes_nothing_and_prints(no_lines());
@@ -314,24 +316,25 @@ TEST_F(StartupPass, ResetsAnUpdateOfAnotherSchemaThanTheSystems) {
   install_update("2024a.1.0", "44l");
   point_links_at_update("2024a.1.0");
   install_system("2023c", "45l");
-  boot_prints(lines(warning(incompatible)));
+  boot_prints(lines(failure(incompatible, ENOENT)));
   expect_links_at_system();
 }
 
 TEST_F(StartupPass, ResetsAnUpdateThatIsGone) {
   point_links_at_update("2024a.1.0");
   boot_prints(
-      lines(warning("No ICU schema found for /var/db/timezone/tz/2024a.1.0"),
-            warning(incompatible)));
+      lines(failure("No ICU schema found for /var/db/timezone/tz/2024a.1.0", 0),
+            failure(incompatible, 0)));
   expect_links_at_system();
 }
 
 TEST_F(StartupPass, ResetsACurrentSetWhoseNameIsNoVersion) {
   install_update("odd", "44l");
   point_links_at_update("odd");
-  boot_prints(
-      lines(warning("Cannot parse version string odd, results.size() = 0"),
-            warning("Cannot parse version string odd"), warning(incompatible)));
+  boot_prints(lines(
+      failure("Cannot parse version string odd, results.size() = 0", ENOENT),
+      failure("Cannot parse version string odd", ENOENT),
+      failure(incompatible, ENOENT)));
   expect_links_at_system();
 }
 
@@ -339,15 +342,17 @@ TEST_F(StartupPass, ReadsTheSystemsDataAnewForAReset) {
   install_update("2024a.1.0", "45l");
   wipe(system_tree + "/+VERSION");
   const auto first =
-      warning("Cannot parse version string .1.0, results.size() = 0");
-  const auto second = warning("Cannot parse version string .1.0");
+      failure("Cannot parse version string .1.0, results.size() = 0", ENOENT);
+  const auto second = failure("Cannot parse version string .1.0", ENOENT);
 
   point_links_at_update("2024a.1.0");
-  boot_prints(lines(first, second, warning(incompatible), first, second));
+  boot_prints(
+      lines(first, second, failure(incompatible, ENOENT), first, second));
   // Here the current data set becomes the system's, and is read as well.
   point_zoneinfo_at("nonsense");
-  boot_prints(lines(first, second, warning("Bad zoneinfo link nonsense"),
-                    warning(invalid_links), first, second, first, second));
+  boot_prints(
+      lines(first, second, failure("Bad zoneinfo link nonsense", ENOENT),
+            failure(invalid_links, ENOENT), first, second, first, second));
 }
 
 TEST_F(StartupPass, StillComparesWithTheOldCurrentSetAfterAReset) {
@@ -358,16 +363,16 @@ TEST_F(StartupPass, StillComparesWithTheOldCurrentSetAfterAReset) {
   point_links_at_update("2024a.1.0");
   install_system("2025a", "44l");
   announce("2024b.1.0");
-  boot_prints(lines(warning(incompatible)));
+  boot_prints(lines(failure(incompatible, ENOENT)));
   expect_links_at_update("2024b.1.0");
 
   // The next boot finds it older than the system, and announced once more.
-  boot_prints(lines(warning(incompatible),
-                    warning(not_activated("2024b.1.0", "2024b.1.0"))));
+  boot_prints(lines(failure(incompatible, ENOENT),
+                    failure(not_activated("2024b.1.0", "2024b.1.0"), ENOENT)));
   expect_links_at_system();
 
   boot_changes_nothing_and_prints(
-      lines(warning(not_activated("2024b.1.0", "2025a.1.0"))));
+      lines(failure(not_activated("2024b.1.0", "2025a.1.0"), ENOENT)));
 }
 
 TEST_F(StartupPass, RecordsTheSystemVersionFirstAfterAReset) {
@@ -376,7 +381,7 @@ TEST_F(StartupPass, RecordsTheSystemVersionFirstAfterAReset) {
   point_links_at_update("2024a.1.0");
   install_system("2025a", "44l");
   announce("2026a.1.0");
-  boot_prints(lines(warning(incompatible)));
+  boot_prints(lines(failure(incompatible, ENOENT)));
   expect_links_at_update("2026a.1.0");
   EXPECT_EQ(file_at(record), "2025a.1.0_2026a.1.0");
 }
@@ -388,13 +393,13 @@ TEST_F(StartupPass, TakesTheSystemsSchemaForTheUpdateAlsoAfterAReset) {
   point_links_at_update("2024a.1.0");
   install_system("2023c", "45l");
   announce("2026a.1.0");
-  boot_prints(lines(warning(incompatible),
-                    warning(not_activated("2026a.1.0", "2024a.1.0"))));
+  boot_prints(lines(failure(incompatible, ENOENT),
+                    failure(not_activated("2026a.1.0", "2024a.1.0"), ENOENT)));
   expect_links_at_system();
 
   point_links_at_update("2024a.1.0");
   announce("2026b.1.0");
-  boot_prints(lines(warning(incompatible)));
+  boot_prints(lines(failure(incompatible, ENOENT)));
   expect_links_at_update("2026b.1.0");
   EXPECT_EQ(file_at(record), "2023c.1.0_2026b.1.0");
 }
@@ -404,11 +409,11 @@ TEST_F(StartupPass, RefusesTheOvertakenUpdateThatIsStillAnnounced) {
   point_links_at_update("2024a.1.0");
   announce("2024a.1.0");
   install_system("2024b", "44l");
-  boot_prints(lines(warning(incompatible),
-                    warning(not_activated("2024a.1.0", "2024a.1.0"))));
+  boot_prints(lines(failure(incompatible, ENOENT),
+                    failure(not_activated("2024a.1.0", "2024a.1.0"), ENOENT)));
   expect_links_at_system();
   boot_changes_nothing_and_prints(
-      lines(warning(not_activated("2024a.1.0", "2024b.1.0"))));
+      lines(failure(not_activated("2024a.1.0", "2024b.1.0"), ENOENT)));
 }
 
 // --- The last resort
@@ -437,9 +442,9 @@ TEST_F(StartupPass, ResetsValidLinksWhenTheAnnouncementIsOutsideTheDownloads) {
         "/var/db/timezone/tz"}) {
     point_links_at_update("2024a.1.0");
     make_link(tz_latest, target);
-    boot_prints(
-        lines(warning("mln_dataset::create_components: bad path " + target),
-              warning(unable_to_locate)));
+    boot_prints(lines(
+        failure("mln_dataset::create_components: bad path " + target, ENOENT),
+        failure(unable_to_locate, ENOENT)));
     expect_links_at_system();
     EXPECT_EQ(link_at(tz_latest), target);
   }
@@ -448,24 +453,25 @@ TEST_F(StartupPass, ResetsValidLinksWhenTheAnnouncementIsOutsideTheDownloads) {
 TEST_F(StartupPass, PrintsTheLastResortAfterEarlierLinesOfThePass) {
   point_zoneinfo_at("nonsense");
   make_link(tz_latest, "nonsense too");
-  boot_prints(
-      lines(warning("Bad zoneinfo link nonsense"), warning(invalid_links),
-            warning("mln_dataset::create_components: bad path nonsense too"),
-            warning(unable_to_locate)));
+  boot_prints(lines(
+      failure("Bad zoneinfo link nonsense", ENOENT),
+      failure(invalid_links, ENOENT),
+      failure("mln_dataset::create_components: bad path nonsense too", ENOENT),
+      failure(unable_to_locate, ENOENT)));
   expect_links_at_system();
 }
 
 TEST_F(StartupPass, ResetsWhenTheUpdatesNumbersDoNotFit) {
   install_update("2147483648a", "44l");
   announce("2147483648a");
-  boot_prints(lines(warning(unable_to_locate)));
+  boot_prints(lines(failure(unable_to_locate, ENOENT)));
   expect_links_at_system();
 }
 
 TEST_F(StartupPass, ResetsWhenTheCurrentSetsNumbersDoNotFit) {
   install_update("1a.99999999999", "44l");
   point_links_at_update("1a.99999999999");
-  boot_prints(lines(warning(unable_to_locate)));
+  boot_prints(lines(failure(unable_to_locate, ENOENT)));
   expect_links_at_system();
 }
 
@@ -489,10 +495,11 @@ TEST_F(StartupPass, UndoesAnActivationThatStopsHalfway) {
 TEST_F(StartupPass, StillRepairsTheLocalTimeAfterTheLastResort) {
   make_file(tz_latest);
   wipe(local_time);
-  boot_prints(lines(
-      failure("read_symlink: /var/db/timezone/tz_latest", EINVAL),
-      failure(unable_to_locate, EINVAL),
-      warning("localtime link invalid; resetting to America/Los_Angeles")));
+  boot_prints(
+      lines(failure("read_symlink: /var/db/timezone/tz_latest", EINVAL),
+            failure(unable_to_locate, EINVAL),
+            failure("localtime link invalid; resetting to America/Los_Angeles",
+                    ENOENT)));
   EXPECT_EQ(link_at(local_time), default_localtime);
 }
 
@@ -505,8 +512,9 @@ TEST_F(StartupPass, EndsWithADefaultLocalTimeWhenTheCorrectedLinkFails) {
   EXPECT_EQ(booted.exit_status, 0);
   EXPECT_THAT(
       booted.lines(),
-      lines(warning("Correcting localtime link to "
-                    "/var/db/timezone/zoneinfo/Europe/Paris"),
+      lines(failure("Correcting localtime link to "
+                    "/var/db/timezone/zoneinfo/Europe/Paris",
+                    ENOENT),
             failure("create_symlink: from /var/db/timezone/localtime to "
                     "/var/db/timezone/zoneinfo/Europe/Paris",
                     EIO),
@@ -538,7 +546,7 @@ TEST_F(StartupPass, EndsAbnormallyWhenTheSystemsOwnNumbersDoNotFit) {
   const auto before = look_at_everything();
   const outcome booted = boot();
   EXPECT_EQ(booted.signal, SIGABRT);
-  EXPECT_THAT(booted.lines(), lines(warning(unable_to_locate),
+  EXPECT_THAT(booted.lines(), lines(failure(unable_to_locate, ENOENT),
                                     ::testing::StartsWith("terminate called"),
                                     ::testing::StartsWith("  what():")));
   EXPECT_EQ(look_at_everything(), before);
@@ -572,10 +580,10 @@ TEST_F(StartupPass, EndsAbnormallyWithoutATimezoneDirectory) {
       "create_symlink: from /var/db/timezone/zoneinfo to "
       "/usr/share/zoneinfo.default",
       ENOENT);
-  EXPECT_THAT(booted.lines(),
-              lines(warning("Bad zoneinfo link "), warning(invalid_links),
-                    no_link, failure(unable_to_locate, ENOENT), no_link,
-                    ::testing::StartsWith("terminate called")));
+  EXPECT_THAT(booted.lines(), lines(failure("Bad zoneinfo link ", ENOENT),
+                                    failure(invalid_links, ENOENT), no_link,
+                                    failure(unable_to_locate, ENOENT), no_link,
+                                    ::testing::StartsWith("terminate called")));
 }
 
 TEST_F(StartupPass, EndsAbnormallyInADirectoryThatCannotBeWritten) {
@@ -585,11 +593,12 @@ TEST_F(StartupPass, EndsAbnormallyInADirectoryThatCannotBeWritten) {
   const outcome booted = boot();
   EXPECT_EQ(booted.signal, SIGABRT);
   const auto reset = lines_of_a_failed_reset(EACCES);
-  EXPECT_THAT(booted.lines(),
-              lines(warning("Bad zoneinfo link nonsense"),
-                    warning(invalid_links), reset[0], reset[1], reset[2],
-                    failure(unable_to_locate, EEXIST), reset[0], reset[1],
-                    reset[2], ::testing::StartsWith("terminate called")));
+  EXPECT_THAT(
+      booted.lines(),
+      lines(failure("Bad zoneinfo link nonsense", ENOENT),
+            failure(invalid_links, ENOENT), reset[0], reset[1], reset[2],
+            failure(unable_to_locate, EEXIST), reset[0], reset[1], reset[2],
+            ::testing::StartsWith("terminate called")));
   EXPECT_EQ(look_at_everything(), before);
 }
 
@@ -643,10 +652,11 @@ TEST_F(StartupPass, ReadsTheSystemPartitionAnewForEveryDataSetOfIts) {
   wipe(system_tree);
   wipe(zoneinfo);
   const auto first =
-      warning("Cannot parse version string .1.0, results.size() = 0");
-  const auto second = warning("Cannot parse version string .1.0");
-  boot_prints(lines(first, second, warning("Bad zoneinfo link "),
-                    warning(invalid_links), first, second, first, second));
+      failure("Cannot parse version string .1.0, results.size() = 0", ENOENT);
+  const auto second = failure("Cannot parse version string .1.0", ENOENT);
+  boot_prints(lines(first, second, failure("Bad zoneinfo link ", ENOENT),
+                    failure(invalid_links, ENOENT), first, second, first,
+                    second));
   expect_links_at_system();
 }
 
@@ -666,8 +676,8 @@ TEST_F(StartupPass, KeepsNulBytesOfTheSystemsVersionInTheRecord) {
   install_update("2024a.1.0", "44l");
   announce("2024a.1.0");
   const auto first =
-      warning("Cannot parse version string 20, results.size() = 0");
-  const auto second = warning("Cannot parse version string 20");
+      failure("Cannot parse version string 20, results.size() = 0", ENOENT);
+  const auto second = failure("Cannot parse version string 20", ENOENT);
   boot_prints(lines(first, second, first, second));
   EXPECT_EQ(file_at(record), release + ".1.0_2024a.1.0");
 }
@@ -687,8 +697,8 @@ TEST_F(StartupPass, BuildsTheSystemsSetBeforeReadingTheAnnouncement) {
   wipe(system_tree);
   make_file(tz_latest);
   const auto first =
-      warning("Cannot parse version string .1.0, results.size() = 0");
-  const auto second = warning("Cannot parse version string .1.0");
+      failure("Cannot parse version string .1.0, results.size() = 0", ENOENT);
+  const auto second = failure("Cannot parse version string .1.0", ENOENT);
   boot_prints(lines(first, second,
                     failure("read_symlink: /var/db/timezone/tz_latest", EINVAL),
                     failure(unable_to_locate, EINVAL), first, second));
@@ -699,25 +709,25 @@ TEST_F(StartupPass, ChecksTheCurrentSetBeforeBuildingTheUpdate) {
   point_links_at_update("2024a.1.0");
   install_system("2025a", "44l");
   make_link(tz_latest, "nonsense");
-  boot_prints(
-      lines(warning(incompatible),
-            warning("mln_dataset::create_components: bad path nonsense"),
-            warning(unable_to_locate)));
+  boot_prints(lines(
+      failure(incompatible, ENOENT),
+      failure("mln_dataset::create_components: bad path nonsense", ENOENT),
+      failure(unable_to_locate, ENOENT)));
   expect_links_at_system();
 }
 
 TEST_F(StartupPass, MigratesTheLegacyLinkBeforeReadingAnyLink) {
   make_directory(legacy_icutz);
   wipe(zoneinfo);
-  boot_prints(
-      lines(failure("read_symlink: /var/db/icutz", EINVAL),
-            failure("Could not migrate /var/db/icutz to /var/db/timezone/icutz",
-                    EINVAL),
-            failure("remove: could not remove /var/db/icutz", EISDIR),
-            failure("Could not remove /var/db/icutz", EISDIR),
-            warning("Bad zoneinfo link "), warning(invalid_links),
-            failure("remove: could not remove /var/db/icutz", EISDIR),
-            failure("unlink of ICU softlink failed", EISDIR)));
+  boot_prints(lines(
+      failure("read_symlink: /var/db/icutz", EINVAL),
+      failure("Could not migrate /var/db/icutz to /var/db/timezone/icutz",
+              EINVAL),
+      failure("remove: could not remove /var/db/icutz", EISDIR),
+      failure("Could not remove /var/db/icutz", EISDIR),
+      failure("Bad zoneinfo link ", ENOENT), failure(invalid_links, ENOENT),
+      failure("remove: could not remove /var/db/icutz", EISDIR),
+      failure("unlink of ICU softlink failed", EISDIR)));
   expect_links_at_system();
 }
 
@@ -747,7 +757,7 @@ TEST_F(StartupPass, TakesTheLastResortWhenTheResetOfAnOldSetFails) {
   EXPECT_EQ(booted.signal, SIGABRT);
   const auto reset = lines_of_a_failed_reset(EACCES);
   EXPECT_THAT(booted.lines(),
-              lines(warning(incompatible), reset[0], reset[1], reset[2],
+              lines(failure(incompatible, ENOENT), reset[0], reset[1], reset[2],
                     failure(unable_to_locate, EEXIST), reset[0], reset[1],
                     reset[2], ::testing::StartsWith("terminate called")));
   EXPECT_EQ(look_at_everything(), before);

@@ -71,16 +71,17 @@ TEST_F(UntrustedData, OfAFifoInPlaceOfTheFormatFileCountsAsNone) {
   const outcome booted = boot();
   EXPECT_EQ(booted.exit_status, 0);
   EXPECT_THAT(booted.lines(),
-              lines(warning("New update not compatible or older version: "
-                            "2024a.1.0 vs. 2023c.1.0")));
+              lines(failure("New update not compatible or older version: "
+                            "2024a.1.0 vs. 2023c.1.0",
+                            ENOENT)));
 }
 
 TEST_F(UntrustedData, OfAFifoInPlaceOfTheSystemsVersionCountsAsNone) {
   wipe(system_tree + "/+VERSION");
   make_fifo(system_tree + "/+VERSION");
   const auto first =
-      warning("Cannot parse version string .1.0, results.size() = 0");
-  const auto second = warning("Cannot parse version string .1.0");
+      failure("Cannot parse version string .1.0, results.size() = 0", ENOENT);
+  const auto second = failure("Cannot parse version string .1.0", ENOENT);
   EXPECT_THAT(boot().lines(), lines(first, second, first, second));
   EXPECT_EQ(file_at(record), ".1.0_2024a.1.0");
 }
@@ -189,9 +190,9 @@ TEST_F(UntrustedData, OfLinkTargetsBeyondTheLimitIsCutAndRejected) {
     wipe(tz_latest);
     EXPECT_THAT(
         boot().lines(),
-        lines(warning("Bad zoneinfo link " + target.substr(0, 1024)),
-              warning(
-                  "Invalid current symlinks; resetting to system partition")));
+        lines(failure("Bad zoneinfo link " + target.substr(0, 1024), ENOENT),
+              failure("Invalid current symlinks; resetting to system partition",
+                      ENOENT)));
     EXPECT_EQ(link_at(zoneinfo), system_tree);
   }
 }

@@ -92,8 +92,9 @@ TEST_F(Dataset, OfTheDownloadRootItselfIsRefused) {
   EXPECT_THAT(printed_by([] {
                 EXPECT_EQ(refusal_of("/var/db/timezone/tz/"), "badpath");
               }),
-              lines(warning("mln_dataset::create_components: bad path "
-                            "/var/db/timezone/tz/")));
+              lines(failure("mln_dataset::create_components: bad path "
+                            "/var/db/timezone/tz/",
+                            ENOENT)));
 }
 
 TEST_F(Dataset, OfAPathOutsideTheDownloadRootIsRefused) {
@@ -105,7 +106,8 @@ TEST_F(Dataset, OfAPathOutsideTheDownloadRootIsRefused) {
         "/var/db/timezone/tz.2024a.1.0", "/var/db/timezone/zoneinfo/%s%n"}) {
     EXPECT_THAT(
         printed_by([&] { EXPECT_EQ(refusal_of(path), "badpath"); }),
-        lines(warning("mln_dataset::create_components: bad path " + path)));
+        lines(failure("mln_dataset::create_components: bad path " + path,
+                      ENOENT)));
   }
 }
 
@@ -130,9 +132,10 @@ TEST_F(Dataset, OfTheShortestPathIsAcceptedWithAnUnsetVersion) {
         EXPECT_TRUE(dataset.version == mln_version());
         EXPECT_EQ(dataset.components.size(), 2u);
       }),
-      lines(warning("Cannot parse version string x, results.size() = 0"),
-            warning("Cannot parse version string x"),
-            warning("No ICU schema found for /var/db/timezone/tz/x")));
+      lines(
+          failure("Cannot parse version string x, results.size() = 0", ENOENT),
+          failure("Cannot parse version string x", ENOENT),
+          failure("No ICU schema found for /var/db/timezone/tz/x", 0)));
 }
 
 TEST_F(Dataset, OfAPathWithATrailingSlashKeepsItAndIsOlderThanAll) {
@@ -147,8 +150,9 @@ TEST_F(Dataset, OfAPathWithATrailingSlashKeepsItAndIsOlderThanAll) {
                   "/var/db/timezone/tz/2024a.1.0//zoneinfo");
       }),
       lines(
-          warning("Cannot parse version string 2024a.1.0/, results.size() = 0"),
-          warning("Cannot parse version string 2024a.1.0/")));
+          failure("Cannot parse version string 2024a.1.0/, results.size() = 0",
+                  ENOENT),
+          failure("Cannot parse version string 2024a.1.0/", ENOENT)));
 }
 
 TEST_F(Dataset, OfADeeperPathKeepsItInItsVersionTextAndIsUnset) {
@@ -167,9 +171,10 @@ TEST_F(Dataset, OfASystemWithoutAVersionFileHasAnUnsetVersion) {
                 EXPECT_EQ(system.version_string, ".1.0");
                 EXPECT_TRUE(system.version == mln_version());
               }),
-              lines(warning("Cannot parse version string .1.0, "
-                            "results.size() = 0"),
-                    warning("Cannot parse version string .1.0")));
+              lines(failure("Cannot parse version string .1.0, "
+                            "results.size() = 0",
+                            ENOENT),
+                    failure("Cannot parse version string .1.0", ENOENT)));
 }
 
 TEST_F(Dataset, WithANumberThatDoesNotFitThrowsOutOfRange) {
@@ -185,10 +190,11 @@ TEST_F(Dataset, PrintsTheParsersLinesBeforeTheIcuComponents) {
   make_directory(update("odd"));
   EXPECT_THAT(
       printed_by([] { mln_dataset dataset(update("odd")); }),
-      lines(warning("Cannot parse version string odd, "
-                    "results.size() = 0"),
-            warning("Cannot parse version string odd"),
-            warning("No ICU schema found for /var/db/timezone/tz/odd")));
+      lines(failure("Cannot parse version string odd, "
+                    "results.size() = 0",
+                    ENOENT),
+            failure("Cannot parse version string odd", ENOENT),
+            failure("No ICU schema found for /var/db/timezone/tz/odd", 0)));
 }
 
 TEST_F(Dataset, IsNeverCopied) {
@@ -324,9 +330,10 @@ TEST_F(ResetToSystemPartition, LinksTheSystemTreeAndTouchesNothingElse) {
 TEST_F(ResetToSystemPartition, ReadsTheSystemPartitionAnew) {
   wipe(system_tree);
   EXPECT_THAT(printed_by([] { reset_to_system_partition(); }),
-              lines(warning("Cannot parse version string .1.0, "
-                            "results.size() = 0"),
-                    warning("Cannot parse version string .1.0")));
+              lines(failure("Cannot parse version string .1.0, "
+                            "results.size() = 0",
+                            ENOENT),
+                    failure("Cannot parse version string .1.0", ENOENT)));
   EXPECT_EQ(link_at(zoneinfo), "/usr/share/zoneinfo.default");
 }
 

@@ -29,7 +29,7 @@ class IcuActivate : public DeviceTest {
 };
 
 const auto no_schema_found =
-    warning("No ICU schema found for /var/db/timezone/tz/2024a.1.0");
+    failure("No ICU schema found for /var/db/timezone/tz/2024a.1.0", 0);
 
 TEST_F(IcuSchema, OfTheSystemIsTheFirstWordOfItsFormatFile) {
   make_file(system_icu + "/icutzformat.txt", "\n 44l and more\n");
@@ -273,8 +273,9 @@ TEST_F(IcuCompatibility, WithAnotherClassIsReportedAndRefused) {
   EXPECT_THAT(printed_by([] {
                 EXPECT_FALSE(mln_icu().compatible_schema(mln_zoneinfo()));
               }),
-              lines(warning("mln_icu::compatible_schema: could not "
-                            "dynamic_cast other component")));
+              lines(failure("mln_icu::compatible_schema: could not "
+                            "dynamic_cast other component",
+                            ENOENT)));
 }
 
 TEST_F(IcuActivate, LinksAnUpdatesDirectory) {

@@ -76,18 +76,20 @@ TEST_F(LocaltimeLinkRepair, LooksForTheCorrectedZoneInTheActiveDataSet) {
 
 TEST_F(LocaltimeLinkRepair, AnnouncesACorrectionThatThenFails) {
   point_localtime_at("/usr/share/zoneinfo/Mars/Base");
-  EXPECT_THAT(printed_by(repair_localtime_link),
-              lines(warning("Correcting localtime link to "
-                            "/var/db/timezone/zoneinfo/Mars/Base"),
+  EXPECT_THAT(printed_by(repair_after_an_old_error),
+              lines(failure("Correcting localtime link to "
+                            "/var/db/timezone/zoneinfo/Mars/Base",
+                            EXDEV),
                     failure(resetting, ENOENT)));
   EXPECT_EQ(link_at(local_time), default_localtime);
 }
 
 TEST_F(LocaltimeLinkRepair, CorrectsThePrefixWithoutASeparatorAndThenResets) {
   point_localtime_at("/usr/share/zoneinfo.default/Europe/Paris");
-  EXPECT_THAT(printed_by(repair_localtime_link),
-              lines(warning("Correcting localtime link to "
-                            "/var/db/timezone/zoneinfo.default/Europe/Paris"),
+  EXPECT_THAT(printed_by(repair_after_an_old_error),
+              lines(failure("Correcting localtime link to "
+                            "/var/db/timezone/zoneinfo.default/Europe/Paris",
+                            EXDEV),
                     failure(resetting, ENOENT)));
   EXPECT_EQ(link_at(local_time), default_localtime);
 }
@@ -95,9 +97,10 @@ TEST_F(LocaltimeLinkRepair, CorrectsThePrefixWithoutASeparatorAndThenResets) {
 TEST_F(LocaltimeLinkRepair, ResetsWhenTheZoneinfoLinkDoesNotWork) {
   point_zoneinfo_at("/var/db/gone");
   point_localtime_at("/usr/share/zoneinfo/Europe/Paris");
-  EXPECT_THAT(printed_by(repair_localtime_link),
-              lines(warning("Correcting localtime link to "
-                            "/var/db/timezone/zoneinfo/Europe/Paris"),
+  EXPECT_THAT(printed_by(repair_after_an_old_error),
+              lines(failure("Correcting localtime link to "
+                            "/var/db/timezone/zoneinfo/Europe/Paris",
+                            EXDEV),
                     failure(resetting, ENOENT)));
   EXPECT_EQ(link_at(local_time), default_localtime);
   EXPECT_THAT(printed_by(repair_localtime_link), no_lines());
@@ -174,9 +177,11 @@ TEST_F(LocaltimeLinkRepair, FallsBackWhenTheCorrectedLinkCannotBeCreated) {
   point_localtime_at("/usr/share/zoneinfo/Europe/Paris");
   set_mode(timezone_root, 0555);
   EXPECT_THAT(
-      printed_by([] { EXPECT_EQ(thrown_by(repair_localtime_link), EEXIST); }),
-      lines(warning("Correcting localtime link to "
-                    "/var/db/timezone/zoneinfo/Europe/Paris"),
+      printed_by(
+          [] { EXPECT_EQ(thrown_by(repair_after_an_old_error), EEXIST); }),
+      lines(failure("Correcting localtime link to "
+                    "/var/db/timezone/zoneinfo/Europe/Paris",
+                    EXDEV),
             failure("create_symlink: from /var/db/timezone/localtime to "
                     "/var/db/timezone/zoneinfo/Europe/Paris",
                     EEXIST),
