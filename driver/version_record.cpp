@@ -29,13 +29,13 @@ void write_all(int descriptor, std::string_view bytes) {
 
 void record_version_change(const std::string& from, const std::string& to) {
   const std::string record = from + "_" + to;
-  // Without O_NONBLOCK a FIFO in the record's place would hold up the boot;
-  // without O_NOCTTY a terminal could become ours.
+  // Without O_NONBLOCK a FIFO in the record's place would block the boot;
+  // without O_NOCTTY a terminal could become the controlling one.
   const int descriptor = ::open(
       paths::version_record,
       O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC | O_NONBLOCK | O_NOCTTY, 0666);
   if (descriptor < 0) return;
-  // Whoever reads a FIFO or has a device there did not ask for a record.
+  // Never write the record into a FIFO or a device.
   if (!is_special(descriptor)) write_all(descriptor, record);
   ::close(descriptor);
 }

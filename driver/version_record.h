@@ -4,8 +4,8 @@
 #include <string>
 
 // Replaces the content of "/var/db/timezone/TZVersionDiffRecord" by `from`,
-// "_", `to`, with no newline. The file is created with the default permissions
-// where there is none. Quiet and without effect when it cannot be opened, or is
-// no regular file; write errors are not checked and nothing is synced. open(2),
-// write(2). Throws only on memory exhaustion.
+// "_", `to`, with no newline: "2023c.1.0_2024a.1.0". Creates the file with the
+// default permissions if there is none. Does nothing, and prints nothing, when
+// it cannot be opened or is not a regular file. Write errors are ignored and
+// nothing is synced. open(2), write(2). Throws only on memory exhaustion.
 void record_version_change(const std::string& from, const std::string& to);

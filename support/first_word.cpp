@@ -16,8 +16,8 @@ constexpr auto is_white_space = [](char byte) {
 
 class input_file {
  public:
-  // Without O_NONBLOCK a FIFO would hold up the boot until somebody wrote to
-  // it; without O_NOCTTY a terminal could become ours.
+  // Without O_NONBLOCK a FIFO would block the boot until somebody wrote to it;
+  // without O_NOCTTY a terminal could become the controlling one.
   explicit input_file(const std::string& path)
       : descriptor_{::open(path.c_str(),
                            O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY)} {}
@@ -31,14 +31,14 @@ class input_file {
 
   // The next bytes, placed in `buffer`; none at the end or after a failure.
   std::string_view read(char* buffer, std::size_t size) {
-    // pread(2), because it fails where there is no position to read at: on a
-    // FIFO, a socket, a terminal.
+    // pread(2), because it fails on what has no positions: a FIFO, a socket, a
+    // terminal.
     const ssize_t count = ::pread(descriptor_, buffer, size, position_);
     if (count <= 0) return {};
     const auto length = static_cast<std::size_t>(count);
-    // A device that has positions, such as /dev/zero, may never come to an end.
-    // Only one that fills the buffer at once can do harm; these files are too
-    // small for it and are spared the question.
+    // A device that has positions, such as /dev/zero, may never end. It does
+    // harm only if it fills the buffer at once; therefore small files skip the
+    // check.
     if (position_ == 0 && length == size && is_special()) return {};
     position_ += count;
     return {buffer, length};
@@ -78,7 +78,7 @@ std::string read_first_word(const std::string& path) {
     extract_word(file, word);
   } catch (...) {
     // A word that does not fit into memory is cut, as a file stream would cut
-    // it, so that an absurd file does not cost the boot its data set.
+    // it, so that one absurd file does not make a data set unusable.
   }
   return word;
 }
