@@ -5,15 +5,6 @@
 # of anybody's PATH it is not run by accident while the links have readers.
 include(GNUInstallDirs)
 
-# systemd reads its own directories only, whatever the prefix: both are below
-# "lib", never below a library directory such as lib64.
-set(MARLIN_UNIT_DIR
-    lib/systemd/system
-    CACHE STRING "Where the boot unit goes; empty: nowhere")
-set(MARLIN_TMPFILES_DIR
-    lib/tmpfiles.d
-    CACHE STRING "Where the tmpfiles.d snippet goes; empty: nowhere")
-
 install(TARGETS marlin RUNTIME DESTINATION ${CMAKE_INSTALL_LIBEXECDIR})
 install(FILES man/marlin.8 DESTINATION ${CMAKE_INSTALL_MANDIR}/man8)
 install(FILES man/marlin-layout.5 DESTINATION ${CMAKE_INSTALL_MANDIR}/man5)

@@ -2,10 +2,6 @@
 #
 # The Debian package: "cpack" in a build directory makes it. Two builds of one
 # commit give the same bytes, wherever and whenever they are made.
-set(MARLIN_PACKAGE_CONTACT
-    "The marlin authors <authors@marlin.invalid>"
-    CACHE STRING "Who answers for the Debian package: name <address>")
-
 set(CPACK_GENERATOR DEB)
 set(CPACK_PACKAGING_INSTALL_PREFIX /usr)
 set(CPACK_STRIP_FILES ON)

@@ -13,8 +13,8 @@ class mln_dataset_component {
   // component at the same position in another data set.
   virtual bool compatible_schema(const mln_dataset_component& other) const = 0;
 
-  // Replaces this component's link by one to its own data, or by none where
-  // that is how the data is found. Throws the errno of a link that could not be
+  // Replaces this component's link by one to its own data, or by none if the
+  // data is found without a link. Throws the errno of a link that could not be
   // created.
   virtual void activate() const = 0;
 
@@ -26,9 +26,9 @@ class mln_dataset_component {
   explicit mln_dataset_component(std::string path)
       : dataset_path(std::move(path)) {}
 
-  // Deliberate: not virtual. Components are held only by shared pointers made
-  // from the concrete type, which destroy it as that; protected, so that
-  // deleting one through the base does not compile. Pinned by
-  // ComponentOwnership.CannotBeDeletedThroughTheBase.
+  // Deliberate: not virtual, because components are held only by shared
+  // pointers made from the concrete type, which destroy it as that type.
+  // Protected, so that deleting one through the base does not compile. Pinned
+  // by ComponentOwnership.CannotBeDeletedThroughTheBase.
   ~mln_dataset_component() = default;
 };

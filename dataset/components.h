@@ -13,8 +13,8 @@
 
 using component_list = std::vector<std::shared_ptr<mln_dataset_component>>;
 
-// Whether two lists are of the same length and every component of `receivers`
-// accepts the one of `others` at its position. Asks from the front and stops at
-// the first refusal, or where either list ends. Throws what a component throws.
+// Whether two lists have the same length and every component of `receivers`
+// accepts the one at its position in `others`. Asks from the front and stops at
+// the first refusal or the end of either list. Throws what a component throws.
 bool compatible_components(const component_list& receivers,
                            const component_list& others);

@@ -16,8 +16,8 @@ mln_dataset::mln_dataset(std::string dataset_path)
   create_components();
 }
 
-// The order shows on the device: the tree's "+VERSION" is read before the path
-// is examined, and the version is parsed before the ICU data is looked at.
+// The order is visible from outside: the tree's "+VERSION" is read before the
+// path is examined, and the version is parsed before the ICU data is read.
 void mln_dataset::create_components() {
   const auto zoneinfo = std::make_shared<mln_zoneinfo>(path);
   if (path.empty()) {

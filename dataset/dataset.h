@@ -17,10 +17,10 @@ class mln_dataset {
   // "/var/db/timezone/tz/" and without a trailing "/"; an empty path means the
   // system partition. Prints "mln_dataset::create_components: bad path PATH"
   // and throws std::invalid_argument, "badpath", for a path that does not begin
-  // with that directory or names nothing in it. What follows it is the version
-  // text: one that does not parse, as that of a deeper path, prints the
-  // parser's lines and leaves `version` unset. Throws also what the parser and
-  // the components throw.
+  // with that directory or names nothing in it. The rest of the path is the
+  // version text; one that does not parse, such as that of a deeper path,
+  // prints the parser's lines and leaves `version` unset. Also throws what the
+  // parser and the components throw.
   explicit mln_dataset(std::string dataset_path);
 
   mln_dataset(const mln_dataset&) = delete;
@@ -34,7 +34,7 @@ class mln_dataset {
   // `other`; see compatible_components().
   bool compatible_with(const mln_dataset& other) const;
 
-  // Links every component into place, in order. The first exception ends it;
+  // Links every component into place, in order. The first exception ends this;
   // what is linked by then stays linked.
   void activate() const;
 
@@ -47,8 +47,8 @@ class mln_dataset {
   component_list components{};  // mln_zoneinfo, then mln_icu
 };
 
-// Whether both stand for the same path. Two that were built from one path are
-// equal even if the disk changed in between.
+// Whether both were built from the same path; they are equal even if the disk
+// changed in between.
 bool operator==(const mln_dataset& left, const mln_dataset& right);
 
 // Whether `left` is of a strictly newer version.

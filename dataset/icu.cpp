@@ -74,14 +74,17 @@ void mln_icu::initialize() {
   auto walk = open_walk(icu_path);
   if (!walk) {
     // Deliberate: the prefix is not the class's name, and the error text stands
-    // twice, because warn(3) appends it again; both belong to the line as
-    // whoever searches logs knows it. Pinned by
+    // twice, because warn(3) appends it again. Both belong to the line that
+    // people search logs for. Pinned by
     // IcuWalk.ThatCannotBeStartedIsReportedAndThrown.
     ::warn("tz_icu::initialize: fts_open of %s failed, %s", icu_path.c_str(),
            std::strerror(errno));
     throw errno;
   }
   if (schema.empty()) schema = first_schema(*walk);
+  // Closed here, not at the end of the block, because closing may set the errno
+  // that the line below ends with. See
+  // IcuWalk.IsClosedBeforeAMissingSchemaIsReported.
   walk.reset();
   if (schema.empty())
     ::warn("No ICU schema found for %s", dataset_path.c_str());
@@ -102,12 +105,12 @@ void mln_icu::activate() const {
     fsutil::remove(paths::icu_link);
     fsutil::remove(paths::legacy_icu_link);
   } catch (...) {
-    // Creating the link is tried all the same; its failure is the caller's.
+    // Creating the link is still tried; if that fails, it is thrown.
     ::warn("unlink of ICU softlink failed");
   }
-  // Deliberate: no link is made to the system partition's ICU data, unlike to
-  // its zoneinfo tree, because that data is used in its own place and a link
-  // means an update. Pinned by IcuActivate.CreatesNoLinkForTheSystemPartition.
+  // Deliberate: the system partition's ICU data, unlike its zoneinfo tree, gets
+  // no link, because it is used in its own place and a link means an update.
+  // Pinned by IcuActivate.CreatesNoLinkForTheSystemPartition.
   if (dataset_path.empty()) return;
   fsutil::create_symlink(icu_path, paths::icu_link);
 }

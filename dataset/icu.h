@@ -19,14 +19,14 @@ class mln_icu final : public mln_dataset_component {
   explicit mln_icu(const std::string& path);
 
   // Whether `other` is an mln_icu of the same schema; two without a schema are
-  // compatible. For a component of another class prints
+  // compatible. If `other` is of another class, prints
   // "mln_icu::compatible_schema: could not dynamic_cast other component".
   bool compatible_schema(const mln_dataset_component& other) const override;
 
-  // Removes "/var/db/timezone/icutz" and then the legacy "/var/db/icutz"; the
-  // first that cannot be removed ends that and prints
-  // "unlink of ICU softlink failed". Either way, for an update only, it creates
-  // the former as a link to `icu_path`.
+  // Removes "/var/db/timezone/icutz", then the legacy "/var/db/icutz". If the
+  // first cannot be removed, the second is not tried; either failure prints
+  // "unlink of ICU softlink failed". After that, for an update only, creates
+  // "/var/db/timezone/icutz" as a link to `icu_path`.
   void activate() const override;
 
   // Finds the schema; called by the constructors. Where there is none, or one

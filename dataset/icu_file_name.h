@@ -5,6 +5,6 @@
 
 #include <string_view>
 
-// The schema that a file name carries, as a part of `name`; empty when the name
-// as a whole, NUL bytes and all, is not an ICU data file's.
+// The schema in a file name, as a part of `name`; empty when the whole of the
+// name, including any NUL bytes, is not the name of an ICU data file.
 std::string_view icu_schema_in(std::string_view name);

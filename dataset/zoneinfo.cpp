@@ -40,7 +40,7 @@ void mln_zoneinfo::activate() const {
   try {
     fsutil::remove(paths::zoneinfo_link);
   } catch (...) {
-    // Creating the link is tried all the same; its failure is the caller's.
+    // Creating the link is still tried; if that fails, it is thrown.
     ::warn("Unlink of zoneinfo softlink failed");
   }
   fsutil::create_symlink(zoneinfo_path, paths::zoneinfo_link);

@@ -15,11 +15,12 @@ class mln_zoneinfo final : public mln_dataset_component {
   // the system partition. Quiet, even where there is no such tree.
   explicit mln_zoneinfo(const std::string& path);
 
-  // Always true: a zoneinfo tree never stands in the way of a combination.
+  // Always true: a zoneinfo tree fits every system.
   bool compatible_schema(const mln_dataset_component& other) const override;
 
-  // Re-creates "/var/db/timezone/zoneinfo" as a link to `zoneinfo_path`. Prints
-  // "Unlink of zoneinfo softlink failed" when the old one stays, and goes on.
+  // Creates "/var/db/timezone/zoneinfo" anew, as a link to `zoneinfo_path`. If
+  // the old one cannot be removed, prints "Unlink of zoneinfo softlink failed"
+  // and goes on.
   void activate() const override;
 
   // The release of the data, such as 2024a: the first word of the tree's

@@ -16,7 +16,7 @@ void set_protection_class_d([[maybe_unused]] const std::string& directory) {
   constexpr int class_d = 4;
   const int descriptor = ::open(directory.c_str(), O_RDONLY | O_CLOEXEC);
   if (descriptor < 0) return;
-  // A refusal is nothing to report: the file system may know no classes.
+  // A refusal is not reported: the file system may have no classes.
   ::fcntl(descriptor, F_SETPROTECTIONCLASS, class_d);
   ::close(descriptor);
 #endif

@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: BSD-2-Clause
 //
 // Lifts data protection from the time-zone directories, on platforms that have
-// data-protection classes: what they hold is needed before anything else.
+// data-protection classes: their content is needed before anything else.
 #pragma once
 
 #include <string>

@@ -3,6 +3,7 @@
 
 #include <err.h>
 
+#include "driver/link_rejected.h"
 #include "support/fsutil.h"
 #include "support/paths.h"
 
@@ -17,10 +18,10 @@ std::string current_dataset_path() {
 std::string dataset_path_from_link(const std::string& target) {
   constexpr auto root_length = paths::length(paths::download_root);
   if (target.starts_with(paths::download_root)) {
-    // Deliberate: the name after the last "/" is compared with nothing, because
-    // only the data set counts here. The depth is not looked at because a path
-    // further down gives no version, and a data set without one is older than
-    // any that has one. Pinned by
+    // Deliberate: the name after the last "/" is not compared with anything,
+    // because only the data set counts here. The depth is not checked, because
+    // a path further down gives no version, and a data set without one is older
+    // than any that has one. Pinned by
     // DatasetPathFromLink.AcceptsAnyNameAfterTheLastSlash and
     // DatasetPathFromLink.AcceptsATargetSeveralLevelsDown.
     const auto last_slash = target.rfind('/');
@@ -29,5 +30,5 @@ std::string dataset_path_from_link(const std::string& target) {
     return {};
   }
   ::warn("Bad zoneinfo link %s", target.c_str());
-  throw fsutil::link_rejected;
+  throw link_rejected;
 }

@@ -15,9 +15,10 @@ std::string latest_update_path();
 // dataset_path_from_link() throw.
 std::string current_dataset_path();
 
-// The data-set directory in the target of a "zoneinfo" link: for a target below
-// "/var/db/timezone/tz/" all before its last "/", which must stand behind at
-// least one more byte, be it a "/"; for exactly "/usr/share/zoneinfo.default"
-// the empty text. Prints "Bad zoneinfo link TARGET" and throws
-// fsutil::link_rejected for any other target.
+// The data-set directory in the target of a "zoneinfo" link:
+// "/var/db/timezone/tz/2024a.1.0" for "/var/db/timezone/tz/2024a.1.0/zoneinfo".
+// For a target that begins with "/var/db/timezone/tz/" it is everything before
+// the last "/"; at least one byte, possibly "/", must separate it from the
+// prefix. For exactly "/usr/share/zoneinfo.default" it is the empty text. For
+// any other target prints "Bad zoneinfo link TARGET" and throws link_rejected.
 std::string dataset_path_from_link(const std::string& target);

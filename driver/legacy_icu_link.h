@@ -2,9 +2,9 @@
 #pragma once
 
 // Moves the ICU link from its legacy place, "/var/db/icutz", to
-// "/var/db/timezone/icutz", its text unchanged. A link that already resolves
-// there wins. The legacy link is then deleted; one that dangles counts as
-// absent and stays. Prints
+// "/var/db/timezone/icutz", its text unchanged. A link there that resolves is
+// kept instead. Then the legacy link is deleted. A legacy link that dangles
+// counts as absent and stays. Prints
 // "Could not migrate /var/db/icutz to /var/db/timezone/icutz" and
 // "Could not remove /var/db/icutz"; throws only when there is no memory for its
 // own two paths.

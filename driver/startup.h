@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: BSD-2-Clause
 //
-// The one pass of a boot, and the operations of which it consists.
+// The one pass of a boot: the order of its steps, and the choice of the data
+// set. The local time and the legacy ICU link have fallbacks of their own.
 #pragma once
 
 #include "driver/data_protection.h"
@@ -9,9 +10,9 @@
 #include "driver/localtime_link.h"
 #include "driver/version_record.h"
 
-// Makes the links below "/var/db/timezone/" consistent; see main() for the way
-// of a boot. What fails while a data set is chosen and linked into place ends
-// in a warning and in links to the system partition. Throws only what the last
+// Makes the links below "/var/db/timezone/" consistent, in the nine steps that
+// startup.cpp lists. If a data set cannot be chosen or linked into place,
+// prints a warning and links the system partition. Throws only what the last
 // resorts throw: the final reset to the system partition (the local-time link
 // is then not looked at) and the default local-time link; and std::bad_alloc
 // when there is no memory for a fixed path.

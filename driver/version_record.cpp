@@ -24,7 +24,7 @@ void write_all(int file, std::string_view bytes) {
 
 void record_version_change(const std::string& from, const std::string& to) {
   const std::string record = from + "_" + to;
-  // Whoever has a FIFO or a device there did not ask for a record.
+  // Never write the record into a FIFO or a device.
   if (is_special_file(paths::version_record)) return;
   const int file = ::open(paths::version_record,
                           O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0666);

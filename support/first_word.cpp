@@ -14,7 +14,7 @@ constexpr auto is_white_space = [](char byte) {
   return byte == ' ' || (byte >= '\t' && byte <= '\r');
 };
 
-// A word grows in `word` alone, so that it is there, cut, when memory ends.
+// Grows the caller's word, which is therefore there, cut, if memory runs out.
 void extract_word(int file, std::string& word) {
   char buffer[4096];
   for (;;) {
@@ -40,7 +40,7 @@ std::string read_first_word(const std::string& path) {
     extract_word(file, word);
   } catch (...) {
     // A word that does not fit into memory is cut, as a file stream would cut
-    // it, so that an absurd file does not cost the boot its data set.
+    // it, so that one absurd file does not make a data set unusable.
   }
   ::close(file);
   return word;

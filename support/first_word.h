@@ -7,9 +7,10 @@
 #include <string>
 
 // The first run of bytes that are not white space (blank, \t, \n, \v, \f, \r)
-// in the file at `path`, of whatever length, NUL bytes and all; the rest of the
-// file is not looked at. Empty when there is no such word, or no file that can
-// be opened and read; when reading fails or memory runs out midway, what came
-// before. A FIFO, a socket or a device counts as a file that cannot be opened;
-// see is_special_file(). Prints and throws nothing. open(2), read(2).
+// in the file at `path`: "2024a" in one that begins with "\n 2024a of May". It
+// may be of any length and include NUL bytes; the rest of the file is not
+// looked at. Empty when there is no such word, or when the file cannot be
+// opened or read; if reading fails or memory runs out later, the part before
+// that. A FIFO, a socket or a device is never opened. Prints and throws
+// nothing. stat(2), open(2), read(2).
 std::string read_first_word(const std::string& path);

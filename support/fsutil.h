@@ -9,6 +9,13 @@
 // ever looks at the value; the path is in the warning. A missing path is not a
 // failure.
 //
+// All that is thrown anywhere in the program:
+//   int, an errno                      a failed call, here or in dataset/icu.h
+//   int, -1                            driver/link_rejected.h
+//   std::invalid_argument, "badpath"   dataset/dataset.h
+//   std::out_of_range                  a number in a version, support/version.h
+//   std::bad_alloc, std::length_error  no memory
+//
 // Always call these qualified: the C library's remove(3) is used as well, as
 // std::remove, and differs (it never reports, and it deletes empty
 // directories).
@@ -18,22 +25,19 @@
 
 namespace fsutil {
 
-// What callers throw, in the same way, when they reject what a link says.
-inline constexpr int link_rejected = -1;
-
-// unlink(2). A missing path is quiet. Otherwise, so also for a directory,
+// unlink(2). A missing path is quiet. Any other failure, as for a directory,
 // prints "remove: could not remove PATH" and throws errno. Returns whether
 // errno is zero afterwards, which no caller uses.
 bool remove(const std::string& path);
 
-// access(2) with F_OK: whether the path can be reached, through any links, so
-// a dangling link does not exist. Every failure means false; prints and throws
+// access(2) with F_OK: whether the path can be reached, through any links. A
+// dangling link does not exist. Any failure means false; prints and throws
 // nothing.
 bool exists(const std::string& path);
 
-// readlink(2). Returns the target, cut without notice to its first 1024 bytes;
-// for a missing path the empty string. Otherwise, as for a path that is no
-// link (EINVAL), prints "read_symlink: PATH" and throws errno.
+// readlink(2). Returns the target, cut without notice to its first 1024 bytes,
+// or the empty string for a missing path. Any other failure, as for a path that
+// is not a link (EINVAL), prints "read_symlink: PATH" and throws errno.
 std::string read_symlink(const std::string& path);
 
 // symlink(2), with its order of arguments: the text to store, then the path of

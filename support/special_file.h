@@ -4,8 +4,7 @@
 #include <string>
 
 // Whether a FIFO, a socket or a device stands at `path`, or where a link there
-// leads. These are never opened: opening a FIFO can wait for ever, and opening
-// a device can set it going. A regular file, a directory and whatever stat(2)
-// fails for are left to open(2), which then tells the reason. Prints and throws
-// nothing.
+// leads. None of these is ever opened: opening a FIFO may wait for ever, and
+// opening a device may start something. A path for which stat(2) fails is left
+// to open(2), which then leaves the error. Prints and throws nothing.
 bool is_special_file(const std::string& path);

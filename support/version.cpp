@@ -13,8 +13,8 @@
 namespace {
 
 std::int32_t to_number(std::string_view digits) {
-  // Up to nine digits always fit. Whether more do is for std::stoi to say, with
-  // its exception and the errno that it leaves.
+  // Up to nine digits always fit. For more, std::stoi decides, with its
+  // exception and the errno that it leaves.
   if (digits.size() > 9) return std::stoi(std::string(digits));
   std::int32_t number{};
   std::from_chars(digits.data(), digits.data() + digits.size(), number);
@@ -36,9 +36,9 @@ mln_version::mln_version(const std::string& text) { parse(text); }
 void mln_version::parse(const std::string& text) {
   const auto groups = match_version_text(text);
   if (!groups) {
-    // Deliberate: one malformed text prints two lines. The first tells that the
-    // text did not match at all, as no groups were counted; the second is the
-    // one to search a log for. Pinned by
+    // Deliberate: one malformed text prints two lines. The first says that the
+    // text did not match at all: no groups were counted. The second is the one
+    // to search a log for. Pinned by
     // VersionParse.PrintsTwoLinesForAMalformedText.
     ::warn("Cannot parse version string %s, results.size() = %d", text.c_str(),
            0);

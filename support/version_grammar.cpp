@@ -32,9 +32,9 @@ std::string_view take_dotted_number(std::string_view& text) {
 
 // ([0-9]+)([a-z]+)(?:\.([0-9]+))?(?:\.([0-9]+))?
 //
-// Each run ends where a byte of another kind stands, and a lone dotted number
-// is the first of the two, so the longest choice is always the right one and
-// nothing is ever tried twice.
+// Each run ends at a byte of another kind, and a single dotted number is always
+// the first of the two. Therefore the longest run is always the right one, and
+// nothing is tried twice.
 std::optional<mln_version_groups> match_version_text(std::string_view text) {
   const std::string_view year = take_run(text, is_digit);
   const std::string_view letters = take_run(text, is_letter);

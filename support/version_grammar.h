@@ -7,8 +7,8 @@
 #include <optional>
 #include <string_view>
 
-// The four groups of a match, as parts of the matched text. A group that takes
-// no part in the match is empty, and only such a group is.
+// The four groups of a match, as parts of the matched text. A group is empty
+// exactly when it took no part in the match.
 struct mln_version_groups {
   std::string_view year;
   std::string_view letters;
@@ -16,5 +16,5 @@ struct mln_version_groups {
   std::string_view minor{};
 };
 
-// Matches the whole of `text`, NUL bytes and all, in one pass over it.
+// Matches the whole of `text`, including any NUL bytes, in one pass.
 std::optional<mln_version_groups> match_version_text(std::string_view text);

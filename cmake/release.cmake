@@ -1,0 +1,61 @@
+# SPDX-License-Identifier: BSD-2-Clause
+#
+# What a Release build of the program and its libraries has beyond CMake's own
+# flags, as far as the compiler and the linker know it. Builds for amd64 and arm64
+# are tested; on any other processor the program gets the part of the hardening
+# that the compiler offers there.
+include(CheckCXXCompilerFlag)
+include(CheckLinkerFlag)
+
+# Adds the compiler options that are known.
+function(marlin_compile_options target)
+  foreach(option IN LISTS ARGN)
+    string(MAKE_C_IDENTIFIER "MARLIN_COMPILER_KNOWS${option}" known)
+    check_cxx_compiler_flag(${option} ${known})
+    if(${known})
+      target_compile_options(${target} INTERFACE $<$<CONFIG:Release>:${option}>)
+    endif()
+  endforeach()
+endfunction()
+
+# The same for the linker's.
+function(marlin_link_options target)
+  foreach(option IN LISTS ARGN)
+    string(MAKE_C_IDENTIFIER "MARLIN_LINKER_KNOWS${option}" known)
+    check_linker_flag(CXX ${option} ${known})
+    if(${known})
+      target_link_options(${target} INTERFACE $<$<CONFIG:Release>:${option}>)
+    endif()
+  endforeach()
+endfunction()
+
+# Functions that nothing calls are left out.
+add_library(marlin_release INTERFACE)
+marlin_compile_options(marlin_release -ffunction-sections -fdata-sections)
+marlin_link_options(marlin_release -Wl,--gc-sections)
+
+# A static program at a random address would have to relocate itself at every
+# start, for nearly as much as the whole boot costs; see docs/decisions.md. Whether
+# a dynamic one is at a random address is left to the compiler.
+if(MARLIN_STATIC)
+  marlin_compile_options(marlin_release -fno-pie)
+  marlin_link_options(marlin_release -no-pie)
+endif()
+
+# What each of these costs is in docs/decisions.md.
+add_library(marlin_hardening INTERFACE)
+if(MARLIN_HARDENING)
+  marlin_compile_options(marlin_hardening -fstack-protector-strong)
+  # The processor is asked for because a compiler may take the other's option with
+  # no more than a warning.
+  if(CMAKE_SYSTEM_PROCESSOR MATCHES "^(x86_64|amd64|AMD64)$")
+    marlin_compile_options(marlin_hardening -fcf-protection=full)
+  elseif(CMAKE_SYSTEM_PROCESSOR MATCHES "^(aarch64|arm64)$")
+    marlin_compile_options(marlin_hardening -mbranch-protection=standard)
+  endif()
+  # Some compilers define it themselves, perhaps as another number.
+  target_compile_options(
+    marlin_hardening INTERFACE $<$<CONFIG:Release>:-U_FORTIFY_SOURCE>
+                               $<$<CONFIG:Release>:-D_FORTIFY_SOURCE=2>)
+  marlin_link_options(marlin_hardening -Wl,-z,relro -Wl,-z,now)
+endif()

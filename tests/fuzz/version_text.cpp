@@ -1,0 +1,126 @@
+// SPDX-License-Identifier: BSD-2-Clause
+//
+// Version texts: the grammar against std::regex, the numbers against what the
+// digits say, the lines that are printed, and the laws of the ordering. An
+// input is one text as a whole, and up to three texts with "|" between them.
+#include <array>
+#include <regex>
+#include <stdexcept>
+
+#include "support/version.h"
+#include "support/version_grammar.h"
+#include "tests/fuzz/property.h"
+
+namespace {
+
+constexpr std::size_t longest_for_regex = 200;
+
+// What a number group stands for; -1 for an empty one, -2 if it does not fit.
+long number_of(std::string_view digits) {
+  if (digits.empty()) return -1;
+  long number = 0;
+  for (const char digit : digits) {
+    number = number * 10 + (digit - '0');
+    if (number > 2147483647) return -2;
+  }
+  return number;
+}
+
+void check_grammar(const std::string& text) {
+  static const std::regex grammar(
+      R"(([0-9]+)([a-z]+)(?:\.([0-9]+))?(?:\.([0-9]+))?)");
+  const auto groups = match_version_text(text);
+  std::smatch expected;
+  const bool matches = std::regex_match(text, expected, grammar);
+  expect(groups.has_value() == matches, "the grammar is the expression's");
+  if (!matches) return;
+  expect(groups->year == expected[1].str(), "group 1 is the year");
+  expect(groups->letters == expected[2].str(), "group 2 is the letters");
+  expect(groups->major == expected[3].str(), "group 3 is the major number");
+  expect(groups->minor == expected[4].str(), "group 4 is the minor number");
+}
+
+// The version of a text; unset for one with a number that does not fit.
+mln_version parsed(const std::string& text) {
+  const mln_version before("7seven.8.9");
+  mln_version version = before;
+  bool fits = true;
+  std::string printed = printed_by([&] {
+    try {
+      version.parse(text);
+    } catch (const std::out_of_range&) {
+      fits = false;
+    }
+  });
+  const auto groups = match_version_text(text);
+  if (!groups) {
+    const std::string message =
+        "Cannot parse version string " + std::string(text.c_str());
+    expect(take_warning(printed, message + ", results.size() = 0") &&
+               take_warning(printed, message) && printed.empty(),
+           "a malformed text prints its two lines");
+    expect(fits && version == mln_version(), "a malformed text is unset");
+    return version;
+  }
+  expect(printed.empty(), "a well-formed text prints nothing");
+  const long year = number_of(groups->year);
+  const long major = number_of(groups->major);
+  const long minor = number_of(groups->minor);
+  expect(fits == (year != -2 && major != -2 && minor != -2),
+         "a number is out of range above the largest of 32 bits");
+  if (!fits) {
+    const bool year_fits = year != -2;
+    const bool major_fits = year_fits && major != -2;
+    expect(
+        version.year == (year_fits ? year : before.year) &&
+            version.letters == (year_fits ? groups->letters : before.letters) &&
+            version.major == (major_fits ? major : before.major) &&
+            version.minor == before.minor,
+        "the fields before the number that does not fit are new");
+    return {};
+  }
+  expect(version.year == year && version.letters == groups->letters &&
+             version.major == major && version.minor == minor,
+         "the fields are what the groups say");
+  expect(version > mln_version(), "the unset value is older");
+  return version;
+}
+
+// The rule, said field by field.
+bool newer(const mln_version& left, const mln_version& right) {
+  if (left.year != right.year) return left.year > right.year;
+  if (left.letters != right.letters) return left.letters > right.letters;
+  if (left.major != right.major) return left.major > right.major;
+  return left.minor > right.minor;
+}
+
+void check_order(const std::array<mln_version, 3>& versions) {
+  for (const auto& a : versions) {
+    expect(!(a > a) && a == a, "nothing is newer than itself");
+    expect(!(mln_version() > a), "nothing is older than unset");
+    for (const auto& b : versions) {
+      expect((a > b) == newer(a, b), "the order goes by the fields");
+      expect((a > b) + (b > a) + (a == b) == 1, "one of three holds");
+      for (const auto& c : versions)
+        expect(!(a > b && b > c) || a > c, "the order is transitive");
+    }
+  }
+}
+
+}  // namespace
+
+int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
+  const std::string text(text_of(data, size));
+  if (size <= longest_for_regex) check_grammar(text);
+  parsed(text);
+
+  std::array<mln_version, 3> versions;
+  std::size_t start = 0;
+  for (auto& version : versions) {
+    const std::size_t end = std::min(text.find('|', start), size);
+    version = parsed(text.substr(start, end - start));
+    start = std::min(end + 1, size);
+  }
+  check_order(versions);
+  return 0;
+}
