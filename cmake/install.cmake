@@ -6,8 +6,8 @@
 include(GNUInstallDirs)
 
 install(TARGETS marlin RUNTIME DESTINATION ${CMAKE_INSTALL_LIBEXECDIR})
-install(FILES man/marlin.8 DESTINATION ${CMAKE_INSTALL_MANDIR}/man8)
-install(FILES man/marlin-layout.5 DESTINATION ${CMAKE_INSTALL_MANDIR}/man5)
+install(FILES docs/marlin.8 DESTINATION ${CMAKE_INSTALL_MANDIR}/man8)
+install(FILES docs/marlin-layout.5 DESTINATION ${CMAKE_INSTALL_MANDIR}/man5)
 
 if(MARLIN_UNIT_DIR)
   configure_file(packaging/marlin.service.in packaging/marlin.service @ONLY)

@@ -1,0 +1,202 @@
+#!/usr/bin/python3 -B
+# SPDX-License-Identifier: BSD-2-Clause
+"""Checks of the texts that no compiler reads: the rules of the source, the deliberate
+oddities, the documents, the manual pages.
+
+usage: tests/checks.py [source_rules | deliberate | documents | manual_pages]...
+
+Without an argument: all. Exit status: 0 when everything holds, 1 when something does
+not, 2 for bad use.
+"""
+
+import os
+import re
+import subprocess
+import sys
+from collections.abc import Iterator
+from pathlib import Path
+
+os.chdir(Path(__file__).resolve().parents[1])
+PRODUCT = [path for folder in ("driver", "dataset", "support")
+           for path in sorted(Path(folder).iterdir())]
+TEST_NAME = re.compile(r"\b[A-Z][A-Za-z]+\.[A-Z][A-Za-z0-9]+\b")
+
+
+def matching_lines(path: Path, pattern: str) -> Iterator[str]:
+    for number, line in enumerate(path.read_text().splitlines(), 1):
+        if re.search(pattern, line):
+            yield f"{path}:{number}: {line.strip()}"
+
+
+def comments_in(path: Path) -> list[str]:
+    """Each comment as one line, so that a name may stand on the next one."""
+    blocks = re.findall(r"(?:^ *//.*\n)+", path.read_text(), re.M)
+    return [" ".join(re.sub(r"^ *//", "", block, flags=re.M).split())
+            for block in blocks]
+
+
+def differences(left: set[str], where_left: str, right: set[str],
+                where_right: str) -> Iterator[str]:
+    for only in sorted(left - right):
+        yield f"in {where_left}, not in {where_right}: {only}"
+    for only in sorted(right - left):
+        yield f"in {where_right}, not in {where_left}: {only}"
+
+
+# Each check yields what does not hold.
+
+def source_rules() -> Iterator[str]:
+    above = {"support": "driver|dataset|tests", "dataset": "driver|tests",
+             "driver": "tests"}
+    for path in PRODUCT:
+        upwards = rf'#include "({above[path.parts[0]]})/'
+        for line in matching_lines(path, upwards):
+            yield f"{line}: a dependency must not point upwards"
+        # Two functions have this name.
+        unqualified = r"^(?!.*//)(?!bool remove\().*(?<!fsutil::)(?<!std::)\bremove\("
+        for line in matching_lines(path, unqualified):
+            yield f"{line}: must be fsutil::remove() or std::remove()"
+
+    for root, folders, files in os.walk("."):
+        folders[:] = [name for name in folders if name[0] != "." and name != "build"]
+        for path in (Path(root, name) for name in files):
+            is_source = (path.suffix in (".c", ".cmake", ".cpp", ".h", ".py", ".sh")
+                         or path.name == "CMakeLists.txt" or os.access(path, os.X_OK))
+            if is_source and not any(
+                    "SPDX-License-Identifier: BSD-2-Clause" in line
+                    for line in path.read_text().splitlines()[:3]):
+                yield f"{path}: no licence line"
+
+
+def deliberate() -> Iterator[str]:
+    """Comments "Deliberate:", docs/decisions.md and the tests agree."""
+    tests = {f"{suite}.{case}" for path in Path("tests").rglob("*_test.cpp")
+             for suite, case in re.findall(r"\bTEST(?:_F|_P)?\(\s*(\w+),\s*(\w+)\)",
+                                           path.read_text())}
+    in_product = []
+    for path in PRODUCT:
+        comments = comments_in(path)
+        if path.read_text().count("Deliberate:") != str(comments).count("Deliberate:"):
+            yield f"{path}: a deliberate oddity beside code, not above it"
+        for comment in comments:
+            for name in TEST_NAME.findall(comment):
+                if name not in tests:
+                    yield f"{path}: there is no test {name}"
+            # One comment may tell of two oddities.
+            for oddity in comment.split("Deliberate:")[1:]:
+                pins = TEST_NAME.findall(oddity.partition("Pinned by ")[2])
+                if not pins:
+                    yield f"{path}: no test pins: {oddity.strip()}"
+                in_product.append(f"{path} {' '.join(sorted(pins))}")
+
+    # Below each heading of the first part: "Site: FILE. Tests: NAME, NAME."
+    text = Path("docs/decisions.md").read_text()
+    part = re.search(r"^## Deliberate behaviour\n(.*?)^## ", text, re.M | re.S)[1]
+    in_document = []
+    for section in re.split("^### ", part, flags=re.M)[1:]:
+        site = re.search(r"^Site: \[`([^`]+)`\]\([^)]+\)\.\s+Tests?:(.*)", section,
+                         re.M | re.S)
+        if not site:
+            yield f"docs/decisions.md: no site and tests: {section.splitlines()[0]}"
+            continue
+        pins = " ".join(sorted(TEST_NAME.findall(site[2])))
+        in_document.append(f"{site[1]} {pins}")
+
+    yield from differences(set(in_product), "the product", set(in_document),
+                           "docs/decisions.md")
+    if not in_product or len(in_product) != len(in_document):
+        yield (f"{len(in_product)} comments in the product, {len(in_document)} entries"
+               " in docs/decisions.md")
+
+
+def documents() -> Iterator[str]:
+    """Links between files lead somewhere; no figure is still to be filled in."""
+    def anchors(path: Path) -> set[str]:
+        headings = re.findall(r"^#+ (.*)", path.read_text(), re.M)
+        return {re.sub(r"[^a-z0-9-]", "", heading.lower().replace(" ", "-"))
+                for heading in headings}
+
+    for path in [*Path().glob("*.md"), *Path("docs").glob("*.md")]:
+        for link in re.findall(r"\]\(([^) ]+)\)", path.read_text()):
+            name, _, anchor = link.partition("#")
+            target = path.parent / name if name else path
+            if link.startswith("http"):
+                continue
+            if not target.exists():
+                yield f"{path}: there is no {name}"
+            elif anchor and anchor not in anchors(target):
+                yield f"{path}: no heading for {link}"
+        for line in matching_lines(path, "FIGURE"):
+            yield f"{line}: a figure is missing"
+
+
+def manual_pages() -> Iterator[str]:
+    """They are well formed, of the project's version, and tell what the program does:
+    the same warnings, the same steps, the same default zone."""
+    pages = sorted(Path("docs").glob("*.[1-9]"))
+    marlin = Path("docs/marlin.8").read_text()
+    code = "\n".join(re.sub(r"^ *//.*", "", path.read_text(), flags=re.M)
+                     for path in PRODUCT)
+
+    pieces = re.findall(r'::warn\(\s*((?:"[^"]*"\s*)+)', code)
+    texts = {"".join(re.findall(r'"([^"]*)"', piece)) for piece in pieces}
+    calls = len(re.findall(r"\bv?warnx?c?\(", code))
+    if calls != len(pieces) or calls == 0:
+        yield f"of {calls} warnings in the program {len(pieces)} could be read"
+    diagnostics = re.search(r"^\.Sh DIAGNOSTICS\n(.*?)^\.Sh ", marlin, re.M | re.S)[1]
+    told = set(re.findall(r"^\.It (.*)", diagnostics, re.M))
+    yield from differences(texts, "the program", told, "DIAGNOSTICS")
+
+    zones = re.findall(r'default_zone\[\] = "([^"]+)"', code)
+    told_zones = re.findall(r"default zone, ([\w/]+)", marlin)
+    if len(zones) != 1 or told_zones != zones:
+        yield f"the default zone is {zones} in the program, {told_zones} in the page"
+
+    startup = Path("driver/startup.cpp").read_text()
+    steps = {
+        "driver/startup.cpp": re.findall(r"^// +(\d+)\. ", startup, re.M),
+        "docs/architecture.md": re.findall(
+            r"^\| (\d+) ", Path("docs/architecture.md").read_text(), re.M),
+        "docs/marlin.8": [str(number) for number, _ in enumerate(re.findall(
+            r"^\.It$", re.search(r"\.Bl -enum\n(.*?)\.El", marlin, re.S)[1], re.M), 1)]}
+    if len(set(map(tuple, steps.values()))) != 1 or not all(steps.values()):
+        yield f"a boot has different steps: {steps}"
+
+    version = re.search(r"^project\([^)]*\bVERSION ([\d.]+)",
+                        Path("CMakeLists.txt").read_text(), re.M)[1]
+    for page in pages:
+        if re.findall(r"^\.Os marlin (.*)", page.read_text(), re.M) != [version]:
+            yield f"{page} is not of version {version}"
+    newest = re.search(r"^## (.*) - [\d-]+$", Path("CHANGELOG.md").read_text(), re.M)[1]
+    if newest != version:
+        yield f"the newest release in CHANGELOG.md is {newest}, not {version}"
+
+    try:
+        lint = subprocess.run(["mandoc", "-T", "lint", "-W", "warning", *pages],
+                              capture_output=True, text=True)
+        if lint.returncode != 0:
+            yield lint.stdout + lint.stderr
+    except FileNotFoundError:
+        yield "mandoc is not installed (Debian package mandoc)"
+
+
+CHECKS = {check.__name__: check
+          for check in (source_rules, deliberate, documents, manual_pages)}
+
+
+def main(names: list[str]) -> int:
+    if names == ["--help"]:
+        print(__doc__.strip())
+        return 0
+    for name in names:
+        if name not in CHECKS:
+            print(f"checks: there is no check {name}; see --help", file=sys.stderr)
+            return 2
+    failures = [f"{name}: {failure}" for name in names or CHECKS
+                for failure in CHECKS[name]()]
+    print(*failures, sep="\n", end="\n" if failures else "", file=sys.stderr)
+    return 1 if failures else 0
+
+
+if __name__ == "__main__":
+    sys.exit(main(sys.argv[1:]))
