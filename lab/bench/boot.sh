@@ -12,10 +12,10 @@ export LC_ALL
 
 usage() {
   cat <<'EOF'
-usage: bench/boot.sh
+usage: lab/bench/boot.sh
 
 Makes the time-zone links of this device consistent, as marlin does. For
-measuring, in a private device only: scripts/private-device bench/boot.sh
+measuring, in a private device only: scripts/private-device lab/bench/boot.sh
 EOF
 }
 

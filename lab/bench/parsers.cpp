@@ -96,11 +96,6 @@ int repeat(const char* name, long number) {
 }  // namespace
 
 int main(int argc, char** argv) {
-  if (argc == 2 && std::strcmp(argv[1], "--names") == 0) {
-    for (const auto& operation : operations)
-      std::cout << operation.name << '\n';
-    return 0;
-  }
   if (argc == 4 && std::strcmp(argv[1], "--repeat") == 0)
     return repeat(argv[2], std::strtol(argv[3], nullptr, 10));
 

@@ -1,0 +1,292 @@
+# SPDX-License-Identifier: BSD-2-Clause
+"""usage: scripts/bench [--rounds N]
+       scripts/bench --check | --record | --growth | --hardening | --parsers
+
+Measures marlin, as it ships, inside a private device. Without an option: beside the
+least that its system calls can cost ("the floor", lab/bench/floor.c), its own dynamic
+builds and a shell script that does the same job (lab/bench/boot.sh), in one table, from
+user-space instructions to the size of the file.
+
+  --rounds N    how many pairs of timings a ratio is taken from (default 11)
+  --check       compares instructions, system calls and size of the static build with
+                lab/bench/baseline.txt; fails when one has grown by more than 3
+                percent, for calls by a single one
+  --record      writes lab/bench/baseline.txt anew
+  --growth      how cost grows with what is found on the device; fails when it does not
+                grow in step; writes the plot docs/growth.svg
+  --hardening   what each hardening option costs
+  --parsers     the two parsers, against std::regex
+
+Installs the Debian packages that it needs. Instructions are those of an environment
+that holds only PATH: each variable more costs some 550 in the C library's start-up, for
+every program alike.
+"""
+
+import argparse
+import json
+import os
+import re
+import shlex
+import subprocess
+import sys
+from collections.abc import Iterator
+from pathlib import Path
+
+from lab.bench.measure import SCENES
+
+BUILDS = "build/bench"
+PROGRAMS = f"{BUILDS}/static/lab/bench"
+FLOOR = f"{PROGRAMS}/floor_SCENE"
+PACKAGES = "binutils bubblewrap cmake g++ gcc ninja-build strace valgrind"
+MORE_PACKAGES = {"table": "hyperfine", "growth": "gnuplot-nox",
+                 "parsers": "libbenchmark-dev"}
+BASELINE = Path("lab/bench/baseline.txt")
+PICTURE = Path("docs/growth.svg")
+
+
+def run(*command: str, **options) -> str:
+    """What a command prints, on either stream unless told; it must not fail."""
+    options = {"stderr": subprocess.STDOUT} | options
+    ran = subprocess.run(command, stdout=subprocess.PIPE, text=True, **options)
+    if ran.returncode != 0:
+        print(f"{ran.stdout}bench: failed: {shlex.join(command)}", file=sys.stderr)
+        sys.exit(ran.returncode)
+    return ran.stdout
+
+
+def built(name: str, *arguments: str, targets=("marlin",)) -> str:
+    """The release build with something changed, stripped."""
+    directory = f"{BUILDS}/{name}"
+    run("cmake", "--preset", "release", "-B", directory, *arguments)
+    run("cmake", "--build", directory, "--target", *targets)
+    run("strip", "-o", f"{directory}.stripped", f"{directory}/marlin")
+    return f"{directory}.stripped"
+
+
+def built_static(*targets: str) -> str:
+    """The program as it ships; and what else is measured, with these targets."""
+    return built("static", "-DMARLIN_BENCH=ON", "-DCMAKE_C_COMPILER=gcc", targets=(
+        "marlin", "peak", *(f"floor_{scene}" for scene in SCENES), *targets))
+
+
+def measured(job: str, *arguments: str):
+    return json.loads(run("scripts/private-device", "--", sys.executable, "-B", "-m",
+                          "lab.bench.measure", job, *arguments, stderr=None))
+
+
+def size_of(program: str) -> int:
+    return os.path.getsize(program.replace("SCENE", "quiet"))
+
+
+def print_table(columns: str, rows: list, words=1):
+    """The first columns are words, all others are numbers."""
+    titles = columns.split(", ")
+    rules = ["---"] * words + ["---:"] * (len(titles) - words)
+    rows = [titles, rules, *([str(cell) for cell in row] for row in rows)]
+    widths = [max(map(len, column)) for column in zip(*rows)]
+    for row in rows:
+        print("|", " | ".join(
+            f"{cell:{'<' if index < words else '>'}{width}}"
+            for index, (cell, width) in enumerate(zip(row, widths))), "|")
+
+
+def table(rounds: str):
+    programs = {
+        "floor": FLOOR,
+        "marlin, static": built_static(),
+        "marlin, dynamic": built("dynamic", "-DMARLIN_STATIC=OFF"),
+        "only libc dynamic": built(
+            "libc", "-DMARLIN_STATIC=OFF",
+            "-DCMAKE_EXE_LINKER_FLAGS=-static-libstdc++ -static-libgcc"),
+        "shell script": "lab/bench/boot.sh"}
+    counts = measured("counts", *programs.values())
+    walls = measured("wall", rounds, *programs.values())
+    rows = []
+    for scene in SCENES:
+        least = counts[scene][0][0]
+        for name, (count, calls, peak), (wall, ratio, low, high) in zip(
+                programs, counts[scene], walls[scene]):
+            rows.append((scene, name, count, count - least, f"{count / least:.2f}",
+                         calls, peak, f"{wall:.0f}", f"{ratio:.3f}",
+                         f"{low:.3f} to {high:.3f}"))
+    print_table("Scene, Program, Instructions, beyond, x floor, Calls, Peak kB, "
+                "Wall us, x floor, in rounds", rows, words=2)
+    print("\nStripped files, in bytes:", "; ".join(
+        f"{name} {size_of(file)}" for name, file in list(programs.items())[:-1]))
+    print("Wall time of the shell script against marlin, static:", ", ".join(
+        f"{scene} {row[-1][1] / row[1][1]:.2f}" for scene, row in walls.items()))
+    print(f"""Wall: the median of {rounds} rounds of 20 runs each; its ratio is taken \
+round by round, against the floor timed next to it.
+Beyond: instructions that are not the floor's. The environment held only PATH; every \
+variable more adds to the floor, and so to all alike.""")
+
+
+def parsers():
+    built_static("parsers")
+    timed = json.loads(run(f"{PROGRAMS}/parsers", "--benchmark_format=json",
+                           stderr=subprocess.DEVNULL))
+    rows = []
+    for operation in timed["benchmarks"]:
+        # The difference of two counts, so that the program's start is not in it.
+        few, many = (int(re.search(r"Collected *: (\d+)", run(
+            "valgrind", "--tool=callgrind", "--callgrind-out-file=/dev/null",
+            f"{PROGRAMS}/parsers", "--repeat", operation["name"], number))[1])
+            for number in ("1000", "2000"))
+        rows.append((operation["name"], f"{operation['cpu_time']:.1f}",
+                     (many - few) // 1000))
+    print_table("Operation, ns, Instructions", rows)
+
+
+def growth():
+    rows = measured("growth", built_static())
+    print_table("Series, Size, Instructions, Calls, Peak kB", rows)
+    series = {}
+    for name, *point in rows:
+        series.setdefault(name, []).append(point)
+    if found := [fault for name in series for fault in out_of_step(name, series[name])]:
+        sys.exit("\n".join(found))
+    data = "".join(
+        f"${name.replace('-', '_')} << END\n" +
+        "".join(" ".join(map(str, point)) + "\n" for point in points) + "END\n"
+        for name, points in series.items())
+    drawn = run("gnuplot", "-", "lab/bench/growth.gnuplot", input=data, stderr=None)
+    PICTURE.write_text("".join(line.rstrip() + "\n" for line in drawn.splitlines()))
+
+
+def out_of_step(series: str, points: list[list[int]]) -> Iterator[str]:
+    """Every point lies near the line from the first to the last: in instructions and
+    calls nearer than in memory, which comes in larger pieces."""
+    sizes, *columns = zip(*points)
+    for name, column, share, slack in zip(("instructions", "calls", "memory"), columns,
+                                          (0.02, 0.02, 0.1), (10, 10, 100)):
+        whole = column[-1] - column[0]
+        for size, value in zip(sizes, column):
+            off = value - column[0] - whole * (size - sizes[0]) / (sizes[-1] - sizes[0])
+            if abs(off) > share * whole + slack:
+                yield (f"{series} does not grow in step: at {size} its {name} are off "
+                       f"by {off:.0f}")
+
+
+# --- The baseline ----------------------------------------------------------------
+
+TOOLCHAIN = ("compiler", "libc", "instrument")
+
+
+def all_figures() -> dict[str, str]:
+    """By name, in the order of the baseline."""
+    static = built_static()
+    compiler = re.search(r"^CMAKE_CXX_COMPILER:\w+=(.*)",
+                         Path(BUILDS, "static/CMakeCache.txt").read_text(), re.M)[1]
+    version = run(compiler, "-dumpfullversion", "-dumpversion").strip()
+    figures = dict(zip(TOOLCHAIN, (f"{os.path.basename(compiler)} {version}",
+                                   run("getconf", "GNU_LIBC_VERSION").strip(),
+                                   run("valgrind", "--version").strip())))
+    for scene, (floor, marlin) in measured("counts", FLOOR, static).items():
+        for owner, (count, calls, _) in (("", marlin), ("floor.", floor)):
+            figures[f"{owner}instructions.{scene}"] = str(count)
+            figures[f"{owner}calls.{scene}"] = str(calls)
+    return figures | {"size": str(size_of(static)), "floor.size": str(size_of(FLOOR))}
+
+
+def record():
+    BASELINE.write_text(
+        "# SPDX-License-Identifier: BSD-2-Clause\n"
+        "# What scripts/bench --check compares with; written by --record.\n" +
+        "".join(f"{name} {figure}\n" for name, figure in all_figures().items()))
+
+
+def check():
+    compare(dict(line.split(" ", 1) for line in BASELINE.read_text().splitlines()
+                 if not line.startswith("#")), all_figures())
+
+
+def compare(was: dict[str, str], now: dict[str, str]):
+    """The floor stands for everything that is not ours: compiler, C library, instrument
+    and processor. Where one of them differs from the record, the floor shows it, and
+    what is compared is the floor of this run plus what marlin had beyond the floor when
+    it was recorded."""
+    if lacking := [f"{name} is only in {'the baseline' if name in was else 'this run'}"
+                   for name in sorted(was.keys() ^ now.keys())]:
+        sys.exit("\n".join(lacking))
+    differs = [name for name in was if was[name] != now[name]
+               and name.startswith((*TOOLCHAIN, "floor."))]
+    for name in differs:
+        print(f"differs from the record: {name}, {was[name]}, here {now[name]}")
+    if (any(name.startswith(("floor.calls", "floor.size")) for name in differs)
+            and not any(name in TOOLCHAIN for name in differs)):
+        sys.exit("The floor itself has changed; if that is meant: --record")
+    if differs:
+        print("Not the recorded toolchain or processor: what is compared is the floor "
+              "of this run plus the recorded distance from the floor.")
+    grown = shrunk = 0
+    for name in was:
+        if not name.startswith(("instructions.", "calls.", "size")):
+            continue
+        here, expected = int(now[name]), int(was[name])
+        if differs:
+            expected += int(now[f"floor.{name}"]) - int(was[f"floor.{name}"])
+        percent = 100 * (here - expected) / expected
+        bad = here > expected if name.startswith("calls.") else percent > 3
+        print(f"{name:24} {here:8}, expected {expected:8}  {percent:+6.2f} %"
+              f"{'  GROWN' if bad else ''}")
+        grown += bad
+        shrunk += percent < -3
+    if grown:
+        sys.exit(f"{grown} figures have grown; if that is meant: --record")
+    if shrunk and not differs:
+        print("Some have shrunk by more than 3 %: --record keeps the gain.")
+
+
+# --- Hardening -------------------------------------------------------------------
+
+# All flags of a release build without hardening, not even what a compiler does unasked.
+# Those that follow take precedence.
+BARE = ("-O3 -DNDEBUG -ffunction-sections -fdata-sections -fno-stack-protector "
+        "-U_FORTIFY_SOURCE -fcf-protection=none -Wl,--gc-sections,-z,norelro,-z,lazy")
+FIXED, PIE = "-fno-pie -static -no-pie", "-fPIE -static-pie"
+PACKED, RELRO = f"{PIE} -Wl,-z,pack-relative-relocs", "-Wl,-z,relro,-z,now"
+GUARD, FORTIFY = "-fstack-protector-strong", "-D_FORTIFY_SOURCE=2"
+BRANCHES = "-fcf-protection=full"
+HARDENING = {
+    "none": FIXED, "static-pie": PIE, "static-pie, packed": PACKED,
+    "stack protector, strong": f"{FIXED} {GUARD}",
+    "_FORTIFY_SOURCE=2": f"{FIXED} {FORTIFY}",
+    "full RELRO": f"{FIXED} {RELRO}",
+    "fcf-protection=full": f"{FIXED} {BRANCHES}",
+    "all of these": f"{PACKED} {GUARD} {FORTIFY} {BRANCHES} {RELRO}"}
+
+
+def hardening():
+    files = [built(f"hardening-{index}", "-DMARLIN_STATIC=OFF",
+                   "-DMARLIN_HARDENING=OFF", "-DCMAKE_EXE_LINKER_FLAGS_RELEASE=",
+                   f"-DCMAKE_CXX_FLAGS_RELEASE={BARE} {flags}")
+             for index, flags in enumerate(HARDENING.values())]
+    files.append(built_static())
+    counts = measured("counts", FLOOR, *files)
+    # The one scene in which an exception is thrown.
+    quiet, thrown = counts["quiet"][1:], counts["localtime"][1:]
+    print_table("Option, Instructions, more, a bad link, more, Calls, Peak kB, Bytes", [
+        (name, count, count - quiet[0][0], bad, bad - thrown[0][0], calls, peak,
+         size_of(file)) for name, file, (count, calls, peak), (bad, *_)
+        in zip([*HARDENING, "what ships"], files, quiet, thrown)])
+
+
+def main():
+    parser = argparse.ArgumentParser("scripts/bench", allow_abbrev=False)
+    parser.format_help = lambda: __doc__
+    parser.add_argument("--rounds", default="11")
+    jobs = parser.add_mutually_exclusive_group()
+    for job in (check, record, growth, hardening, parsers):
+        jobs.add_argument(f"--{job.__name__}", dest="job", action="store_const",
+                          const=job, default=table)
+    options = parser.parse_args()
+    if not re.fullmatch("[1-9][0-9]{0,3}", options.rounds):
+        parser.error("--rounds needs a number")
+    more = MORE_PACKAGES.get(options.job.__name__, "")
+    if subprocess.call(["scripts/packages", *PACKAGES.split(), *more.split()]) != 0:
+        sys.exit(1)
+    options.job(*[options.rounds] * (options.job is table))
+
+
+if __name__ == "__main__":
+    main()
