@@ -45,17 +45,17 @@ endif()
 # What each of these costs is in docs/decisions.md.
 add_library(marlin_hardening INTERFACE)
 if(MARLIN_HARDENING)
-  marlin_compile_options(marlin_hardening -fstack-protector-strong)
-  # The processor is asked for because a compiler may take the other's option with
-  # no more than a warning.
-  if(CMAKE_SYSTEM_PROCESSOR MATCHES "^(x86_64|amd64|AMD64)$")
-    marlin_compile_options(marlin_hardening -fcf-protection=full)
-  elseif(CMAKE_SYSTEM_PROCESSOR MATCHES "^(aarch64|arm64)$")
-    marlin_compile_options(marlin_hardening -mbranch-protection=standard)
-  endif()
-  # Some compilers define it themselves, perhaps as another number.
+  marlin_compile_options(marlin_hardening -fstack-protector-strong
+                         -fstack-clash-protection)
+  # No -fcf-protection and no -mbranch-protection: a program has either only if
+  # every object in it does, and the C library's start files and its static
+  # library are built without.
+  # Some compilers define the second themselves, perhaps as another number.
   target_compile_options(
-    marlin_hardening INTERFACE $<$<CONFIG:Release>:-U_FORTIFY_SOURCE>
+    marlin_hardening INTERFACE $<$<CONFIG:Release>:-D_GLIBCXX_ASSERTIONS>
+                               $<$<CONFIG:Release>:-U_FORTIFY_SOURCE>
                                $<$<CONFIG:Release>:-D_FORTIFY_SOURCE=2>)
-  marlin_link_options(marlin_hardening -Wl,-z,relro -Wl,-z,now)
+  # Constants are in no executable page, on processors too whose linkers would
+  # put them there.
+  marlin_link_options(marlin_hardening -Wl,-z,relro -Wl,-z,now -Wl,-z,separate-code)
 endif()

@@ -242,18 +242,22 @@ def compare(was: dict[str, str], now: dict[str, str]):
 # All flags of a release build without hardening, not even what a compiler does unasked.
 # Those that follow take precedence.
 BARE = ("-O3 -DNDEBUG -ffunction-sections -fdata-sections -fno-stack-protector "
-        "-U_FORTIFY_SOURCE -fcf-protection=none -Wl,--gc-sections,-z,norelro,-z,lazy")
+        "-fno-stack-clash-protection -U_FORTIFY_SOURCE -fcf-protection=none "
+        "-Wl,--gc-sections,-z,norelro,-z,lazy,-z,noseparate-code")
 FIXED, PIE = "-fno-pie -static -no-pie", "-fPIE -static-pie"
 PACKED, RELRO = f"{PIE} -Wl,-z,pack-relative-relocs", "-Wl,-z,relro,-z,now"
 GUARD, FORTIFY = "-fstack-protector-strong", "-D_FORTIFY_SOURCE=2"
-BRANCHES = "-fcf-protection=full"
+CLASH, ASSERTIONS = "-fstack-clash-protection", "-D_GLIBCXX_ASSERTIONS"
+SEPARATE = "-Wl,-z,separate-code"
 HARDENING = {
     "none": FIXED, "static-pie": PIE, "static-pie, packed": PACKED,
     "stack protector, strong": f"{FIXED} {GUARD}",
     "_FORTIFY_SOURCE=2": f"{FIXED} {FORTIFY}",
     "full RELRO": f"{FIXED} {RELRO}",
-    "fcf-protection=full": f"{FIXED} {BRANCHES}",
-    "all of these": f"{PACKED} {GUARD} {FORTIFY} {BRANCHES} {RELRO}"}
+    "separate code": f"{FIXED} {SEPARATE}",
+    "stack clash protection": f"{FIXED} {CLASH}",
+    "_GLIBCXX_ASSERTIONS": f"{FIXED} {ASSERTIONS}",
+    "all of these": f"{PACKED} {GUARD} {FORTIFY} {RELRO} {SEPARATE} {CLASH} {ASSERTIONS}"}
 
 
 def hardening():

@@ -28,8 +28,9 @@ static struct stat status;
   } while (0)
 
 static inline void read_file(const char* path) {
-  const int file = open(path, O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY);
-  IGNORE(pread(file, buffer, sizeof buffer, 0));
+  stat(path, &status);
+  const int file = open(path, O_RDONLY | O_CLOEXEC);
+  IGNORE(read(file, buffer, sizeof buffer));
   close(file);
 }
 
@@ -105,9 +106,9 @@ int main(void) {
   unlink(DB "icutz");
   unlink("/var/db/icutz");
   IGNORE(symlink(UPDATE "/icutz", DB "icutz"));
+  stat(DB "TZVersionDiffRecord", &status);
   const int record = open(DB "TZVersionDiffRecord",
                           O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0666);
-  fstat(record, &status);
   IGNORE(write(record, "2023c.1.0_2024a.1.0", 19));
   close(record);
 #endif
