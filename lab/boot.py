@@ -7,6 +7,8 @@ import errno
 import os
 import re
 import signal
+import subprocess
+import sys
 from collections.abc import Iterator
 from typing import NamedTuple
 
@@ -17,6 +19,18 @@ PROJECT = os.path.dirname(os.path.dirname(os.path.abspath(__file__)))
 PROGRAM = os.path.abspath(
     os.environ.get("MARLIN", f"{PROJECT}/build/release/marlin"))
 SECONDS = 30  # a boot that takes longer hangs
+
+
+def build():
+    """Brings the release program up to date, if it is that which is booted; ends the
+    process where it does not build."""
+    if "MARLIN" in os.environ:
+        return
+    for step in ("cmake --preset release", "cmake --build --preset release"):
+        ran = subprocess.run(step.split(), cwd=PROJECT, stdout=subprocess.PIPE,
+                             stderr=subprocess.STDOUT, text=True)
+        if ran.returncode:
+            sys.exit(f"{ran.stdout}\nthe program cannot be built")
 
 
 class Booted(NamedTuple):

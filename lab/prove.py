@@ -11,6 +11,7 @@ takes samples, in eight minutes.
   states     many thousand devices composed at random
   load       too much of everything
   log        a log that is lost, or fails in the middle
+  lab        the lab's own carriers
   fuzz       hostile texts
   sanitize   the tests under sanitizers and (not with --quick) valgrind
   coverage   lines and branches that the tests run through
@@ -28,7 +29,7 @@ import subprocess
 import sys
 import time
 
-from lab.boot import PROJECT
+from lab.boot import PROJECT, build
 
 PYTHON = ["/usr/bin/python3", "-B", "-m"]
 TRIALS = {
@@ -37,6 +38,7 @@ TRIALS = {
     "states": ["test_states.py"],
     "load": ["test_load.py"],
     "log": ["test_log.py"],
+    "lab": ["test_archive.py"],
 }
 OTHERS = {  # the whole, and with --quick
     "fuzz": (["lab.fuzz", "--seconds", "600"], ["lab.fuzz", "--seconds", "60"]),
@@ -95,13 +97,6 @@ def main(arguments: list[str]) -> int:
         for name in chosen]
     print("\n" + "\n".join(figure for _, figure in results))
     return 0 if all(holds for holds, _ in results) else 1
-
-
-def build():
-    if "MARLIN" not in os.environ:
-        for step in (["cmake", "--preset", "release"],
-                     ["cmake", "--build", "--preset", "release"]):
-            subprocess.run(step, cwd=PROJECT, check=True, stdout=subprocess.DEVNULL)
 
 
 if __name__ == "__main__":

@@ -21,7 +21,6 @@ from lab import boot
 from lab.demo import data
 
 PACKAGES = "binutils cmake g++ icu-devtools libc-bin libicu-dev ninja-build tzdata"
-BUILD = "cmake --preset release && cmake --build --preset release"
 
 
 def main() -> int:
@@ -44,23 +43,14 @@ def main() -> int:
     # Two demonstrations at once would build and prepare the same.
     with open("build/demo/lock", "w", encoding="ascii") as lock:
         fcntl.flock(lock, fcntl.LOCK_EX)
-        if "MARLIN" not in os.environ:
-            build()
+        print("Building build/release/marlin", file=sys.stderr)
+        boot.build()
         print(f"Preparing the data in {data.TARGET}", file=sys.stderr)
         data.prepare()
     os.environ["MARLIN"] = boot.PROGRAM
     os.execv("scripts/private-device", [
         "private-device", "--readable", os.path.dirname(boot.PROGRAM),
         "/usr/bin/python3", "-B", "-m", "lab.demo.story", *sys.argv[1:]])
-
-
-def build():
-    print("Building build/release/marlin", file=sys.stderr)
-    built = subprocess.run(BUILD, shell=True, stdout=subprocess.PIPE,
-                           stderr=subprocess.STDOUT)
-    if built.returncode:
-        sys.stderr.buffer.write(built.stdout)
-        sys.exit("demo: the program cannot be built")
 
 
 sys.exit(main())
