@@ -50,7 +50,8 @@ def count(request):
 def pytest_runtest_makereport(item, call):
     report = (yield).get_result()
     if report.failed:
-        report.sections.append(("Alone", "scripts/prove " + shlex.quote(report.nodeid)))
+        door = "device --tests" if "lab/emulator/" in report.nodeid else "prove"
+        report.sections.append(("Alone", f"scripts/{door} {shlex.quote(report.nodeid)}"))
 
 
 def pytest_runtest_logreport(report):

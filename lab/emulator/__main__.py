@@ -1,0 +1,67 @@
+# SPDX-License-Identifier: BSD-2-Clause
+"""Builds the program for arm64 and boots it on an emulated device: a real kernel, a
+read-only system partition, an ext4 disk for "/var". Without an option it shows an
+update being announced at one boot and activated at the next: the console, what readers
+of time-zone data see, and the links.
+
+What is needed is installed, as root, and a kernel is fetched into the folder "build".
+Exit status: 0 when all is as expected, otherwise 1; 2 for bad use; 77 when a device
+cannot be emulated here.
+"""
+
+import argparse
+import sys
+
+import pytest
+
+from lab.emulator import boot_cost, parts, power_cuts, show
+
+
+def number_of_cuts(text: str) -> int:
+    if not text.isdecimal() or int(text) == 0:
+        raise argparse.ArgumentTypeError(f"{text!r} is not a number of power cuts")
+    return int(text)
+
+
+def main() -> int:
+    parser = argparse.ArgumentParser(
+        prog="scripts/device", description=__doc__,
+        formatter_class=argparse.RawDescriptionHelpFormatter, allow_abbrev=False)
+    mode = parser.add_mutually_exclusive_group()
+    mode.add_argument("--shell", action="store_true", help="a prompt on the device, "
+                      'after the pass; "poweroff -f" ends it')
+    mode.add_argument("--tests", nargs="*", metavar="TEST", help="every chosen device, "
+                      "sequences of boots on one disk, ten power cuts; or these tests")
+    mode.add_argument("--power-cuts", type=number_of_cuts, metavar="N", help="cuts the "
+                      "power at N random instants, and checks what is left")
+    mode.add_argument("--boot-cost", action="store_true",
+                      help="measures the part of a boot that the pass takes")
+    parser.add_argument("--quick", action="store_true", help="tests: three power cuts")
+    parser.add_argument("--seed", type=int, help="of what chance decides in cuts")
+    options = parser.parse_args()
+    try:
+        parts.prepare()
+        if options.tests is not None:
+            return pytest.main([
+                "-c", "lab/pytest.ini", f"--rootdir={parts.PROJECT}",
+                "-n", "2", "--dist", "loadfile", *["--quick"] * options.quick,
+                *(options.tests or ["lab/emulator"])])
+        if options.shell:
+            return show.shell()
+        if options.power_cuts:
+            power_cuts.run(options.power_cuts, options.seed)
+        elif options.boot_cost:
+            boot_cost.measure()
+        else:
+            show.show()
+    except parts.Unavailable as reason:
+        print(f"SKIPPED: {reason}", file=sys.stderr)
+        return 77
+    except RuntimeError as reason:
+        print(f"FAILED: {reason}")
+        return 1
+    return 0
+
+
+if __name__ == "__main__":
+    sys.exit(main())

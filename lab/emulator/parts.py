@@ -1,0 +1,81 @@
+# SPDX-License-Identifier: BSD-2-Clause
+"""What an emulated arm64 device is made of: the program, built for it, and Debian's
+kernel and busybox, from packages that are unpacked in the folder "build" and never
+installed. The emulator and the tools that build all this are installed, as root."""
+
+import fcntl
+import functools
+import re
+import shutil
+import subprocess
+import sys
+from pathlib import Path
+
+from lab import boot
+from lab.carriers.image import run
+
+PROJECT = Path(boot.PROJECT)
+WORK = PROJECT / "build" / "emulator"
+PARTS = WORK / "packages"
+PROGRAM = PROJECT / "build" / "arm64-release" / "marlin"
+PACKAGES = """cmake e2fsprogs g++-aarch64-linux-gnu libc-bin ninja-build
+  qemu-system-arm""".split()
+
+
+class Unavailable(Exception):
+    """What a device needs cannot be obtained on this machine."""
+
+
+def prepare():
+    """Builds and fetches what is missing; or raises Unavailable."""
+    if subprocess.call([PROJECT / "scripts/packages", *PACKAGES]):
+        raise Unavailable("packages are missing")
+    WORK.mkdir(parents=True, exist_ok=True)
+    with open(WORK / "lock", "w", encoding="ascii") as lock:
+        fcntl.flock(lock, fcntl.LOCK_EX)
+        print(f"Building {PROGRAM.relative_to(PROJECT)}", file=sys.stderr, flush=True)
+        if not (PROGRAM.parent / "build.ninja").is_file():
+            run("cmake", "--preset", "arm64-release", cwd=PROJECT)
+        run("cmake", "--build", "--preset", "arm64-release", cwd=PROJECT)
+        if not PARTS.is_dir():
+            print("Fetching a kernel and busybox", file=sys.stderr, flush=True)
+            try:
+                fetch()
+            except RuntimeError as reason:
+                raise Unavailable(f"the parts cannot be fetched: {reason}") from reason
+
+
+def fetch():
+    """With an index and a package database of its own, for arm64, so that this
+    machine's stay as they are."""
+    work = WORK / "fetched"
+    shutil.rmtree(work, ignore_errors=True)
+    for directory in ("lists/partial", "cache/archives/partial", "unpacked"):
+        (work / directory).mkdir(parents=True)
+    (work / "status").touch()
+    settings = {"APT::Architecture": "arm64", "APT::Architectures::": "arm64",
+                "APT::Sandbox::User": "root", "Dir::State": work,
+                "Dir::State::lists": work / "lists", "Dir::Cache": work / "cache",
+                "Dir::State::status": work / "status"}
+
+    def apt(tool, *words):
+        options = [word for item in settings.items() for word in ("-o", "%s=%s" % item)]
+        return run(tool, "-qq", *options, *words, cwd=work)
+
+    apt("apt-get", "update")
+    newest = apt("apt-cache", "depends", "linux-image-cloud-arm64")
+    kernel = re.search(r"^ *Depends: (linux-image-[0-9]\S*)$", newest, re.MULTILINE)
+    if not kernel:
+        raise RuntimeError("no kernel for arm64 in the package index")
+    apt("apt-get", "download", kernel[1], "busybox-static")
+    for package in work.glob("*.deb"):
+        run("dpkg-deb", "-x", package, work / "unpacked")
+    (work / "unpacked").rename(PARTS)
+    shutil.rmtree(work)
+
+
+@functools.cache
+def part(pattern: str) -> Path:
+    """The one file among the parts whose path ends so."""
+    [path] = PARTS.rglob(pattern)
+    return path

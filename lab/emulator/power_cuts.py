@@ -1,0 +1,241 @@
+# SPDX-License-Identifier: BSD-2-Clause
+"""Cuts the power of an emulated device at random instants.
+
+The device runs the pass over and over, with changing announcements, while others sync
+the disk; then the emulator is killed. What had not been flushed is kept or lost at
+random, the disk is checked after its journal has been replayed, and the device boots
+again: that boot's pass is to do what the model does with the state found on the disk,
+and it is where the next cut happens.
+"""
+
+import collections
+import random
+import re
+import shutil
+import time
+from pathlib import Path
+
+from lab import model, properties
+from lab.carriers import image
+from lab.device import Device, sound_device
+from lab.emulator import power_log
+from lab.emulator.machine import LINKS, Console, Machine, shown_links
+from lab.paths import (FORMER_ZONEINFO, ICUTZ, LEGACY_ICUTZ, LOCALTIME, RECORD,
+                       TZ_LATEST, ZONEINFO, update_path)
+from lab.seen import Entries, Seen, as_device
+from lab.trial import log_differences
+
+UPDATES = 150  # 2024a.1.1 and so on, each newer than the one before
+ANOTHER_SCHEMA = "2030a.1.0"
+
+# How the disk is mounted, and what else goes on: nothing that syncs, others who
+# sync now and then or all the time; or every change of a directory is on the
+# disk before the next, as the mount asks for, so that each state in the middle
+# of a pass can be found. The last is the rule, because it finds the most.
+OTHERS = (("rw", ""), ("rw", "(while :; do sync; usleep 30000; done) &\n"),
+          ("rw", "(while :; do sync; done) &\n"), *(3 * [("dirsync", "")]))
+
+LOOP = f"""
+replace() {{ ln -sfn "$1" "$2.next"; mv -T "$2.next" "$2"; }}
+say "loop begins"
+while [ $n -lt {UPDATES} ]; do
+  n=$((n + 1))
+  latest={update_path('2024a.1.$n')}
+  case $((n % 8)) in
+    3) replace {FORMER_ZONEINFO}/Europe/Paris {LOCALTIME} ;;
+    4) ln -s "$(readlink {ICUTZ})" {LEGACY_ICUTZ} ;;
+    6) latest={update_path(ANOTHER_SCHEMA)} ;;
+  esac
+  replace $latest {TZ_LATEST}
+  say "pass $n begins"
+  marlin 2>/dev/kmsg
+  say "pass $n ended with status $?"
+done
+say "loop ended"
+while :; do sleep 1; done
+"""
+OF_THE_LOOP = {TZ_LATEST, TZ_LATEST + ".next", LOCALTIME + ".next", LEGACY_ICUTZ}
+
+
+def insist(found: list[str]):
+    """Raises if anything is not as it has to be."""
+    if found:
+        raise RuntimeError("; ".join(found))
+
+
+# --- The state that a cut left -----------------------------------------------------
+
+
+def number_of(device: Device, path: str) -> int | None:
+    """The number of the update that a link names; None for no update."""
+    node = device.find(path)
+    found = re.match(r"/var/db/timezone/tz/2024a\.1\.(\d+)", node.text if node else "")
+    return int(found[1]) if found else None
+
+
+def described(device: Device) -> str:
+    """The state of the links in words, with "update" for whichever number it is."""
+    zoneinfo, icutz = number_of(device, ZONEINFO), number_of(device, ICUTZ)
+    if not device.find(ZONEINFO):
+        pair = "zoneinfo missing, icutz " + ("missing" if icutz is None else "there")
+    elif zoneinfo is None:
+        pair = ("the system's" if icutz is None else
+                "MIXED: zoneinfo system, icutz update")
+    elif icutz is None:
+        pair = "MIXED: zoneinfo update, icutz missing"
+    elif zoneinfo == icutz:
+        pair = "one update's"
+    else:
+        older = "older" if icutz < zoneinfo else "newer"
+        pair = f"MIXED: zoneinfo update, icutz of an {older} one"
+    return pair + ("" if device.find(LOCALTIME) else ", localtime missing")
+
+
+def kind_of_record(device: Device) -> str:
+    """A record is written and never synced, so the disk may know of the file but not
+    of its bytes yet; the next activation writes it anew."""
+    record = device.find(RECORD)
+    if record is None:
+        return "none"
+    if not record.text.strip("\0"):
+        return "of NUL bytes" if record.text else "empty"
+    if not re.fullmatch(r"(2023c\.1\.0|2024a\.1\.\d+)_2024a\.1\.\d+", record.text):
+        raise RuntimeError(f"the record holds {record.text!r}")
+    return "whole"
+
+
+def check_recovery(console: Console, entries: Entries):
+    """The first pass of a boot that found this is to do what the model does."""
+    device = as_device(entries)
+    insist(log_differences(model.boot(device), Seen({}, {}, *console.booted())))
+    insist([f"after the pass not: {text}" for text in shown_links(device)
+            if text not in console.said])
+    _, zone = console.find("reader sees zone ")
+    if zone not in ("S23CP", "S23CL", "U24AP", "U24AL"):
+        raise RuntimeError(f"a reader sees zone {zone}")
+
+
+def within_pass(console: Console) -> bool:
+    passes = [text for text in console.said if re.match(r"pass \d+ ", text)]
+    insist([text for text in passes if not text.endswith(("begins", "status 0"))])
+    return bool(passes) and passes[-1].endswith("begins")
+
+
+# --- The cuts ----------------------------------------------------------------------
+
+
+class Victim:
+    """A device whose power is cut again and again; `found` is what the next boot
+    finds."""
+
+    def __init__(self, seed: int):
+        self.random = random.Random(seed)
+        self.machine = Machine("power-cuts")
+        self.make_disk()
+
+    def make_disk(self):
+        device = sound_device()
+        for number in range(1, UPDATES + 1):
+            device.install_update(f"2024a.1.{number}")
+        device.install_update(ANOTHER_SCHEMA, "45l")
+        device.announce("2024a.1.1")
+        self.machine.build(device, "-N", "2048", "-J", "size=4", megabytes=24)
+        self.start = self.found = self.machine.look()
+
+    def run_until_cut(self, first: int, log: Path) -> Console:
+        """Boots, lets the loop run for a while, and kills the emulator, which logs what
+        the device asks of its disk and changes only a copy of it."""
+        machine, scratch = self.machine, self.machine.directory / "scratch.img"
+        shutil.copyfile(machine.var, scratch)
+        log.write_bytes(b"")
+        mounted, syncs = self.random.choice(OTHERS)
+        emulator = machine.start(
+            f"{syncs}n={first}{LOOP}", options="var=" + mounted,
+            more=("-smp", "2"),  # processors: others sync in the middle of a pass
+            disk="driver=blklogwrites,node-name=var,"
+                 f"file.driver=file,file.filename={scratch},"
+                 f"log.driver=file,log.filename={log}")
+        try:
+            machine.wait_for(emulator, "loop begins")
+            time.sleep(self.random.uniform(0, 1.5))
+        finally:
+            emulator.kill()
+            emulator.wait()
+        return Console(machine.console)
+
+    def cut(self) -> tuple[bool, int]:
+        """One cut, and what it left. Whether it was inside the pass, and how many
+        blocks were lost."""
+        device = as_device(self.found)
+        first = max(number_of(device, link) or 0 for link in (ZONEINFO, TZ_LATEST))
+        if first > UPDATES - 60:
+            self.make_disk()
+            first = 1
+        log = self.machine.directory / "log"
+        console = self.run_until_cut(first, log)
+        lost = power_log.cut_power(self.machine.var, log.read_bytes(),
+                                   self.random.choice((0, 0.5, 1)), self.random)
+        before, self.found = self.found, self.look_after_cut()
+        check_recovery(console, before)
+        return within_pass(console), lost
+
+    def look_after_cut(self) -> Entries:
+        """The disk as a boot would find it, after all checks that need no boot."""
+        found = self.machine.directory / "found.img"
+        shutil.copyfile(self.machine.var, found)
+        image.replay_journal(found)
+        image.check(found)
+        entries = self.machine.look(found)
+        insist(properties.data_changes(
+            *({path: here for path, here in looked.items() if path not in OF_THE_LOOP}
+              for looked in (self.start, entries))))
+        insist([f"{path} is not a link" for path in LINKS
+                if path in entries and entries[path].kind != "link"])
+        return entries
+
+
+def run_cuts(count: int, victim: Victim, table, totals):
+    """Prints a line for each cut; counts how often each state was found."""
+    started = time.monotonic()
+    for number in range(1, count + 1):
+        inside, lost = victim.cut()
+        device = as_device(victim.found)
+        state, record = described(device), kind_of_record(device)
+        model.boot(device)
+        table[state, described(device), inside] += 1
+        totals.update(["cuts", "record " + record] + ["inside"] * inside +
+                      ["with losses"] * (lost > 0))
+        print(f"cut {number}/{count}, {time.monotonic() - started:.0f} s: "
+              f"{'inside the pass' if inside else 'between passes'}, "
+              f"{lost} blocks lost; {state}; record {record}", flush=True)
+    # The state that the last cut left is booted as well, and shut down.
+    check_recovery(victim.machine.boot(), victim.found)
+    image.check(victim.machine.var)
+
+
+def print_table(table, totals):
+    print(f"\n{totals['cuts']} power cuts, {totals['inside']} of them inside the "
+          f"pass; {totals['with losses']} lost blocks that had been written.")
+    print("The record afterwards: " + ", ".join(
+        f"{totals['record ' + kind]} times {kind}"
+        for kind in ("whole", "none", "empty", "of NUL bytes")))
+    print(f"\n{'links found after the cut':52}{'inside':>8}{'between':>8}"
+          "  after the next boot")
+    for state, healed in sorted({key[:2] for key in table}):
+        print(f"{state:52}{table[state, healed, True]:8}{table[state, healed, False]:8}"
+              f"  {healed}")
+
+
+def run(count: int, seed: int | None = None):
+    """Raises RuntimeError when a device is not as it has to be after a power cut."""
+    seed = random.randrange(10**6) if seed is None else seed
+    print(f"seed {seed}", flush=True)
+    table, totals = collections.Counter(), collections.Counter()
+    victim = Victim(seed)
+    try:
+        run_cuts(count, victim, table, totals)
+    except RuntimeError as reason:
+        print(Console(victim.machine.console).text[-6000:])
+        raise RuntimeError(f"with seed {seed}: {reason}") from reason
+    finally:
+        print_table(table, totals)
