@@ -151,6 +151,7 @@ def growth():
         for name, points in series.items())
     drawn = run("gnuplot", "-", "lab/bench/growth.gnuplot", input=data, stderr=None)
     PICTURE.write_text("".join(line.rstrip() + "\n" for line in drawn.splitlines()))
+    print(f"bench: wrote {PICTURE}", file=sys.stderr)
 
 
 def out_of_step(series: str, points: list[list[int]]) -> Iterator[str]:
@@ -175,12 +176,10 @@ TOOLCHAIN = ("compiler", "libc", "instrument")
 def all_figures() -> dict[str, str]:
     """By name, in the order of the baseline."""
     static = built_static()
-    compiler = re.search(r"^CMAKE_CXX_COMPILER:\w+=(.*)",
-                         Path(BUILDS, "static/CMakeCache.txt").read_text(), re.M)[1]
-    version = run(compiler, "-dumpfullversion", "-dumpversion").strip()
-    figures = dict(zip(TOOLCHAIN, (f"{os.path.basename(compiler)} {version}",
-                                   run("getconf", "GNU_LIBC_VERSION").strip(),
-                                   run("valgrind", "--version").strip())))
+    figures = dict(zip(TOOLCHAIN, (
+        "g++ " + run("g++", "-dumpfullversion").strip(),
+        run("getconf", "GNU_LIBC_VERSION").strip(),
+        run("valgrind", "--version").strip())))
     for scene, (floor, marlin) in measured("counts", FLOOR, static).items():
         for owner, (count, calls, _) in (("", marlin), ("floor.", floor)):
             figures[f"{owner}instructions.{scene}"] = str(count)
@@ -193,6 +192,7 @@ def record():
         "# SPDX-License-Identifier: BSD-2-Clause\n"
         "# What scripts/bench --check compares with; written by --record.\n" +
         "".join(f"{name} {figure}\n" for name, figure in all_figures().items()))
+    print(f"bench: wrote {BASELINE}", file=sys.stderr)
 
 
 def check():
