@@ -7,6 +7,7 @@ import os
 import shlex
 import sys
 
+import hypothesis
 import pytest
 
 sys.path.insert(0, os.path.dirname(os.path.dirname(os.path.abspath(__file__))))
@@ -29,6 +30,12 @@ def pytest_addoption(parser):
     parser.addoption("--states", type=int, metavar="N", help="so many random devices")
     parser.addoption("--seed", default="1", help="other random devices")
     parser.addoption("--state", metavar="SEED/N", help="one of the random devices")
+
+
+def pytest_configure(config):
+    hypothesis.settings.register_profile(
+        "run", max_examples=300 if config.getoption("quick") else 3000)
+    hypothesis.settings.load_profile("run")
 
 
 def pytest_sessionstart(session):

@@ -80,7 +80,7 @@ def test_states(seed, states, count):
                count)
 
 
-@settings(max_examples=200, deadline=None, database=None, print_blob=True,
+@settings(deadline=None, database=None, print_blob=True,
           suppress_health_check=list(HealthCheck))
 @given(source=st.randoms(use_true_random=False))
 def test_a_device_that_can_be_shrunk(source):
