@@ -57,9 +57,9 @@ PROGRAMS = ["/usr/libexec/marlin", "/usr/share/doc/marlin/examples/init-script"]
 KNOWN = set("""
     Type RemainAfterExit ExecStart TimeoutStartSec SyslogLevel User UMask
     CapabilityBoundingSet NoNewPrivileges ProtectSystem ReadWritePaths ReadOnlyPaths
-    MemoryDenyWriteExecute SystemCallArchitectures SystemCallErrorNumber SystemCallFilter
-    KeyringMode ProtectHome PrivateDevices PrivateMounts ProtectProc ProcSubset
-    ProtectClock ProtectControlGroups ProtectHostname ProtectKernelLogs
+    MemoryDenyWriteExecute SystemCallArchitectures SystemCallErrorNumber
+    SystemCallFilter KeyringMode ProtectHome PrivateDevices PrivateMounts ProtectProc
+    ProcSubset ProtectClock ProtectControlGroups ProtectHostname ProtectKernelLogs
     ProtectKernelModules ProtectKernelTunables PrivateNetwork IPAddressDeny
     RestrictAddressFamilies PrivateIPC LockPersonality RestrictNamespaces
     RestrictRealtime RestrictSUIDSGID
@@ -168,8 +168,9 @@ def test_two_builds_in_two_directories_give_the_same_bytes(package, count):
 def test_lintian_finds_no_error(package):
     """It speaks up when root runs it. What it says short of an error is shown too, so
     that it does not go unread."""
-    for line in in_user_namespace(1000, "lintian", "-q", "--fail-on", "error",
-                                  "--tag-display-limit", "0", package.file).splitlines():
+    output = in_user_namespace(1000, "lintian", "-q", "--fail-on", "error",
+                               "--tag-display-limit", "0", package.file)
+    for line in output.splitlines():
         warnings.warn(line)
 
 
@@ -222,8 +223,8 @@ def test_its_program_is_static_and_hardened(package):
 
 def test_it_is_installed_and_removed_without_a_trace(package):
     root = fresh(package.content.parent / "root")
-    for directory in ("var/lib/dpkg/info", "var/lib/dpkg/updates", "var/db/timezone/tz"):
-        (root / directory).mkdir(parents=True)
+    for directory in ("lib/dpkg/info", "lib/dpkg/updates", "db/timezone/tz"):
+        (root / "var" / directory).mkdir(parents=True)
     for file in ("status", "available"):
         (root / "var/lib/dpkg" / file).touch()
     (root / "var/db/timezone/TZVersionDiffRecord").write_text("kept\n")
@@ -260,7 +261,7 @@ def test_cmake_installs_it_below_any_prefix(package):
     assert (prefix / "share/doc/marlin/LICENSE").is_file()
 
 
-# --- What starts it --------------------------------------------------------------------
+# --- What starts it ------------------------------------------------------------------
 
 
 def boot(tests: str, program: Path):
@@ -291,7 +292,8 @@ def test_tmpfiles_make_the_two_directories(package, unit):
     (root / "etc/passwd").write_text("root:x:0:0::/:\n")
     (root / "etc/group").write_text("root:x:0:\n")
     shutil.copytree(package.content / "usr", root / "usr", symlinks=True)
-    in_user_namespace(0, "systemd-tmpfiles", f"--root={root}", "--create", "marlin.conf")
+    in_user_namespace(0, "systemd-tmpfiles", f"--root={root}", "--create",
+                      "marlin.conf")
     for directory in ("var/db/timezone", "var/db/timezone/tz"):
         assert stat.filemode((root / directory).stat().st_mode) == "drwxr-xr-x"
 
@@ -320,7 +322,8 @@ def units(package, unit) -> Path:
     root = fresh(package.content.parent / "units")
     shutil.copytree(package.content / "usr", root / "usr", symlinks=True)
     for name in ("sysinit", "shutdown", "local-fs", "basic"):
-        shutil.copy(f"/lib/systemd/system/{name}.target", root / "usr/lib/systemd/system")
+        shutil.copy(f"/lib/systemd/system/{name}.target",
+                    root / "usr/lib/systemd/system")
     return root
 
 
@@ -346,7 +349,7 @@ def test_every_restriction_of_the_unit_is_known(unit):
     assert unit.values("MemoryDenyWriteExecute") == ["yes"]
 
 
-# --- Boots under the unit's restrictions -------------------------------------------------
+# --- Boots under the unit's restrictions ---------------------------------------------
 
 
 @pytest.fixture(scope="module")
