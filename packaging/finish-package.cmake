@@ -22,5 +22,5 @@ execute_process(
   COMMAND ${CMAKE_CURRENT_LIST_DIR}/finish-package ${root} "${CPACK_PACKAGE_CONTACT}"
   OUTPUT_VARIABLE time
   OUTPUT_STRIP_TRAILING_WHITESPACE COMMAND_ERROR_IS_FATAL ANY)
-# So that the package's own members get this time too.
+# cpack gives it to everything that it packs.
 set(ENV{SOURCE_DATE_EPOCH} ${time})
