@@ -29,7 +29,7 @@ endif()
 
 # Debian's own files, and the one time that every file in the package has.
 set(CPACK_PRE_BUILD_SCRIPTS ${PROJECT_SOURCE_DIR}/packaging/finish-package.cmake)
-set(CPACK_MARLIN_SOURCE_DIR ${PROJECT_SOURCE_DIR})
+set(CPACK_POST_BUILD_SCRIPTS ${CPACK_PRE_BUILD_SCRIPTS})
 set(CPACK_MARLIN_STATIC ${MARLIN_STATIC})
 
 include(CPack)

@@ -30,6 +30,8 @@ def pytest_addoption(parser):
     parser.addoption("--states", type=int, metavar="N", help="so many random devices")
     parser.addoption("--seed", default="1", help="other random devices")
     parser.addoption("--state", metavar="SEED/N", help="one of the random devices")
+    parser.addoption("--preset", action="append", metavar="NAME",
+                     help="the package of this preset; may be repeated")
 
 
 def pytest_configure(config):

@@ -2,7 +2,7 @@
 //
 // Stands in marlin's place in a test and starts "marlin.real" beside it, under
 // the restrictions of the boot unit: its read-only paths, no capability, and
-// its system calls. packaging/test takes the three lists from the unit and
+// its system calls. lab/test_package.py takes the three lists from the unit and
 // compiles them in. One difference, on purpose: a call that the unit refuses
 // kills here, so that no refusal goes unnoticed.
 #define _GNU_SOURCE

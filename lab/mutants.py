@@ -1,20 +1,19 @@
-#!/usr/bin/env python3
 # SPDX-License-Identifier: BSD-2-Clause
-"""Breaks the product on purpose and shows which breaks no test notices.
+"""Breaks the program on purpose and shows which breaks no test notices.
 
-Rules change a copy of driver/, dataset/ and support/ in one place at a time: an
-operator, a constant, a text, a name, a condition, a statement. Every mutant is
-built and the test programs run against it, the one named after its folder
-first, slow tests last, up to the first failure; one that hangs is killed too.
-Survivors are printed as
+Mutants of driver/, dataset/ and support/ are made by rule, in one place at a time: an
+operator, a constant, a text, a name, a condition, a statement; and by hand, each to
+break a sentence of what the program must do: mutants_by_hand.py. Every one is built in
+a copy of the project and the test programs run against it, the one named after its
+folder first, slow tests last, up to the first failure; one that hangs is killed too.
+Survivors are printed.
 
-  FILE:LINE: BEFORE -> AFTER
-
-Those that change nothing that anybody could notice are listed, with a reason
-each, in proof/mutants-equivalent. Exit status: 0 when there is no other, 1 when
-there is, 2 for bad use. The copies, up to one for each processor, and their
-builds are in build/mutants.
+Those that change nothing that anybody could notice are listed, with a reason each, in
+mutants_equivalent.txt. Exit status: 0 when there is no other, 1 when there is, 2 for
+bad use. The copies, up to one for each processor, and their builds are in
+build/mutants.
 """
+
 import argparse
 import fcntl
 import os
@@ -27,13 +26,25 @@ import subprocess
 import sys
 import time
 from collections import Counter
+from collections.abc import Iterator
 from concurrent.futures import ThreadPoolExecutor
 from pathlib import Path
+from typing import NamedTuple
+
+from lab.mutants_by_hand import MUTANTS
 
 PROJECT = Path(__file__).resolve().parent.parent
 PLACE = PROJECT / "build/mutants"
 FOLDERS = ("support", "dataset", "driver")
 SLOW = 200  # milliseconds; a test that takes longer comes last
+
+
+class Mutant(NamedTuple):
+    kind: str
+    texts: dict[str, str]  # of the files that it changes
+    shown: str
+    key: str  # in mutants_equivalent.txt
+
 
 # --- Rules -------------------------------------------------------------------
 
@@ -173,169 +184,50 @@ def changes(source):
             yield *found.span(1), "return {};"
 
 
-class Mutant:
-    def __init__(self, file, source, start, end, text):
-        self.file, self.text = file, source[:start] + text + source[end:]
-        self.line = source.count("\n", 0, start) + 1
-        first, last = source.rfind("\n", 0, start) + 1, source.find("\n", end)
-        lines = (source[first:last],
-                 source[first:start] + text + source[end:last])
-        before, after = (" ".join(re.sub(r" //.*", "", part).split())
-                         for part in lines)
-        self.change = f"{before} -> {after}"
-
-    def key(self):
-        return f"{self.file}: {self.change}"
-
-    def __str__(self):
-        return f"{self.file}:{self.line}: {self.change}"
+# --- Mutants -----------------------------------------------------------------
 
 
-def all_mutants():
-    mutants = {}
-    for folder in FOLDERS:
-        for path in sorted((PROJECT / folder).glob("*.*")):
-            source, file = path.read_text(), f"{folder}/{path.name}"
-            for change in sorted(changes(source)):
-                mutant = Mutant(file, source, *change)
-                if mutant.text != source:
-                    mutants.setdefault((file, mutant.text), mutant)
-    # The same change of the same line in two places: told apart by a number.
-    times = Counter()
-    for mutant in mutants.values():
-        times[mutant.key()] += 1
-        if times[mutant.key()] > 1:
-            mutant.change += f" ({times[mutant.key()]})"
-    return list(mutants.values())
+def by_rule() -> Iterator[Mutant]:
+    for path in (path for folder in FOLDERS
+                 for path in sorted((PROJECT / folder).glob("*.*"))):
+        source, file = path.read_text(), str(path.relative_to(PROJECT))
+        known, times = {source}, Counter()
+        for start, end, text in sorted(changes(source)):
+            changed = source[:start] + text + source[end:]
+            if changed in known:
+                continue
+            known.add(changed)
+            first, last = source.rfind("\n", 0, start) + 1, source.find("\n", end)
+            change = " -> ".join(
+                " ".join(re.sub(r" //.*", "", part).split()) for part in (
+                    source[first:last], source[first:start] + text + source[end:last]))
+            # The same change of the same line in two places: told apart by a number.
+            times[change] += 1
+            if times[change] > 1:
+                change += f" ({times[change]})"
+            line = source.count("\n", 0, start) + 1
+            yield Mutant("by rule", {file: changed}, f"{file}:{line}: {change}",
+                         f"{file}: {change}")
 
 
-# --- Building and testing ----------------------------------------------------
-
-def run(seconds, *command, file_size="unlimited"):
-    """Whether a command succeeds within this time, and its output."""
-    limits = (f"trap '' XFSZ; ulimit -f {file_size} -t {seconds} -v 4194304; "
-              'exec "$@"')  # what a mutant could take from the machine
-    process = subprocess.Popen(
-        ["bash", "-c", limits, "bash", *command], stdin=subprocess.DEVNULL,
-        stdout=subprocess.PIPE, stderr=subprocess.STDOUT,
-        start_new_session=True)
-    try:
-        # Ten times as long by the clock, for a machine that has more to do.
-        output = process.communicate(timeout=10 * seconds)[0]
-        return process.returncode == 0, output.decode(errors="replace")
-    except subprocess.TimeoutExpired:
-        os.killpg(process.pid, signal.SIGKILL)
-        process.communicate()
-        return False, "it hangs"
+def by_hand() -> Iterator[Mutant]:
+    for name, edits, sentence in MUTANTS:
+        texts = {}
+        for file, before, after in edits:
+            text = texts.get(file) or (PROJECT / file).read_text()
+            if text.count(before) != 1:
+                sys.exit(f"mutants: by hand: {name}: found {text.count(before)} times, "
+                         f"not once, in {file}: {before!r}")
+            texts[file] = text.replace(before, after)
+        key = f"by hand: {name}"
+        yield Mutant("by hand", texts, f"{key}: {sentence}", key)
 
 
-class Tree:
-    """A copy of the project, and its build."""
-
-    def __init__(self, number):
-        self.root = PLACE / f"tree{number}"
-        self.build_place = self.root / "build"
-
-    def bring_up_to_date(self):
-        """What is the same keeps its time, and so its objects."""
-        def files_of(root):
-            for path in root.rglob("*"):
-                inner = path.relative_to(root)
-                if inner.parts[0] not in ("build", ".git") and path.is_file():
-                    yield inner
-        self.root.mkdir(parents=True, exist_ok=True)
-        wanted = set(files_of(PROJECT))
-        for inner in set(files_of(self.root)) - wanted:
-            (self.root / inner).unlink()
-        for inner in wanted:
-            source, target = PROJECT / inner, self.root / inner
-            target.parent.mkdir(parents=True, exist_ok=True)
-            if (not target.exists()
-                    or target.read_bytes() != source.read_bytes()):
-                shutil.copy(source, target)
-
-    def build(self, target="all"):
-        return run(900, "ninja", "-C", self.build_place, "-j2", target)
-
-    def run_quick_tests(self, program, slow, *options):
-        return run(15, self.build_place / "tests" / program, *options,
-                   "--gtest_filter=-" + ":".join(slow), file_size=1 << 18)  # blocks of 1 kB
-
-    def run_slow_tests(self, program, slow):
-        return run(60, self.build_place / "tests" / program,
-                   "--gtest_filter=" + ":".join(slow))
-
-    def prepare(self):
-        """Builds and tests it as it is; finds each program's slow tests."""
-        self.bring_up_to_date()
-        if not (self.build_place / "build.ninja").exists():
-            subprocess.run(
-                ["cmake", "-S", self.root, "-B", self.build_place, "-G",
-                 "Ninja", "-DCMAKE_BUILD_TYPE=None", "-DCMAKE_CXX_FLAGS=-O0 -w "
-                 "-D_GLIBCXX_ASSERTIONS -fsanitize=return",
-                 "-DCMAKE_GTEST_DISCOVER_TESTS_DISCOVERY_MODE=PRE_TEST"],
-                check=True, stdout=subprocess.DEVNULL)
-        built, output = self.build()
-        if not built:
-            sys.exit(f"{output}\nmutants: the unchanged project does not build")
-        self.slow = {}
-        for path in sorted(self.build_place.glob("tests/*_test")):
-            program = path.name
-            output = self.run_quick_tests(program, [])[1]
-            slow = [test for result, test, took in re.findall(
-                        r"\[ +(OK|FAILED) +\] (\S+) \((\d+) ms\)", output)
-                    if result == "FAILED" or int(took) >= SLOW]
-            self.slow[program] = slow
-            for passed, output in (self.run_quick_tests(program, slow),
-                                   self.run_slow_tests(program, slow)):
-                if not passed:
-                    sys.exit(f"{output}\nmutants: {program} fails as it is")
-
-    def fate_of(self, mutant):
-        path = self.root / mutant.file
-        original = path.read_text()
-        path.write_text(mutant.text)
-        try:
-            return self.tested(mutant.file.split("/")[0] + "_test")
-        finally:
-            path.write_text(original)
-
-    def tested(self, favourite):
-        programs = sorted(self.slow, key=lambda name: (name != favourite, name))
-        for program in programs:
-            if not self.build(f"tests/{program}")[0]:
-                return "not built"
-            if not self.run_quick_tests(program, self.slow[program],
-                                        "--gtest_fail_fast")[0]:
-                return "killed"
-        for program in programs:
-            slow = self.slow[program]
-            if slow and not self.run_slow_tests(program, slow)[0]:
-                return "killed"
-        return "survivor"
-
-
-def fates(trees, mutants):
-    """Yields every mutant with its fate."""
-    free = queue.SimpleQueue()
-    for tree in trees:
-        free.put(tree)
-
-    def work(mutant):
-        tree = free.get()
-        try:
-            return mutant, tree.fate_of(mutant)
-        finally:
-            free.put(tree)
-    with ThreadPoolExecutor(len(trees)) as pool:
-        yield from pool.map(work, mutants)
-
-
-def reasons():
-    """FILE: BEFORE -> AFTER, each followed by an indented reason."""
-    path, found, key = PROJECT / "proof/mutants-equivalent", {}, None
-    for line in path.read_text().splitlines() if path.exists() else []:
-        if line.startswith(" ") and key:
+def reasons() -> dict[str, str]:
+    """The mutants that are explained: a line each, then the reason, indented."""
+    path, found = Path(__file__).with_name("mutants_equivalent.txt"), {}
+    for line in path.read_text().splitlines():
+        if line.startswith(" "):
             found[key] += line
         elif line and not line.startswith("#"):
             key = line
@@ -346,61 +238,186 @@ def reasons():
     return found
 
 
-def main():
+# --- Building and testing ----------------------------------------------------
+
+
+def run(seconds: int, *command, file_size="unlimited") -> tuple[bool, str]:
+    """Whether a command succeeds within this time, and its output."""
+    limits = (f"trap '' XFSZ; ulimit -f {file_size} -t {seconds} -v 4194304; "
+              'exec "$@"')  # what a mutant could take from the machine
+    process = subprocess.Popen(
+        ["bash", "-c", limits, "bash", *command], stdin=subprocess.DEVNULL,
+        stdout=subprocess.PIPE, stderr=subprocess.STDOUT, start_new_session=True)
+    try:
+        # Ten times as long by the clock, for a machine that has more to do.
+        output = process.communicate(timeout=10 * seconds)[0]
+        return process.returncode == 0, output.decode(errors="replace")
+    except subprocess.TimeoutExpired:
+        os.killpg(process.pid, signal.SIGKILL)
+        process.communicate()
+        return False, "it hangs"
+
+
+def files_of(root: Path) -> set[Path]:
+    """The project's, without what is built and without its history."""
+    return {path.relative_to(root) for top in root.iterdir()
+            if top.name not in ("build", ".git")
+            for path in (top, *top.rglob("*")) if path.is_file()}
+
+
+class Tree:
+    """A copy of the project, and its build."""
+
+    def __init__(self, number: int):
+        """Builds and tests the copy as it is; finds each program's slow tests."""
+        self.root = PLACE / f"tree{number}"
+        self.bring_up_to_date()
+        if not (self.root / "build/build.ninja").exists():
+            subprocess.run(
+                ["cmake", "-S", self.root, "-B", self.root / "build", "-G", "Ninja",
+                 "-DCMAKE_BUILD_TYPE=None", "-DCMAKE_CXX_FLAGS=-O0 -w "
+                 "-D_GLIBCXX_ASSERTIONS -fsanitize=return",
+                 "-DCMAKE_GTEST_DISCOVER_TESTS_DISCOVERY_MODE=PRE_TEST"],
+                check=True, stdout=subprocess.DEVNULL)
+        built, output = self.build("all")
+        if not built:
+            sys.exit(f"{output}\nmutants: the unchanged project does not build")
+        self.slow = {}
+        for path in sorted(self.root.glob("build/tests/*_test")):
+            program = path.name
+            self.slow[program] = []
+            output = self.run_tests(program)[1]
+            self.slow[program] = [
+                test for result, test, took in re.findall(
+                    r"\[ +(OK|FAILED) +\] (\S+) \((\d+) ms\)", output)
+                if result == "FAILED" or int(took) >= SLOW]
+            for slow in (False, True):
+                passed, output = self.run_tests(program, slow=slow)
+                if not passed:
+                    sys.exit(f"{output}\nmutants: {program} fails as it is")
+
+    def bring_up_to_date(self):
+        """What is the same keeps its time, and so its objects."""
+        self.root.mkdir(parents=True, exist_ok=True)
+        wanted = files_of(PROJECT)
+        for file in files_of(self.root) - wanted:
+            (self.root / file).unlink()
+        for file in wanted:
+            source, target = PROJECT / file, self.root / file
+            target.parent.mkdir(parents=True, exist_ok=True)
+            if not target.exists() or target.read_bytes() != source.read_bytes():
+                shutil.copy(source, target)
+
+    def build(self, target: str):
+        return run(900, "ninja", "-C", self.root / "build", "-j2", target)
+
+    def run_tests(self, program: str, *options: str, slow=False):
+        seconds, sign, file_size = (60, "", "unlimited") if slow else (15, "-", 1 << 18)
+        return run(seconds, self.root / "build/tests" / program, *options,
+                   f"--gtest_filter={sign}{':'.join(self.slow[program])}",
+                   file_size=file_size)  # in blocks of 1 kB
+
+    def fate_of(self, mutant: Mutant) -> str:
+        originals = {file: (self.root / file).read_text() for file in mutant.texts}
+        try:
+            for file, text in mutant.texts.items():
+                (self.root / file).write_text(text)
+            return self.tested(next(iter(originals)).split("/")[0] + "_test")
+        finally:
+            for file, text in originals.items():
+                (self.root / file).write_text(text)
+
+    def tested(self, favourite: str) -> str:
+        programs = sorted(self.slow, key=lambda name: (name != favourite, name))
+        for program in programs:
+            if not self.build(f"tests/{program}")[0]:
+                return "not built"
+            if not self.run_tests(program, "--gtest_fail_fast")[0]:
+                return "killed"
+        for program in programs:
+            if self.slow[program] and not self.run_tests(program, slow=True)[0]:
+                return "killed"
+        return "survivor"
+
+
+def fates(trees: list[Tree], mutants: list[Mutant]) -> Iterator[tuple[Mutant, str]]:
+    """Every mutant with its fate."""
+    free = queue.SimpleQueue()
+    for tree in trees:
+        free.put(tree)
+
+    def work(mutant):
+        tree = free.get()
+        try:
+            return mutant, tree.fate_of(mutant)
+        finally:
+            free.put(tree)
+
+    with ThreadPoolExecutor(len(trees)) as pool:
+        yield from pool.map(work, mutants)
+
+
+def figures(counts: Counter) -> str:
+    return (f"{counts.total() - counts['not built']} built and tested "
+            f"({counts['not built']} more do not build), {counts['killed']} killed, "
+            f"{counts['equivalent']} equivalent, "
+            f"{counts['survivor']} unexplained survivors")
+
+
+def main(argv: list[str]) -> int:
     parser = argparse.ArgumentParser(
-        description=__doc__, formatter_class=argparse.RawTextHelpFormatter)
+        prog="mutants", description=__doc__,
+        formatter_class=argparse.RawTextHelpFormatter)
     parser.add_argument("--quick", type=int, metavar="N",
                         help="only N mutants, chosen at random")
     parser.add_argument("--seed", type=int, default=1, metavar="S",
                         help="of that choice (default 1)")
-    parser.add_argument("--only", metavar="TEXT",
+    parser.add_argument("--only", default="", metavar="TEXT",
                         help="only mutants with TEXT in their line of output")
     parser.add_argument("--list", action="store_true",
                         help="print the mutants, build nothing")
-    options = parser.parse_args()
+    options = parser.parse_args(argv)
 
     PLACE.mkdir(parents=True, exist_ok=True)
-    lock = open(PLACE / "lock", "w")
+    lock = open(PLACE / "lock", "w", encoding="ascii")
     try:
         fcntl.flock(lock, fcntl.LOCK_EX | fcntl.LOCK_NB)
     except BlockingIOError:
         sys.exit("mutants: another run is under way")
-    mutants, equivalent = all_mutants(), reasons()
-    for key in set(equivalent) - {mutant.key() for mutant in mutants}:
-        sys.exit(f"mutants: explained, but made by no rule: {key}")
-    if options.only:
-        mutants = [one for one in mutants if options.only in str(one)]
+    mutants, equivalent = [*by_rule(), *by_hand()], reasons()
+    for key in equivalent.keys() - {mutant.key for mutant in mutants}:
+        sys.exit(f"mutants: explained, but there is none: {key}")
+    mutants = [mutant for mutant in mutants if options.only in mutant.shown]
     if options.quick and options.quick < len(mutants):
-        mutants = random.Random(options.seed).sample(mutants, options.quick)
-    mutants.sort(key=lambda one: (FOLDERS.index(one.file.split("/")[0]),
-                                  one.file, one.line))
+        mutants = [mutants[number] for number in sorted(
+            random.Random(options.seed).sample(range(len(mutants)), options.quick))]
     if options.list:
-        print(*mutants, sep="\n")
+        print(*(mutant.shown for mutant in mutants), sep="\n")
         return 0
 
     wanted = min(os.cpu_count() or 1, 1 + len(mutants) // 100)
     trees = [Tree(number) for number in range(wanted)]
-    for tree in trees:
-        tree.prepare()
-    counts, begun = Counter(), time.monotonic()
+    begun, wrong = time.monotonic(), False
+    counts = {"by rule": Counter(), "by hand": Counter()}
     for number, (mutant, fate) in enumerate(fates(trees, mutants), 1):
-        if fate == "survivor" and mutant.key() in equivalent:
+        explained = mutant.key in equivalent
+        if fate == "survivor" and explained:
             fate = "equivalent"
         elif fate == "survivor":
-            print(mutant, flush=True)
-        elif mutant.key() in equivalent:
-            print(f"{mutant}: {fate}, though explained as equivalent")
-            counts["wrong"] += 1
-        counts[fate] += 1
+            print(mutant.shown, flush=True)
+        elif explained:
+            print(f"{mutant.shown}: {fate}, though explained as equivalent")
+        wrong |= fate == "survivor" or explained and fate != "equivalent"
+        counts[mutant.kind][fate] += 1
         if sys.stderr.isatty():
             print(f"\r{number} of {len(mutants)} ", end="", file=sys.stderr)
+    for kind, some in counts.items():
+        print(f"{kind}: {figures(some)}")
     chosen = f", seed {options.seed}" if options.quick else ""
-    print(f"mutants: {len(mutants) - counts['not built']} built and tested "
-          f"({counts['not built']} more do not build), {counts['killed']} "
-          f"killed, {counts['equivalent']} equivalent, {counts['survivor']} "
-          f"unexplained survivors; {time.monotonic() - begun:.0f} s{chosen}")
-    return 1 if counts["survivor"] or counts["wrong"] else 0
+    print(f"mutants: {figures(sum(counts.values(), Counter()))}; "
+          f"{time.monotonic() - begun:.0f} s{chosen}")
+    return int(wrong)
 
 
 if __name__ == "__main__":
-    sys.exit(main())
+    sys.exit(main(sys.argv[1:]))
