@@ -56,8 +56,8 @@ def run(*command, **options):
 
 
 def build_program():
-  if subprocess.run([PROJECT / "scripts" / "packages", "cmake", "ninja-build",
-                     "g++-aarch64-linux-gnu"], check=False).returncode != 0:
+  if subprocess.run([PROJECT / "scripts" / "packages", "build", "arm64"],
+                    check=False).returncode != 0:
     raise Unavailable("no program for arm64 can be built")
   print(f"Building {PROGRAM.relative_to(PROJECT)}", file=sys.stderr, flush=True)
   WORK.mkdir(parents=True, exist_ok=True)

@@ -11,11 +11,10 @@ from collections.abc import Iterator
 from typing import NamedTuple
 
 from lab.carriers.namespace import insist_on_private_device
+from lab.places import BUILD
 from lab.seen import Call
 
-PROJECT = os.path.dirname(os.path.dirname(os.path.abspath(__file__)))
-PROGRAM = os.path.abspath(
-    os.environ.get("MARLIN", f"{PROJECT}/build/release/marlin"))
+PROGRAM = os.path.abspath(os.environ.get("MARLIN", BUILD / "release" / "marlin"))
 SECONDS = 30  # a boot that takes longer hangs
 
 

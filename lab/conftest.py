@@ -12,8 +12,10 @@ import pytest
 sys.path.insert(0, os.path.dirname(os.path.dirname(os.path.abspath(__file__))))
 
 from lab.carriers import namespace  # noqa: E402
+from lab.places import BUILD  # noqa: E402
 
 TALLY = collections.Counter()
+os.environ["PYTEST_CACHE"] = str(BUILD / "prove" / "pytest")  # for pytest.ini
 
 
 def pytest_addoption(parser):
@@ -54,4 +56,5 @@ def pytest_runtest_logreport(report):
 
 def pytest_terminal_summary(terminalreporter):
     for title, number in sorted(TALLY.items()):
-        terminalreporter.line(f"{number:8} {title.removeprefix('test_').replace('_', ' ')}")
+        title = title.removeprefix("test_").replace("_", " ")
+        terminalreporter.line(f"{number:8} {title}")
