@@ -7,30 +7,15 @@ import errno
 import os
 import re
 import signal
-import subprocess
-import sys
 from collections.abc import Iterator
 from typing import NamedTuple
 
 from lab.carriers.namespace import insist_on_private_device
+from lab.places import BUILD
 from lab.seen import Call
 
-PROJECT = os.path.dirname(os.path.dirname(os.path.abspath(__file__)))
-PROGRAM = os.path.abspath(
-    os.environ.get("MARLIN", f"{PROJECT}/build/release/marlin"))
+PROGRAM = os.path.abspath(os.environ.get("MARLIN", BUILD / "release" / "marlin"))
 SECONDS = 30  # a boot that takes longer hangs
-
-
-def build():
-    """Brings the release program up to date, if it is that which is booted; ends the
-    process where it does not build."""
-    if "MARLIN" in os.environ:
-        return
-    for step in ("cmake --preset release", "cmake --build --preset release"):
-        ran = subprocess.run(step.split(), cwd=PROJECT, stdout=subprocess.PIPE,
-                             stderr=subprocess.STDOUT, text=True)
-        if ran.returncode:
-            sys.exit(f"{ran.stdout}\nthe program cannot be built")
 
 
 class Booted(NamedTuple):

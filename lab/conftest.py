@@ -14,8 +14,10 @@ sys.path.insert(0, os.path.dirname(os.path.dirname(os.path.abspath(__file__))))
 
 from lab import devices, properties, test_kills  # noqa: E402
 from lab.carriers import namespace  # noqa: E402
+from lab.places import BUILD  # noqa: E402
 
 TALLY = {}
+os.environ["PYTEST_CACHE"] = str(BUILD / "prove" / "pytest")  # for pytest.ini
 
 
 def added_up(figures):
@@ -48,8 +50,8 @@ def pytest_sessionstart(session):
 
 @pytest.fixture
 def count(request):
-    """count(title, n=1) adds to a figure that is printed at the end; of a "most ..." the
-    greatest counts."""
+    """count(title, n=1) adds to a figure that is printed at the end; of a "most ..."
+    the greatest counts."""
     tally = []
     yield lambda title, n=1: tally.append((title, n))
     request.node.user_properties.extend(added_up(tally).items())
@@ -60,7 +62,8 @@ def pytest_runtest_makereport(item, call):
     report = (yield).get_result()
     if report.failed:
         door = "device --tests" if "lab/emulator/" in report.nodeid else "prove"
-        report.sections.append(("Alone", f"scripts/{door} {shlex.quote(report.nodeid)}"))
+        report.sections.append(
+            ("Alone", f"scripts/{door} {shlex.quote(report.nodeid)}"))
 
 
 def pytest_runtest_logreport(report):

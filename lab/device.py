@@ -29,7 +29,7 @@ def failure(number: int) -> OSError:
 
 
 class Node:
-    """Whatever can stand at a path. `kind` is dir, file, link, fifo, socket or device."""
+    """Whatever can stand at a path. `kind`: dir, file, link, fifo, socket, device."""
 
     def __init__(self, kind: str, mode=0o777, text="", entries=None):
         self.kind = kind

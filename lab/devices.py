@@ -38,7 +38,6 @@ def activation(current: str | None = None, update="2024a.1.0") -> Device:
 # --- Boots that end well ------------------------------------------------------
 
 
-
 @chosen
 def nothing_to_do():
     return sound_device()
@@ -222,7 +221,6 @@ def long_version_file():
 
 
 # --- Boots that end abnormally, as they have to -------------------------------
-
 
 
 @chosen_abnormal

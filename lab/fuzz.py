@@ -15,8 +15,10 @@ import sys
 from concurrent.futures import ThreadPoolExecutor
 from pathlib import Path
 
-PROJECT = Path(__file__).resolve().parents[1]
-BUILD = PROJECT / "build/fuzz"
+from lab.doors import build, need
+from lab.places import BUILD, PROJECT
+
+PLACE = BUILD / "fuzz"
 TARGETS = ["version_text", "icu_file_name", "zoneinfo_link", "first_word"]
 
 # The format is told in the first line of every file; tests/fuzz/replay.cpp reads
@@ -65,7 +67,7 @@ def write_seeds(target: str, seeds: set[bytes]) -> None:
 
 def unpack_seeds(target: str) -> Path:
     """The directory that the engine reads: a file for each seed."""
-    directory = BUILD / "seeds" / target
+    directory = PLACE / "seeds" / target
     shutil.rmtree(directory, ignore_errors=True)
     directory.mkdir(parents=True)
     for number, seed in enumerate(read_seeds(target)):
@@ -73,42 +75,30 @@ def unpack_seeds(target: str) -> Path:
     return directory
 
 
-def build_targets() -> None:
-    packages = PROJECT / "scripts/packages"
-    if subprocess.run([packages, "clang-14", "cmake", "ninja-build"]).returncode != 0:
-        sys.exit(1)
-    for command in (["cmake", "--preset", "fuzz"],
-                    ["cmake", "--build", "--preset", "fuzz", "--", "-j2"]):
-        built = subprocess.run(command, cwd=PROJECT, text=True,
-                               stdout=subprocess.PIPE, stderr=subprocess.STDOUT)
-        if built.returncode != 0:
-            sys.exit(f"{built.stdout}fuzz: the targets do not build")
-
-
 def run_engine(target: str, *arguments: str | Path) -> tuple[bool, str]:
     """Whether the engine ends without a finding, and its output, kept as a log."""
     ended = subprocess.run(
-        [BUILD / f"tests/fuzz/fuzz_{target}", *arguments], text=True, errors="replace",
+        [PLACE / f"tests/fuzz/fuzz_{target}", *arguments], text=True, errors="replace",
         stdout=subprocess.PIPE, stderr=subprocess.STDOUT)
-    (BUILD / "log" / target).write_text(ended.stdout)
+    (PLACE / "log" / target).write_text(ended.stdout)
     return ended.returncode == 0, ended.stdout
 
 
 def fuzz(target: str, seconds: int) -> tuple[bool, int]:
     """Whether there is no finding, and the number of runs."""
-    corpus = BUILD / "corpus" / target
+    corpus = PLACE / "corpus" / target
     corpus.mkdir(parents=True, exist_ok=True)
     clean, output = run_engine(
         target, f"-max_total_time={seconds}", "-max_len=1100", "-timeout=10",
         "-rss_limit_mb=1024", "-print_final_stats=1",
-        f"-artifact_prefix={BUILD}/findings/{target}-", corpus, unpack_seeds(target))
+        f"-artifact_prefix={PLACE}/findings/{target}-", corpus, unpack_seeds(target))
     stated = re.search(r"^stat::number_of_executed_units: *(\d+)", output, re.M)
     runs = int(stated[1]) if stated else 0
     if clean:
         print(f"fuzz: {target}: no finding in {runs} runs, {seconds} s", flush=True)
     else:
         last_lines = "\n".join(output.splitlines()[-60:])
-        print(f"{last_lines}\nfuzz: {target}: a finding, in {BUILD}/findings",
+        print(f"{last_lines}\nfuzz: {target}: a finding, in {PLACE}/findings",
               file=sys.stderr, flush=True)
     return clean, runs
 
@@ -117,7 +107,7 @@ def keep(target: str) -> None:
     """Adds to the seeds what reaches more than they do."""
     directory = unpack_seeds(target)
     merged, output = run_engine(target, "-merge=1", directory,
-                                BUILD / "corpus" / target)
+                                PLACE / "corpus" / target)
     if not merged:
         sys.exit(f"{output}fuzz: {target}: the seeds cannot be merged")
     seeds = {path.read_bytes() for path in directory.iterdir()}
@@ -147,8 +137,9 @@ def main() -> int:
             parser.error(f"there is no target {target}")
 
     for directory in ("findings", "log"):
-        (BUILD / directory).mkdir(parents=True, exist_ok=True)
-    build_targets()
+        (PLACE / directory).mkdir(parents=True, exist_ok=True)
+    need("build", "fuzz")
+    build("fuzz")
     with ThreadPoolExecutor(max_workers=2) as two_at_a_time:
         results = list(two_at_a_time.map(
             lambda target: fuzz(target, arguments.seconds), targets))

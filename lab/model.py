@@ -32,7 +32,7 @@ from errno import EACCES, EEXIST, EINVAL, EISDIR, ENOENT, ENAMETOOLONG, ENOTDIR
 from errno import ENOTEMPTY, ERANGE
 
 from lab import lines
-from lab.device import Device, Node, failure
+from lab.device import Node, failure
 from lab.paths import (DEFAULT_LOCALTIME, DEFAULT_ZONE, DOWNLOADS, FORMER_ZONEINFO,
                        ICUTZ, LEGACY_ICUTZ, LOCALTIME, OLD_ICU, RECORD, SYSTEM_ICU,
                        SYSTEM_ZONEINFO, TZ_LATEST, ZONEINFO)

@@ -32,9 +32,9 @@ from pathlib import Path
 from typing import NamedTuple
 
 from lab.mutants_by_hand import MUTANTS
+from lab.places import BUILD, PROJECT
 
-PROJECT = Path(__file__).resolve().parent.parent
-PLACE = PROJECT / "build/mutants"
+PLACE = BUILD / "mutants"
 FOLDERS = ("support", "dataset", "driver")
 SLOW = 200  # milliseconds; a test that takes longer comes last
 
@@ -225,9 +225,10 @@ def by_hand() -> Iterator[Mutant]:
 
 def reasons() -> dict[str, str]:
     """The mutants that are explained: a line each, then the reason, indented."""
-    path, found = Path(__file__).with_name("mutants_equivalent.txt"), {}
+    path = Path(__file__).with_name("mutants_equivalent.txt")
+    found, key = {}, ""
     for line in path.read_text().splitlines():
-        if line.startswith(" "):
+        if line.startswith(" ") and key:
             found[key] += line
         elif line and not line.startswith("#"):
             key = line

@@ -374,6 +374,7 @@ def of_everything_else(boot):
         yield "localtime is not changed without a word", (
             "C" in boot.lines or "D" in boot.lines)
 
+
 # --- Of a sound device, whatever happened to the boot before ------------------------
 
 OWN = {ZONEINFO, ICUTZ, LOCALTIME, RECORD}

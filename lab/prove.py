@@ -26,10 +26,10 @@ when there is no private device here.
 
 import os
 import subprocess
-import sys
 import time
 
-from lab.boot import PROJECT, build
+from lab.doors import Options, build_program, need
+from lab.places import BUILD, PROJECT
 
 PYTHON = ["/usr/bin/python3", "-B", "-m"]
 TRIALS = {
@@ -54,11 +54,11 @@ def trials(name: str, *arguments: str) -> list[str]:
     workers = min(os.cpu_count() or 1, 8)
     return [*PYTHON, "pytest", "-c", "lab/pytest.ini", f"--rootdir={PROJECT}", "-q",
             "--tx", f"{workers}*popen//python=lab/worker", "--dist", "load",
-            "--maxfail", "10", f"--junit-xml=build/prove/{name}.xml", *arguments]
+            "--maxfail", "10", f"--junit-xml={BUILD}/prove/{name}.xml", *arguments]
 
 
 def prove(name: str, command: list[str]) -> tuple[bool, str]:
-    """Runs a proof, shows its output, and tells whether it holds, with its last line."""
+    """Runs a proof and shows its output: whether it holds, with its last line."""
     print(f"\n--- {name}", flush=True)
     started, last = time.monotonic(), ""
     with subprocess.Popen(command, cwd=PROJECT, stdout=subprocess.PIPE,
@@ -71,33 +71,31 @@ def prove(name: str, command: list[str]) -> tuple[bool, str]:
     return not run.returncode, f"{name:9} {verdict}, after {took:.0f} s: {last}"
 
 
-def main(arguments: list[str]) -> int:
-    if arguments in (["--help"], ["-h"]):
-        print(__doc__, end="")
-        return 0
-    os.makedirs(f"{PROJECT}/build/prove", exist_ok=True)
-    if subprocess.call(["scripts/packages", "build", "prove"], cwd=PROJECT):
-        return 1
-    if arguments and (arguments[0] == "--state" or "::" in arguments[0]):
-        build()
-        files = ["lab/test_states.py"] if arguments[0] == "--state" else []
-        return subprocess.call(
-            trials("alone", "-rs", *files, *arguments), cwd=PROJECT)
-    quick = "--quick" in arguments
-    chosen = [name for name in arguments if name != "--quick"] or [*TRIALS, *OTHERS]
-    for name in chosen:
-        if name not in TRIALS and name not in OTHERS:
-            print(f"prove: there is no proof {name}; see --help", file=sys.stderr)
-            return 2
-    build()
+def main() -> int:
+    options = Options(__doc__)
+    options.add_argument("--quick", action="store_true")
+    options.add_argument("--state")
+    options.add_argument("proofs", nargs="*")
+    chosen = options.parse_args()
+    alone = [name for name in chosen.proofs if "::" in name]
+    if chosen.state:
+        alone = ["lab/test_states.py", "--state", chosen.state]
+    for name in chosen.proofs:
+        if not alone and name not in TRIALS and name not in OTHERS:
+            options.error(f"'{name}' is not a proof")
+    need("build", "private-device", "pytest", "prove")
+    (BUILD / "prove").mkdir(exist_ok=True)
+    build_program()
+    if alone:
+        return subprocess.call(trials("alone", "-rs", *alone), cwd=PROJECT)
     results = [
-        prove(name, trials(name, *["--quick"] * quick,
+        prove(name, trials(name, *["--quick"] * chosen.quick,
                            *(f"lab/{file}" for file in TRIALS[name]))
-              if name in TRIALS else PYTHON + OTHERS[name][quick])
-        for name in chosen]
+              if name in TRIALS else PYTHON + OTHERS[name][chosen.quick])
+        for name in chosen.proofs or [*TRIALS, *OTHERS]]
     print("\n" + "\n".join(figure for _, figure in results))
     return 0 if all(holds for holds, _ in results) else 1
 
 
 if __name__ == "__main__":
-    sys.exit(main(sys.argv[1:]))
+    raise SystemExit(main())

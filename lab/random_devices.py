@@ -7,8 +7,9 @@ from __future__ import annotations
 import random
 
 from lab.device import Device, Node
-from lab.paths import (DEFAULT_LOCALTIME, ICUTZ, LEGACY_ICUTZ, LOCALTIME, OLD_ICU, RECORD,
-                       SYSTEM_ICU, SYSTEM_ZONEINFO, TZ_LATEST, ZONEINFO, update_path)
+from lab.paths import (DEFAULT_LOCALTIME, ICUTZ, LEGACY_ICUTZ, LOCALTIME, OLD_ICU,
+                       RECORD, SYSTEM_ICU, SYSTEM_ZONEINFO, TZ_LATEST, ZONEINFO,
+                       update_path)
 
 # --- The choices -------------------------------------------------------------
 

@@ -23,7 +23,9 @@ import sys
 from lab import boot
 from lab.carriers import archive, namespace
 from lab.device import described
-from lab.paths import ICUTZ, LEGACY_ICUTZ, LOCALTIME, OLD_ICU, RECORD, TZ_LATEST, ZONEINFO
+from lab.paths import (ICUTZ, LEGACY_ICUTZ, LOCALTIME, OLD_ICU, RECORD, TZ_LATEST,
+                       ZONEINFO)
+from lab.places import PROJECT
 
 SHOWN = (ZONEINFO, ICUTZ, LOCALTIME, TZ_LATEST, RECORD, LEGACY_ICUTZ, OLD_ICU)
 
@@ -59,6 +61,7 @@ def rehearse(boots: int) -> int:
 
 def main(arguments: list[str]) -> int:
     boots = "1"
+    from lab import doors  # not on the private device
     if arguments[:1] == ["--boots"] and len(arguments) > 1:
         boots, arguments = arguments[1], arguments[2:]
     if arguments == ["--help"]:
@@ -74,11 +77,12 @@ def main(arguments: list[str]) -> int:
     except archive.NoDevice as reason:
         print(f"simulate: {reason}", file=sys.stderr)
         return 1
-    boot.build()
+    doors.need("build", "private-device")
+    doors.build_program()
     return subprocess.run(
         ["scripts/private-device", "--readable", os.path.dirname(boot.PROGRAM),
          "/usr/bin/python3", "-B", "-m", "lab.simulate", "--inside", boots],
-        input=pickle.dumps(device), cwd=boot.PROJECT,
+        input=pickle.dumps(device), cwd=PROJECT,
         env=dict(os.environ, MARLIN=boot.PROGRAM)).returncode
 
 

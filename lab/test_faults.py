@@ -6,11 +6,10 @@ with memory refused wherever the program asks the system for more."""
 
 from errno import (EACCES, EAGAIN, EBUSY, EDQUOT, EEXIST, EFBIG, EINTR, EINVAL, EIO,
                    EISDIR, ELOOP, EMFILE, ENAMETOOLONG, ENFILE, ENODEV, ENOENT, ENOMEM,
-                   ENOSPC, ENOTDIR, ENOTEMPTY, ENXIO, EOVERFLOW, EPERM, EROFS,
-                   ETXTBSY, errorcode)
+                   ENOSPC, ENOTDIR, ENOTEMPTY, ENXIO, EOVERFLOW, EPERM, EROFS, ETXTBSY)
 
 from lab import boot
-from lab.conditions import (Condition, Fails, FailsForGood, WritesInPart,
+from lab.conditions import (Fails, FailsForGood, WritesInPart,
                             storage_conditions)
 from lab.devices import CHOSEN
 from lab.trial import trial, undisturbed
@@ -75,7 +74,8 @@ def pytest_generate_tests(metafunc):
     table = [(name, condition) for test, name, condition
              in disturbances(metafunc.config.getoption("quick")) if test in kind]
     if "condition" in metafunc.fixturenames:
-        metafunc.parametrize("name, condition", table, ids=[f"{n}: {c.name}" for n, c in table])
+        metafunc.parametrize("name, condition", table,
+                             ids=[f"{n}: {c.name}" for n, c in table])
 
 
 def test_a_call_that_fails(name, condition):

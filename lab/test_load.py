@@ -12,7 +12,6 @@ import signal
 import stat
 import subprocess
 import sys
-from functools import partial
 from typing import NamedTuple
 
 import pytest
@@ -105,12 +104,13 @@ class Load:
             fail(what, found, {})
 
     def grow(self, what, make, size, bytes_each):
-        """Boots with an eighth of a size and with all of it, each unit of which may take
-        so much memory; `what` and `make` are told the size. The boots that follow are
-        all alike, because the device has settled."""
+        """Boots with an eighth of a size and with all of it, each unit of which may
+        take so much memory; `what` and `make` are told the size. The boots that follow
+        are all alike, because the device has settled."""
 
         def least_cost_each(number, enough):
-            self.boot(what(number), make(number), USUAL_KIB + number * bytes_each // 1024)
+            self.boot(what(number), make(number),
+                      USUAL_KIB + number * bytes_each // 1024)
             least = math.inf
             for _ in range(RUNS):
                 least = min(least, measured_boot().milliseconds / number)
@@ -123,8 +123,8 @@ class Load:
         self.count("growths under load")
         self.count("most growth under load, in percent", round(factor * 100))
         if factor > DEARER:
-            fail(what(size), [f"each costs {factor:.2f} times as much as with an eighth "
-                              f"of them, at most {DEARER}"], {})
+            fail(what(size), [f"each costs {factor:.2f} times as much as with an "
+                              f"eighth of them, at most {DEARER}"], {})
 
 
 @pytest.fixture
@@ -242,11 +242,11 @@ def test_a_long_link_target(load, path, start, end, without, length):
     load.boot(f"{path} with a target of {length} bytes", device)
 
 
-# --- Files without an end --------------------------------------------------------------
+# --- Files without an end ----------------------------------------------------------
 
 
-@pytest.mark.parametrize("target", ["/dev/zero", "/dev/urandom", "/dev/null", "/dev/full",
-                                    "/dev/tty", "/dev/ptmx"])
+@pytest.mark.parametrize("target", ["/dev/zero", "/dev/urandom", "/dev/null",
+                                    "/dev/full", "/dev/tty", "/dev/ptmx"])
 @pytest.mark.parametrize("path", [
     f"{SYSTEM_ZONEINFO}/+VERSION", f"{SYSTEM_ICU}/icutzformat.txt",
     f"{UPDATE}/zoneinfo/+VERSION", RECORD])

@@ -47,8 +47,8 @@ def a_walk_is_not_started(refused, made):
 
 def a_directory_is_not_opened(refused, made):
     """After it was examined; the rest is as if that had failed."""
-    refused.kernel.fault = (
-        lambda number, name, path: ENOMEM if (number, name) == (made, "fstat") else None)
+    refused.kernel.fault = lambda number, name, path: (
+        ENOMEM if (number, name) == (made, "fstat") else None)
 
 
 def a_listing_is_given_up(refused, made):

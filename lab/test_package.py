@@ -20,8 +20,9 @@ from typing import NamedTuple
 
 import pytest
 
-PROJECT = Path(__file__).resolve().parent.parent
-WORK = PROJECT / "build/packaging"
+from lab.places import BUILD, PROJECT
+
+WORK = BUILD / "packaging"
 ARCHITECTURES = {"release": "amd64", "arm64-release": "arm64"}  # by preset
 
 CONTENT = dict(reversed(line.split(maxsplit=1)) for line in """
@@ -156,7 +157,8 @@ def test_lintian_finds_no_error(package):
 
 def test_it_holds_what_it_should(package):
     """And all of it is root's, for others to read, of the day of the release."""
-    day = found(r"^## \S+ - ([\d-]+)(?:, unreleased)?$", (PROJECT / "CHANGELOG.md").read_text())
+    day = found(r"^## \S+ - ([\d-]+)(?:, unreleased)?$",
+                (PROJECT / "CHANGELOG.md").read_text())
     time = datetime.fromisoformat(f"{day}T00:00:00+00:00").timestamp()
     packed = subprocess.run(["dpkg-deb", "--fsys-tarfile", package.file], check=True,
                             stdout=subprocess.PIPE).stdout

@@ -10,7 +10,6 @@ from hypothesis import HealthCheck, given, settings
 from hypothesis import strategies as st
 
 from lab import properties
-from lab.carriers import namespace
 from lab.device import Device
 from lab.random_devices import compose
 from lab.trial import fail, trial

@@ -6,7 +6,6 @@ from __future__ import annotations
 
 import functools
 import os
-import re
 
 import pytest
 
@@ -153,4 +152,3 @@ def call_differences(outcome: model.Outcome, calls: list[Call]) -> list[str]:
     if injected != outcome.failed:
         found.append(f"failed were the calls {injected}, not {outcome.failed}")
     return found
-

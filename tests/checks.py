@@ -89,7 +89,7 @@ def deliberate() -> Iterator[str]:
                     yield f"{path}: no test pins: {oddity.strip()}"
                 in_product.append(f"{path} {' '.join(sorted(pins))}")
 
-    # In each paragraph of the first part: "**TITLE** ... Site: FILE. Tests: NAME, NAME."
+    # In each paragraph of the first part: "**TITLE** Site: FILE. Tests: NAME, NAME."
     text = Path("docs/decisions.md").read_text()
     part = re.search(r"^## Deliberate behaviour\n(.*?)^## ", text, re.M | re.S)[1]
     in_document = []
@@ -167,7 +167,8 @@ def manual_pages() -> Iterator[str]:
     for page in pages:
         if re.findall(r"^\.Os marlin (.*)", page.read_text(), re.M) != [version]:
             yield f"{page} is not of version {version}"
-    newest = re.search(r"^## (\S+) - [\d-]+(?:, unreleased)?$", Path("CHANGELOG.md").read_text(), re.M)[1]
+    newest = re.search(r"^## (\S+) - [\d-]+(?:, unreleased)?$",
+                       Path("CHANGELOG.md").read_text(), re.M)[1]
     if newest != version:
         yield f"the newest release in CHANGELOG.md is {newest}, not {version}"
 

@@ -33,13 +33,12 @@ from collections.abc import Iterator
 from pathlib import Path
 
 from lab.bench.measure import SCENES
+from lab.doors import need
+from lab.places import BUILD
 
-BUILDS = "build/bench"
+BUILDS = f"{BUILD}/bench"
 PROGRAMS = f"{BUILDS}/static/lab/bench"
 FLOOR = f"{PROGRAMS}/floor_SCENE"
-PACKAGES = "binutils bubblewrap cmake g++ gcc ninja-build strace valgrind"
-MORE_PACKAGES = {"table": "hyperfine", "growth": "gnuplot-nox",
-                 "parsers": "libbenchmark-dev"}
 BASELINE = Path("lab/bench/baseline.txt")
 PICTURE = Path("docs/growth.svg")
 
@@ -257,7 +256,8 @@ HARDENING = {
     "separate code": f"{FIXED} {SEPARATE}",
     "stack clash protection": f"{FIXED} {CLASH}",
     "_GLIBCXX_ASSERTIONS": f"{FIXED} {ASSERTIONS}",
-    "all of these": f"{PACKED} {GUARD} {FORTIFY} {RELRO} {SEPARATE} {CLASH} {ASSERTIONS}"}
+    "all of these": " ".join([PACKED, GUARD, FORTIFY, RELRO, SEPARATE, CLASH,
+                              ASSERTIONS])}
 
 
 def hardening():
@@ -286,9 +286,9 @@ def main():
     options = parser.parse_args()
     if not re.fullmatch("[1-9][0-9]{0,3}", options.rounds):
         parser.error("--rounds needs a number")
-    more = MORE_PACKAGES.get(options.job.__name__, "")
-    if subprocess.call(["scripts/packages", *PACKAGES.split(), *more.split()]) != 0:
-        sys.exit(1)
+    name = options.job.__name__
+    more = [f"bench-{name}"] if name in ("table", "growth", "parsers") else []
+    need("build", "private-device", "bench", *more)
     options.job(*[options.rounds] * (options.job is table))
 
 

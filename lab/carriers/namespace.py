@@ -93,7 +93,8 @@ def build_below(path: str, node: Node, exists=False):
     elif node.kind == "link":
         os.symlink(encoded(node.text), raw)
     else:
-        os.mknod(raw, {"fifo": stat.S_IFIFO, "socket": stat.S_IFSOCK}[node.kind] | 0o600)
+        kinds = {"fifo": stat.S_IFIFO, "socket": stat.S_IFSOCK}
+        os.mknod(raw, kinds[node.kind] | 0o600)
         os.chmod(raw, node.mode)
 
 

@@ -12,15 +12,14 @@ Exit status: 0 when every scene ended as it claims, otherwise 1; 2 for bad use;
 77 when there can be no private device.
 """
 
-import fcntl
 import os
 import subprocess
 import sys
 
 from lab import boot
 from lab.demo import data
-
-PACKAGES = "binutils cmake g++ icu-devtools libc-bin libicu-dev ninja-build tzdata"
+from lab.doors import build_program, locked, need, say
+from lab.places import PROJECT
 
 
 def main() -> int:
@@ -33,23 +32,20 @@ def main() -> int:
         case _:
             print("demo: only --facts is understood; see --help", file=sys.stderr)
             return 2
-    os.chdir(boot.PROJECT)
-    for command in (["scripts/packages", "bubblewrap"],
-                    ["scripts/private-device", "true"],
-                    ["scripts/packages", *PACKAGES.split()]):
-        if status := subprocess.call(command):
-            return status
-    os.makedirs("build/demo", exist_ok=True)
-    # Two demonstrations at once would build and prepare the same.
-    with open("build/demo/lock", "w", encoding="ascii") as lock:
-        fcntl.flock(lock, fcntl.LOCK_EX)
-        print("Building build/release/marlin", file=sys.stderr)
-        boot.build()
-        print(f"Preparing the data in {data.TARGET}", file=sys.stderr)
+    os.chdir(PROJECT)
+    need("private-device")
+    if status := subprocess.call(["scripts/private-device", "--probe"]):
+        return status
+    need("build", "demo")
+    build_program()
+    # Two demonstrations at once would prepare the same.
+    with locked(data.TARGET.parent):
+        say("Preparing the real time-zone data (about 5 s)")
         data.prepare()
     os.environ["MARLIN"] = boot.PROGRAM
     os.execv("scripts/private-device", [
         "private-device", "--readable", os.path.dirname(boot.PROGRAM),
+        "--readable", str(data.TARGET),
         "/usr/bin/python3", "-B", "-m", "lab.demo.story", *sys.argv[1:]])
 
 

@@ -19,7 +19,9 @@ import tempfile
 from pathlib import Path
 from types import SimpleNamespace
 
-TARGET = Path("build/demo/data")  # below the project's folder
+from lab.places import BUILD
+
+TARGET = BUILD / "demo/data"
 RULES = Path("/usr/share/zoneinfo/tzdata.zi")
 # Lisbon's last line.
 LISBON = r"^(Z Europe/Lisbon .*\n(?:[^RLZ].*\n)*?0 (\S+) WE%sT)$"

@@ -13,7 +13,7 @@ import subprocess
 import sys
 from collections.abc import Iterator
 
-from lab.boot import PROJECT
+from lab.places import PROJECT
 
 TITLE = "What scripts/demo shows"
 HEADINGS = ("── 3  ", "── In short")

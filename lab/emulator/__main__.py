@@ -15,6 +15,7 @@ import sys
 import pytest
 
 from lab.emulator import boot_cost, parts, power_cuts, show
+from lab.places import PROJECT
 
 
 def number_of_cuts(text: str) -> int:
@@ -43,7 +44,7 @@ def main() -> int:
         parts.prepare()
         if options.tests is not None:
             return pytest.main([
-                "-c", "lab/pytest.ini", f"--rootdir={parts.PROJECT}",
+                "-c", "lab/pytest.ini", f"--rootdir={PROJECT}",
                 "-n", "2", "--dist", "loadfile", *["--quick"] * options.quick,
                 *(options.tests or ["lab/emulator"])])
         if options.shell:

@@ -11,15 +11,13 @@ import subprocess
 import sys
 from pathlib import Path
 
-from lab import boot
 from lab.carriers.image import run
+from lab.doors import build
+from lab.places import BUILD, PROJECT
 
-PROJECT = Path(boot.PROJECT)
-WORK = PROJECT / "build" / "emulator"
+WORK = BUILD / "emulator"
 PARTS = WORK / "packages"
-PROGRAM = PROJECT / "build" / "arm64-release" / "marlin"
-PACKAGES = """cmake e2fsprogs g++-aarch64-linux-gnu libc-bin ninja-build
-  qemu-system-arm""".split()
+PROGRAM = BUILD / "arm64-release" / "marlin"
 
 
 class Unavailable(Exception):
@@ -28,15 +26,12 @@ class Unavailable(Exception):
 
 def prepare():
     """Builds and fetches what is missing; or raises Unavailable."""
-    if subprocess.call([PROJECT / "scripts/packages", *PACKAGES]):
+    if subprocess.call([PROJECT / "scripts/packages", "build", "arm64", "device"]):
         raise Unavailable("packages are missing")
     WORK.mkdir(parents=True, exist_ok=True)
     with open(WORK / "lock", "w", encoding="ascii") as lock:
         fcntl.flock(lock, fcntl.LOCK_EX)
-        print(f"Building {PROGRAM.relative_to(PROJECT)}", file=sys.stderr, flush=True)
-        if not (PROGRAM.parent / "build.ninja").is_file():
-            run("cmake", "--preset", "arm64-release", cwd=PROJECT)
-        run("cmake", "--build", "--preset", "arm64-release", cwd=PROJECT)
+        build("arm64-release")
         if not PARTS.is_dir():
             print("Fetching a kernel and busybox", file=sys.stderr, flush=True)
             try:

@@ -1,0 +1,127 @@
+# SPDX-License-Identifier: BSD-2-Clause
+"""What the doors in scripts/ have in common: options, one line for bad use, packages,
+one build at a time, and a line before a silent wait."""
+
+import argparse
+import contextlib
+import fcntl
+import os
+import re
+import signal
+import subprocess
+import sys
+from collections.abc import Iterator
+from pathlib import Path
+
+from lab.places import BUILD, PROJECT, shown
+
+# lab/coverage.py, say, or lab/bench/__main__.py.
+NAME = next((name for name in reversed(Path(sys.argv[0]).with_suffix("").parts)
+             if name != "__main__"), "")
+# An interrupted program just ends, as does one that nobody reads.
+signal.signal(signal.SIGINT, signal.SIG_DFL)
+signal.signal(signal.SIGPIPE, signal.SIG_DFL)
+
+# CMake fails on a path with one of these, or Ninja takes every file below it for out of
+# date, as with the last four.
+ODD = re.compile(r"""[\x00-\x1f"#*;<>?\\|]|\$\{|['&^`]""")
+
+
+def say(text: str):
+    print(text, file=sys.stderr, flush=True)
+
+
+def stop(status: int, text: str):
+    say(f"{NAME}: {text}")
+    sys.exit(status)
+
+
+class Options(argparse.ArgumentParser):
+    """Command-line options; `usage`, if it is given, is all that --help prints."""
+
+    def __init__(self, usage="", **options):
+        super().__init__(prog=f"scripts/{NAME}", allow_abbrev=False, **options)
+        self.text = usage
+
+    def format_help(self):
+        return self.text or super().format_help()
+
+    def error(self, message):
+        stop(2, f"{message}; see --help")
+
+
+def need(*purposes: str):
+    """Has the packages for these purposes installed, or ends the program; as it does
+    first of all where nothing can be built."""
+    for place in (PROJECT, BUILD):
+        if odd := ODD.search(str(place)):
+            stop(1, f"a path with {odd[0]!r} cannot be built in: {str(place)!r}")
+    with contextlib.suppress(OSError):
+        BUILD.mkdir(parents=True, exist_ok=True)
+    if not os.access(BUILD, os.W_OK):
+        stop(1, f"{BUILD} cannot be written; MARLIN_BUILD can name a folder elsewhere")
+    if status := subprocess.run([PROJECT / "scripts/packages", *purposes]).returncode:
+        sys.exit(status)
+
+
+@contextlib.contextmanager
+def locked(folder: Path) -> Iterator[None]:
+    """Has a build folder to itself; says so when it has to wait."""
+    folder.mkdir(parents=True, exist_ok=True)
+    with open(folder / "lock", "w") as lock:
+        try:
+            fcntl.flock(lock, fcntl.LOCK_EX | fcntl.LOCK_NB)
+        except BlockingIOError:
+            say(f"Waiting: {shown(folder)} is in use")
+            fcntl.flock(lock, fcntl.LOCK_EX)
+        yield
+
+
+def quietly(log: Path, *command, check=True, **options) -> int:
+    """Runs a command with its output in a file, the end of which is shown when it
+    fails; then the program ends, unless it is not to check."""
+    with open(log, "wb") as output:
+        status = subprocess.run(command, stdout=output, stderr=output, cwd=PROJECT,
+                                **options).returncode
+    if status and check:
+        show_end(log)
+        stop(1, f"failed: {' '.join(map(str, command))}")
+    return status
+
+
+def show_end(log: Path):
+    lines = log.read_text(errors="replace").splitlines()
+    say("\n".join(line[:400] for line in lines[-100:]))
+
+
+def configure(preset: str, *options: str, folder: Path | None = None) -> Path:
+    """Has CMake prepare the preset's build folder, or another; returns it."""
+    folder = folder or BUILD / preset
+    folder.mkdir(parents=True, exist_ok=True)
+    quietly(folder / "build.log", "cmake", "--preset", preset, "-B", folder, *options)
+    return folder
+
+
+def build(preset: str, *options: str, folder: Path | None = None,
+          targets: tuple[str, ...] = ()) -> Path:
+    """Builds with a preset and more options of CMake's. The output is shown on a
+    terminal, where it moves, and when it fails."""
+    folder = configure(preset, *options, folder=folder)
+    command = ["cmake", "--build", folder, *(["--target", *targets] if targets else [])]
+    plan = subprocess.run([*command, "--", "-n"], capture_output=True, text=True)
+    if steps := re.findall(r"^\[\d+/(\d+)\]", plan.stdout, re.MULTILINE)[-1:]:
+        seconds = 10 + 2 * int(steps[0]) // (os.cpu_count() or 1)
+        say(f"Building {shown(folder)} ({steps[0]} steps, about {seconds} s)")
+    if sys.stdout.isatty():
+        if subprocess.run(command).returncode:
+            stop(1, f"the project does not build in {shown(folder)}")
+    else:
+        quietly(folder / "build.log", *command)
+    return folder
+
+
+def build_program():
+    """Brings the release program up to date, unless MARLIN names another."""
+    if "MARLIN" not in os.environ:
+        with locked(BUILD / "release"):
+            build("release")

@@ -1,0 +1,30 @@
+# SPDX-License-Identifier: BSD-2-Clause
+"""usage: scripts/package [release | arm64-release]
+
+Makes the Debian package of a release preset, or of both, and checks it and the boot
+unit in it: lab/test_package.py. The packages stay in build/packaging. Installs what
+that takes, as root.
+
+Exit status: 0 when all checks passed, another when one failed, 2 for bad use.
+"""
+
+import subprocess
+
+from lab.doors import Options, need
+from lab.places import PROJECT
+
+
+def main() -> int:
+    options = Options(__doc__)
+    options.add_argument("preset", nargs="?", choices=["release", "arm64-release"])
+    chosen = options.parse_args().preset
+    need("build", "private-device", "test", "pytest", "package", "arm64")
+    presets = [chosen] if chosen else ["release", "arm64-release"]
+    return subprocess.call(
+        ["/usr/bin/python3", "-B", "-m", "pytest", "-c", "lab/pytest.ini",
+         f"--rootdir={PROJECT}", "-v", *(f"--preset={name}" for name in presets),
+         "lab/test_package.py"], cwd=PROJECT)
+
+
+if __name__ == "__main__":
+    raise SystemExit(main())
