@@ -96,6 +96,6 @@ def pytest_sessionfinish(session):
 def pytest_terminal_summary(terminalreporter):
     for title in never_seen():
         terminalreporter.line(f"FAILED: never seen: {title}")
-    terminalreporter.line("; ".join(
+    terminalreporter.line("figures: " + "; ".join(
         f"{title.removeprefix('test_').replace('_', ' ')}: {number}"
         for title, number in TALLY.items()))

@@ -60,15 +60,17 @@ def trials(name: str, *arguments: str) -> list[str]:
 def prove(name: str, command: list[str]) -> tuple[bool, str]:
     """Runs a proof and shows its output: whether it holds, with its last line."""
     print(f"\n--- {name}", flush=True)
-    started, last = time.monotonic(), ""
+    started, last, figures = time.monotonic(), "", ""
     with subprocess.Popen(command, cwd=PROJECT, stdout=subprocess.PIPE,
                           stderr=subprocess.STDOUT, text=True, errors="replace") as run:
         for line in run.stdout:
             print(line, end="", flush=True)
             last = line.strip() or last
+            if line.startswith("figures: "):
+                figures = line.removeprefix("figures: ").strip() + "; "
     verdict = "does not hold" if run.returncode else "holds"
     took = time.monotonic() - started
-    return not run.returncode, f"{name:9} {verdict}, after {took:.0f} s: {last}"
+    return not run.returncode, f"{name:9} {verdict}, after {took:.0f} s: {figures}{last}"
 
 
 def main() -> int:

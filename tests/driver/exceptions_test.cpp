@@ -38,6 +38,9 @@ std::string thrower;
 int countdown = 0;
 std::function<void()> raise;
 
+// The data sets that were compared: receivers, arguments.
+std::vector<std::pair<std::string, std::string>> compared;
+
 void called(const std::string& function) {
   if (function == thrower && --countdown == 0) raise();
 }
@@ -59,6 +62,7 @@ std::optional<mln_version_groups> match_version_text(std::string_view text) {
 bool compatible_components(const component_list& receivers,
                            const component_list& others) {
   called("compatible_components");
+  compared.emplace_back(receivers[1]->dataset_path, others[1]->dataset_path);
   return receivers[1]->compatible_schema(*others[1]);
 }
 
@@ -161,6 +165,19 @@ TEST_F(Exceptions, FromParsingAVersionTakeTheLastResort) {
 TEST_F(Exceptions, FromComparingSchemasTakeTheLastResort) {
   EXPECT_EQ(sweep("compatible_components", "", expect_last_resort), 2);
   EXPECT_EQ(sweep("compatible_components", "2022a.1.0", expect_last_resort), 2);
+}
+
+// The components of the set in question are asked about the system's, never the
+// other way around, and never about those of the set in use.
+TEST_F(Exceptions, AskTheSetInQuestionAboutTheSystems) {
+  install_update("2023d.1.0", "44l");
+  point_links_at_update("2023d.1.0");
+  compared.clear();
+  EXPECT_THAT(printed_by(run_startup_pass), no_lines());
+  const std::string system;
+  EXPECT_THAT(compared, ::testing::ElementsAre(
+                            ::testing::Pair(update("2023d.1.0"), system),
+                            ::testing::Pair(update("2024a.1.0"), system)));
 }
 
 TEST_F(Exceptions, FromTheRecordTakeTheLastResort) {

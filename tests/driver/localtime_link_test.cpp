@@ -56,6 +56,7 @@ TEST_F(LocaltimeLinkRepair, LeavesALinkToAMissingZoneAlone) {
 TEST_F(LocaltimeLinkRepair, AcceptsThePrefixWithoutASeparator) {
   leaves_alone("/var/db/timezone/zoneinfo");
   leaves_alone("/var/db/timezone/zoneinfo2/Europe/Paris");
+  leaves_alone("/var/db/timezone/zoneinfo/../tz/x/zoneinfo/Europe/Paris");
 }
 
 TEST_F(LocaltimeLinkRepair, CorrectsALinkIntoTheFormerTree) {
@@ -121,6 +122,7 @@ TEST_F(LocaltimeLinkRepair, ResetsARelativeLink) {
 TEST_F(LocaltimeLinkRepair, ResetsALinkToAnywhereElse) {
   resets("/");
   resets("/usr/share/zoneinf");
+  resets("/usr/share/zoneinfX/Europe/Paris");
   resets("/usr/share/Zoneinfo/Europe/Paris");
   resets("/var/db/timezone/zoneinf");
   resets("/VAR/db/timezone/zoneinfo/Europe/Paris");
