@@ -95,6 +95,7 @@ class Exceptions : public DeviceTest {
  protected:
   void SetUp() override {
     DeviceTest::SetUp();
+    thrower.clear();
     install_system("2023c", "44l");
     install_update("2022a.1.0", "45l");
     install_update("2024a.1.0", "44l");

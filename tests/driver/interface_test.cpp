@@ -98,7 +98,25 @@ TEST_F(Interface, OfComponents) {
   EXPECT_EQ(link_at(icutz), update("2024a.1.0") + "/icutz");
 }
 
+struct without_activate : mln_dataset_component {
+  bool compatible_schema(const mln_dataset_component&) const override {
+    return true;
+  }
+};
+struct without_compatible_schema : mln_dataset_component {
+  void activate() const override {}
+};
+struct with_a_third : mln_dataset_component {
+  virtual void third() const = 0;
+};
+
+TEST_F(Interface, OfTheVirtualOperationsIsPure) {
+  static_assert(std::is_abstract_v<without_activate>);
+  static_assert(std::is_abstract_v<without_compatible_schema>);
+}
+
 TEST_F(Interface, OfTheVirtualOperationsHasSlotsInTheirOrder) {
+  EXPECT_EQ(slot_of(&with_a_third::third), 2) << "there are more than two";
   EXPECT_EQ(slot_of(&mln_dataset_component::compatible_schema), 0);
   EXPECT_EQ(slot_of(&mln_dataset_component::activate), 1);
 }
