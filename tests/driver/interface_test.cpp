@@ -98,16 +98,28 @@ TEST_F(Interface, OfComponents) {
   EXPECT_EQ(link_at(icutz), update("2024a.1.0") + "/icutz");
 }
 
-struct without_activate : mln_dataset_component {
+class without_activate : public mln_dataset_component {
+ public:
   bool compatible_schema(const mln_dataset_component&) const override {
     return true;
   }
+
+ protected:
+  ~without_activate() = default;
 };
-struct without_compatible_schema : mln_dataset_component {
+class without_compatible_schema : public mln_dataset_component {
+ public:
   void activate() const override {}
+
+ protected:
+  ~without_compatible_schema() = default;
 };
-struct with_a_third : mln_dataset_component {
+class with_a_third : public mln_dataset_component {
+ public:
   virtual void third() const = 0;
+
+ protected:
+  ~with_a_third() = default;
 };
 
 TEST_F(Interface, OfTheVirtualOperationsIsPure) {
