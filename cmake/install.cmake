@@ -23,9 +23,10 @@ if(MARLIN_TMPFILES_DIR)
   install(FILES packaging/marlin.conf DESTINATION ${MARLIN_TMPFILES_DIR})
 endif()
 
-install(FILES README.md CHANGELOG.md LICENSE
+install(FILES README.md CHANGELOG.md LICENSE SECURITY.md
         DESTINATION ${CMAKE_INSTALL_DOCDIR})
 install(FILES docs/architecture.md docs/decisions.md docs/integration.md
-              docs/demo.svg DESTINATION ${CMAKE_INSTALL_DOCDIR}/docs)
+              docs/proofs.md docs/demo.svg docs/growth.svg
+        DESTINATION ${CMAKE_INSTALL_DOCDIR}/docs)
 install(DIRECTORY packaging/examples DESTINATION ${CMAKE_INSTALL_DOCDIR}
         USE_SOURCE_PERMISSIONS)

@@ -31,12 +31,15 @@ CONTENT = dict(reversed(line.split(maxsplit=1)) for line in """
     644 /usr/lib/tmpfiles.d/marlin.conf
     755 /usr/libexec/marlin
     644 /usr/share/doc/marlin/README.md
+    644 /usr/share/doc/marlin/SECURITY.md
     644 /usr/share/doc/marlin/changelog.gz
     644 /usr/share/doc/marlin/copyright
     644 /usr/share/doc/marlin/docs/architecture.md
     644 /usr/share/doc/marlin/docs/decisions.md
     644 /usr/share/doc/marlin/docs/demo.svg
+    644 /usr/share/doc/marlin/docs/growth.svg
     644 /usr/share/doc/marlin/docs/integration.md
+    644 /usr/share/doc/marlin/docs/proofs.md
     755 /usr/share/doc/marlin/examples/init-script
     644 /usr/share/doc/marlin/examples/inittab
     644 /usr/share/lintian/overrides/marlin
