@@ -79,7 +79,7 @@ def test_states(seed, states, count):
                count)
 
 
-@settings(deadline=None, database=None, print_blob=True,
+@settings(deadline=None, print_blob=True,
           suppress_health_check=list(HealthCheck))
 @given(source=st.randoms(use_true_random=False))
 def test_a_device_that_can_be_shrunk(source):

@@ -131,6 +131,7 @@ TEST_F(Interface, OfTheVirtualOperationsHasSlotsInTheirOrder) {
   EXPECT_EQ(slot_of(&with_a_third::third), 2) << "there are more than two";
   EXPECT_EQ(slot_of(&mln_dataset_component::compatible_schema), 0);
   EXPECT_EQ(slot_of(&mln_dataset_component::activate), 1);
+  EXPECT_GT(slot_of(&mln_zoneinfo::version), 99) << "an address, not a slot";
 }
 
 // A second reading leaves what a first one found where now there is nothing.
