@@ -38,7 +38,8 @@ def pytest_addoption(parser):
 
 def pytest_configure(config):
     hypothesis.settings.register_profile(
-        "run", max_examples=300 if config.getoption("quick") else 3000)
+        "run", max_examples=300 if config.getoption("quick") else 3000, deadline=None,
+        database=None, suppress_health_check=list(hypothesis.HealthCheck))
     hypothesis.settings.load_profile("run")
 
 

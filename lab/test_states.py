@@ -6,7 +6,7 @@ even an inode, except for the link that a last resort makes every time."""
 import itertools
 import random
 
-from hypothesis import HealthCheck, given, settings
+from hypothesis import given
 from hypothesis import strategies as st
 
 from lab import properties
@@ -79,8 +79,6 @@ def test_states(seed, states, count):
                count)
 
 
-@settings(deadline=None, print_blob=True,
-          suppress_health_check=list(HealthCheck))
 @given(source=st.randoms(use_true_random=False))
 def test_a_device_that_can_be_shrunk(source):
     """The same devices, drawn so that one that fails is made as small as it can be."""
