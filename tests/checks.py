@@ -1,4 +1,3 @@
-#!/usr/bin/python3 -B
 # SPDX-License-Identifier: BSD-2-Clause
 """Checks of the texts that no compiler reads: the rules of the source, the deliberate
 oddities, the documents, the manual pages.

@@ -1,4 +1,3 @@
-#!/usr/bin/python3 -B
 # SPDX-License-Identifier: BSD-2-Clause
 """usage: tests/imports.py NM FILE...
 
