@@ -4,7 +4,7 @@
 
 Measures marlin, as it ships, inside a private device. Without an option: beside the
 least that its system calls can cost ("the floor", lab/bench/floor.c), its own dynamic
-builds and a shell script that does the same job (lab/bench/boot.sh), in one table, from
+builds and a shell script that does the same job (lab/bench/boot), in one table, from
 user-space instructions to the size of the file.
 
   --rounds N    how many pairs of timings a ratio is taken from (default 11)
@@ -97,7 +97,7 @@ def table(rounds: str):
         "only libc dynamic": built(
             "libc", "-DMARLIN_STATIC=OFF",
             "-DCMAKE_EXE_LINKER_FLAGS=-static-libstdc++ -static-libgcc"),
-        "shell script": "lab/bench/boot.sh"}
+        "shell script": "lab/bench/boot"}
     counts = measured("counts", *programs.values())
     walls = measured("wall", rounds, *programs.values())
     rows = []
