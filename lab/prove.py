@@ -70,7 +70,8 @@ def prove(name: str, command: list[str]) -> tuple[bool, str]:
                 figures = line.removeprefix("figures: ").strip() + "; "
     verdict = "does not hold" if run.returncode else "holds"
     took = time.monotonic() - started
-    return not run.returncode, f"{name:9} {verdict}, after {took:.0f} s: {figures}{last}"
+    return (not run.returncode,
+            f"{name:9} {verdict}, after {took:.0f} s: {figures}{last}")
 
 
 def main() -> int:
