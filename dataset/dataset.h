@@ -27,7 +27,7 @@ class mln_dataset {
   mln_dataset& operator=(const mln_dataset&) = delete;
 
   // Builds the components and sets `version_string` and `version`; called by
-  // the constructors, whose messages and exceptions are its own.
+  // the constructors. Prints and throws what is said there.
   void create_components();
 
   // Whether every component of this data set accepts its counterpart in

@@ -138,7 +138,8 @@ class WritesInPart(Condition):
 
 class Killed(Condition):
     """Killed before a call takes effect. `killed_before` counts calls of the pass,
-    `call` and `turn` are the machine's: one name, or several with "?"."""
+    `call` is the machine's name of the call, or several names with "?", and `turn` its
+    number among those calls."""
 
     def __init__(self, call: str, turn: int, killed_before: int):
         self.call, self.turn, self.killed_before = call, turn, killed_before

@@ -51,8 +51,8 @@ class Options(argparse.ArgumentParser):
 
 
 def need(*purposes: str):
-    """Has the packages for these purposes installed, or ends the program; as it does
-    first of all where nothing can be built."""
+    """Ends the program if nothing can be built here; then installs the packages for these
+    purposes, or ends it."""
     for place in (PROJECT, BUILD):
         if odd := ODD.search(str(place)):
             stop(1, f"a path with {odd[0]!r} cannot be built in: {str(place)!r}")

@@ -1,9 +1,9 @@
 # SPDX-License-Identifier: BSD-2-Clause
-"""One boot as it has to be: how.
+"""How one boot has to go, call by call.
 
 The first of two oracles. Written from what the program has to do, not from its
-code, so that a reader can check the one and a trial then compares it with the
-other, call by call. What must hold of any boot is said once more in `properties`,
+code: a reader checks the model against what is required, and a trial compares it with
+the program. What must hold of any boot is said once more in `properties`,
 without this idea of a boot: a mistake made here and in the program alike shows
 there.
 

@@ -2,8 +2,8 @@
 """The program is killed at every system call of every chosen boot, before the call
 takes effect (and therefore also after the one before it), and boots again.
 
-After one undisturbed boot the device holds what every reader needs, and nothing that
-is not the program's has changed (`properties`). After three boots it is what it would
+After one undisturbed boot "zoneinfo" and "localtime" can be used, and nothing that is
+not the program's has changed (`properties`). After three boots it is what it would
 have been without the kill, except for the windows that are named and pinned below.
 Then the next boot is killed as well, for every pair of changes to a link: the device
 has to settle in the same way.

@@ -99,8 +99,8 @@ def boot_without_memory(device, made, way):
 
 @pytest.mark.parametrize("name", CHOSEN)
 def test_memory_is_refused(name, count):
-    """At each of the requests of a pass, of which there is one for every few pages when
-    nothing is put by."""
+    """At each request for memory of a pass, in turn. With no reserve the program makes
+    one for every few pages."""
     options = ["-E", "MALLOC_TOP_PAD_=0", "-e", f"trace={boot.TRACED},brk,mmap"]
     namespace.build(CHOSEN[name]())
     boot.traced(*options)

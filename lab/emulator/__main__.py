@@ -10,11 +10,9 @@ cannot be emulated here.
 """
 
 import argparse
+import subprocess
 import sys
 
-import pytest
-
-from lab.emulator import boot_cost, parts, power_cuts, show
 from lab.places import PROJECT
 
 
@@ -40,6 +38,11 @@ def main() -> int:
     parser.add_argument("--quick", action="store_true", help="tests: three power cuts")
     parser.add_argument("--seed", type=int, help="of what chance decides in cuts")
     options = parser.parse_args()
+    if subprocess.call([PROJECT / "scripts/packages", "pytest"]):
+        return 77
+    # After the options are understood: these take pytest.
+    import pytest
+    from lab.emulator import boot_cost, parts, power_cuts, show
     try:
         parts.prepare()
         if options.tests is not None:
