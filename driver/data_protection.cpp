@@ -6,18 +6,27 @@
 
 #include "support/paths.h"
 
-void relax_data_protection() {
-  set_protection_class_d(paths::timezone_directory);
-  set_protection_class_d(paths::download_root);
-}
+namespace {
 
-void set_protection_class_d([[maybe_unused]] const std::string& directory) {
+// Takes no std::string, because nobody would catch what making one throws.
+void request_class_d([[maybe_unused]] const char* directory) {
 #ifdef F_SETPROTECTIONCLASS
   constexpr int class_d = 4;
-  const int descriptor = ::open(directory.c_str(), O_RDONLY | O_CLOEXEC);
+  const int descriptor = ::open(directory, O_RDONLY | O_CLOEXEC);
   if (descriptor < 0) return;
   // A refusal is not reported: the file system may have no classes.
   ::fcntl(descriptor, F_SETPROTECTIONCLASS, class_d);
   ::close(descriptor);
 #endif
+}
+
+}  // namespace
+
+void relax_data_protection() {
+  request_class_d(paths::timezone_directory);
+  request_class_d(paths::download_root);
+}
+
+void set_protection_class_d(const std::string& directory) {
+  request_class_d(directory.c_str());
 }

@@ -276,7 +276,7 @@ class Tree:
         if not (self.root / "build/build.ninja").exists():
             subprocess.run(
                 ["cmake", "-S", self.root, "-B", self.root / "build", "-G", "Ninja",
-                 "-DCMAKE_BUILD_TYPE=None", "-DCMAKE_CXX_FLAGS=-O0 -w "
+                 "-DBUILD_TESTING=ON", "-DCMAKE_BUILD_TYPE=None", "-DCMAKE_CXX_FLAGS=-O0 -w "
                  "-D_GLIBCXX_ASSERTIONS -fsanitize=return",
                  "-DCMAKE_GTEST_DISCOVER_TESTS_DISCOVERY_MODE=PRE_TEST"],
                 check=True, stdout=subprocess.DEVNULL)
@@ -296,6 +296,8 @@ class Tree:
                 passed, output = self.run_tests(program, slow=slow)
                 if not passed:
                     sys.exit(f"{output}\nmutants: {program} fails as it is")
+        if not self.slow:
+            sys.exit("mutants: no test program was built")
 
     def bring_up_to_date(self):
         """What is the same keeps its time, and so its objects."""

@@ -32,3 +32,5 @@ struct mln_version {
 // than za, b newer than az), then major, then minor.
 bool operator>(const mln_version& left, const mln_version& right);
 bool operator==(const mln_version& left, const mln_version& right);
+// There is no other comparison; the language would make this one of ==.
+bool operator!=(const mln_version&, const mln_version&) = delete;

@@ -89,6 +89,10 @@ TEST_F(CompatibleComponents, PassOnWhatAComponentThrows) {
                std::runtime_error);
 }
 
+TEST(ComponentOwnership, OfADefaultComponentIsTheSystemPartitions) {
+  EXPECT_EQ(throwing_component().dataset_path, "");
+}
+
 TEST(ComponentOwnership, CannotBeDeletedThroughTheBase) {
   static_assert(!std::is_destructible_v<mln_dataset_component>);
   static_assert(!std::has_virtual_destructor_v<mln_dataset_component>);

@@ -197,6 +197,16 @@ TEST_F(Dataset, PrintsTheParsersLinesBeforeTheIcuComponents) {
             failure("No ICU schema found for /var/db/timezone/tz/odd", 0)));
 }
 
+TEST_F(Dataset, IsTheOnlyOwnerOfItsComponents) {
+  std::weak_ptr<mln_dataset_component> component;
+  {
+    const mln_dataset system;
+    for (const auto& held : system.components) EXPECT_EQ(held.use_count(), 1);
+    component = system.components.back();
+  }
+  EXPECT_TRUE(component.expired());
+}
+
 TEST_F(Dataset, IsNeverCopied) {
   static_assert(!std::is_copy_constructible_v<mln_dataset>);
   static_assert(!std::is_copy_assignable_v<mln_dataset>);

@@ -263,6 +263,18 @@ TEST_F(IcuCompatibility, ComparesBehindANulByteToo) {
   EXPECT_FALSE(mln_icu(update("2024a.1.0")).compatible_schema(mln_icu()));
 }
 
+TEST_F(IcuCompatibility, GoesByTheSchemaThatWasFirstRead) {
+  install_system("2023c", "44l");
+  install_update("2024a.1.0", "44l");
+  const mln_icu system;
+  const mln_icu update(update_path);
+  wipe(icu_directory);
+  make_file(icu_directory + "/icutz45l.dat");
+  EXPECT_TRUE(update.compatible_schema(system));
+  make_file(system_icu + "/icutzformat.txt", "46l");
+  EXPECT_TRUE(update.compatible_schema(system));
+}
+
 TEST_F(IcuCompatibility, HoldsBetweenTwoEmptySchemas) {
   printed_by([] {
     EXPECT_TRUE(mln_icu(update("2024a.1.0")).compatible_schema(mln_icu()));

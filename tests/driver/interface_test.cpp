@@ -71,6 +71,19 @@ TEST_F(Interface, OfVersions) {
   EXPECT_TRUE(version == mln_version("2025b.2"));
 }
 
+template <typename T>
+concept has_another_comparison = requires(T left, T right) {
+  left != right;
+}
+|| requires(T left, T right) { left < right; }
+|| requires(T left, T right) { left <= right; }
+|| requires(T left, T right) { left >= right; };
+
+TEST_F(Interface, OfVersionsHasTwoComparisonsOnly) {
+  static_assert(!has_another_comparison<mln_version>);
+  static_assert(has_another_comparison<std::string>);
+}
+
 TEST_F(Interface, OfComponents) {
   static_assert(std::is_abstract_v<mln_dataset_component>);
   static_assert(std::is_base_of_v<mln_dataset_component, mln_zoneinfo>);

@@ -13,6 +13,7 @@
 #include "driver/startup.h"
 #include "driver/version_record.h"
 #include "support/first_word.h"
+#include "support/fsutil.h"
 #include "tests/device/device.h"
 
 using namespace device;
@@ -121,6 +122,16 @@ TEST_F(WithoutMemory, TheRecordIsLeftAloneAndItsCallerTold) {
               }),
               no_lines());
   EXPECT_EQ(file_at(record), "2022a.1.0_2023c.1.0");
+}
+
+TEST_F(WithoutMemory, AShortLinkIsReadAllTheSame) {
+  const std::string path = "/var/db/timezone/link";
+  make_link(path, "target");
+  refusals = 1;
+  const std::string target = fsutil::read_symlink(path);
+  EXPECT_EQ(refusals, 1);
+  refusals = 0;
+  EXPECT_EQ(target, "target");
 }
 
 // Every single request of a boot that activates an update is refused in turn.

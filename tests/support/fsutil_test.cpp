@@ -110,6 +110,11 @@ TEST_F(Exists, IsTrueForAFileADirectoryAndALinkToOne) {
   EXPECT_TRUE(fsutil::exists(path));
 }
 
+TEST_F(Exists, TakesThePathUpToItsFirstNul) {
+  make_file(path);
+  EXPECT_TRUE(fsutil::exists(path + std::string("\0x", 2)));
+}
+
 TEST_F(Exists, IsTrueForAFileThatNobodyMayRead) {
   make_file(path, "", 0);
   EXPECT_TRUE(fsutil::exists(path));
@@ -142,6 +147,11 @@ TEST_F(ReadSymlink, ReturnsTheTargetAsItIsStored) {
                 EXPECT_EQ(fsutil::read_symlink(path), "../%s//a/./b/");
               }),
               no_lines());
+}
+
+TEST_F(ReadSymlink, TakesThePathUpToItsFirstNul) {
+  make_link(path, "target");
+  EXPECT_EQ(fsutil::read_symlink(path + std::string("\0x", 2)), "target");
 }
 
 TEST_F(ReadSymlink, OfAMissingPathIsQuietlyEmpty) {
@@ -232,6 +242,12 @@ TEST_F(CreateSymlink, StoresTheFirstTextInALinkAtTheSecond) {
       no_lines());
   EXPECT_EQ(result, 0);
   EXPECT_EQ(link_at(path), "some//text/");
+}
+
+TEST_F(CreateSymlink, TakesBothTextsUpToTheirFirstNul) {
+  const std::string rest("\0x", 2);
+  fsutil::create_symlink("target" + rest, path + rest);
+  EXPECT_EQ(link_at(path), "target");
 }
 
 TEST_F(CreateSymlink, MakesADanglingLinkWithoutComplaint) {
