@@ -315,7 +315,7 @@ class Tree:
         return run(900, "ninja", "-C", self.root / "build", "-j2", target)
 
     def run_tests(self, program: str, *options: str, slow=False):
-        seconds, sign, file_size = (60, "", "unlimited") if slow else (15, "-", 1 << 18)
+        seconds, sign, file_size = (90, "", "unlimited") if slow else (30, "-", 1 << 18)
         return run(seconds, self.root / "build/tests" / program, *options,
                    f"--gtest_filter={sign}{':'.join(self.slow[program])}",
                    file_size=file_size)  # in blocks of 1 kB

@@ -14,7 +14,7 @@ import sys
 FUNCTIONS = set("""
     access close fts_close fts_open fts_read fts_set open read readlink remove setvbuf
     signal stat stderr strerror symlink unlink warn write
-    memchr memcmp memcpy memmove memset strcmp strlen strtol
+    bcmp memchr memcmp memcpy memmove memset strcmp strlen strtol
     fcntl
 """.split())  # the last one on platforms with data-protection classes
 
