@@ -297,8 +297,8 @@ class Tree:
                 passed, output = self.run_tests(program, slow=slow)
                 if not passed:
                     sys.exit(f"{output}\nmutants: {program} fails as it is")
-        if not self.slow:
-            sys.exit("mutants: no test program was built")
+        if not self.slow or not self.test_imports():
+            sys.exit("mutants: no test program was built, or the imports fail as is")
 
     def bring_up_to_date(self):
         """What is the same keeps its time, and so its objects."""
@@ -323,6 +323,13 @@ class Tree:
                    f"--gtest_filter={sign}{':'.join(self.slow[program])}",
                    file_size=file_size)  # in blocks of 1 kB
 
+    def test_imports(self) -> bool:
+        """The test that is not in a program."""
+        build = self.root / "build"
+        return run(30, "/usr/bin/python3", "-B", self.root / "tests/imports.py", "nm",
+                   *build.glob("libmarlin_*.a"), *build.glob("CMakeFiles/marlin.dir/"
+                                                             "driver/*.o"))[0]
+
     def fate_of(self, mutant: Mutant) -> str:
         originals = {file: (self.root / file).read_text() for file in mutant.texts}
         try:
@@ -335,11 +342,15 @@ class Tree:
 
     def tested(self, favourite: str) -> str:
         programs = sorted(self.slow, key=lambda name: (name != favourite, name))
+        if not self.build("marlin")[0]:
+            return "not built"
         for program in programs:
-            if not self.build(f"tests/{program}")[0]:
-                return "not built"
-            if not self.run_tests(program, "--gtest_fail_fast")[0]:
+            # A test that does not compile any more has noticed something.
+            if not (self.build(f"tests/{program}")[0] and
+                    self.run_tests(program, "--gtest_fail_fast")[0]):
                 return "killed"
+        if not self.test_imports():
+            return "killed"
         for program in programs:
             if self.slow[program] and not self.run_tests(program, slow=True)[0]:
                 return "killed"

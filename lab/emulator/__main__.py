@@ -35,7 +35,6 @@ def main() -> int:
                       "power at N random instants, and checks what is left")
     mode.add_argument("--boot-cost", action="store_true",
                       help="measures the part of a boot that the pass takes")
-    parser.add_argument("--quick", action="store_true", help="tests: three power cuts")
     parser.add_argument("--seed", type=int, help="of what chance decides in cuts")
     options = parser.parse_args()
     if subprocess.call([PROJECT / "scripts/packages", "pytest"]):
@@ -48,7 +47,7 @@ def main() -> int:
         if options.tests is not None:
             return pytest.main([
                 "-c", "lab/pytest.ini", f"--rootdir={PROJECT}",
-                "-n", "2", "--dist", "loadfile", *["--quick"] * options.quick,
+                "-n", "2", "--dist", "loadfile",
                 *(options.tests or ["lab/emulator"])])
         if options.shell:
             return show.shell()

@@ -4,5 +4,5 @@
 from lab.emulator import power_cuts
 
 
-def test_power_cuts(machine, request):
-    power_cuts.run(3 if request.config.getoption("quick") else 10)
+def test_power_cuts(machine):
+    power_cuts.run(10)
