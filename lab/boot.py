@@ -44,8 +44,8 @@ def boot(*wrapper: str) -> Booted:
 
 
 def spawn(command: list[str], descriptors: dict[int, int | None]) -> int:
-    """Runs a command with these descriptors; None is a closed one. Kills it if it takes too
-    long. Returns what wait(2) told."""
+    """Runs a command with these descriptors; None is a closed one. Kills it if it
+    takes too long. Returns what wait(2) told."""
     insist_on_private_device()
     child = os.posix_spawn(
         command[0], command, {"PATH": "/usr/bin:/bin"},

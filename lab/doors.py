@@ -51,8 +51,8 @@ class Options(argparse.ArgumentParser):
 
 
 def need(*purposes: str):
-    """Ends the program if nothing can be built here; then installs the packages for these
-    purposes, or ends it."""
+    """Ends the program if nothing can be built here; then installs the packages for
+    these purposes, or ends it."""
     for place in (PROJECT, BUILD):
         if odd := ODD.search(str(place)):
             stop(1, f"a path with {odd[0]!r} cannot be built in: {str(place)!r}")

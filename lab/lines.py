@@ -1,8 +1,9 @@
 # SPDX-License-Identifier: BSD-2-Clause
 """Every line that the program prints, as the format that it gives to warn(3).
 
-The one table for the lab and for the manual page's check. The texts stand in the program, the C++ tests and docs/marlin.8 as well, on purpose: a
-reworded line has to be reworded there.
+The one table for the lab and for the manual page's check. The texts stand in the
+program, the C++ tests and docs/marlin.8 as well, on purpose: a reworded line has to be
+reworded there.
 """
 
 import errno
