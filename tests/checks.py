@@ -15,7 +15,11 @@ import sys
 from collections.abc import Iterator
 from pathlib import Path
 
-os.chdir(Path(__file__).resolve().parents[1])
+PROJECT = Path(__file__).resolve().parents[1]
+sys.path.insert(0, str(PROJECT))
+from lab import lines  # noqa: E402
+
+os.chdir(PROJECT)
 PRODUCT = [path for folder in ("driver", "dataset", "support")
            for path in sorted(Path(folder).iterdir())]
 TEST_NAME = re.compile(r"\b[A-Z][A-Za-z]+\.[A-Z][A-Za-z0-9]+\b")
@@ -145,6 +149,7 @@ def manual_pages() -> Iterator[str]:
     diagnostics = re.search(r"^\.Sh DIAGNOSTICS\n(.*?)^\.Sh ", marlin, re.M | re.S)[1]
     told = set(re.findall(r"^\.It (.*)", diagnostics, re.M))
     yield from differences(texts, "the program", told, "DIAGNOSTICS")
+    yield from differences(texts, "the program", set(lines.FORMATS), "lab/lines.py")
 
     zones = re.findall(r'default_zone\[\] = "([^"]+)"', code)
     told_zones = re.findall(r"default zone, ([\w/]+)", marlin)
