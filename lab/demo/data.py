@@ -61,8 +61,12 @@ def prepare():
     made_from = TARGET / "inputs"
     if made_from.exists() and made_from.read_text() == inputs:
         return
-    shutil.rmtree(TARGET, ignore_errors=True)
+    if TARGET.exists():
+        if not made_from.exists():
+            sys.exit(f"demo: {TARGET} is there, and not made by this; remove it")
+        shutil.rmtree(TARGET)
     TARGET.mkdir(parents=True)
+    made_from.touch()  # from here on it is
     make(RULES.read_text(), library)
     made_from.write_text(inputs)
 

@@ -177,6 +177,15 @@ TEST_F(Dataset, OfASystemWithoutAVersionFileHasAnUnsetVersion) {
                     failure("Cannot parse version string .1.0", ENOENT)));
 }
 
+TEST_F(Dataset, OfASystemAlwaysGetsItsTwoNumbers) {
+  install_system("2023c.1.0", "44l");
+  printed_by([] {
+    const mln_dataset system;
+    EXPECT_EQ(system.version_string, "2023c.1.0.1.0");
+    EXPECT_TRUE(system.version == mln_version());
+  });
+}
+
 TEST_F(Dataset, WithANumberThatDoesNotFitThrowsOutOfRange) {
   install_update("2147483648a", "44l");
   EXPECT_THAT(printed_by([] {

@@ -39,6 +39,7 @@ TEST(IcuFileName, OfANearMissCarriesNothing) {
                            "icutz44l.datt",
                            "xicutz44l.dat",
                            "Icutz44l.dat",
+                           "ICUTZ44l.dat",
                            "icut44l.dat",
                            "icutz 44l.dat",
                            "icutz-44l.dat",

@@ -41,8 +41,10 @@ TEST_F(IcuSchema, OfTheSystemIsTheFirstWordOfItsFormatFile) {
 }
 
 TEST_F(IcuSchema, OfTheSystemIsNotCheckedForItsForm) {
-  make_file(system_icu + "/icutzformat.txt", "any%thing");
-  EXPECT_EQ(mln_icu().schema, "any%thing");
+  for (const std::string word : {"any%thing", "44L", "#44l", "icutz44l.dat"}) {
+    make_file(system_icu + "/icutzformat.txt", word + " 44l");
+    EXPECT_EQ(mln_icu().schema, word);
+  }
 }
 
 TEST_F(IcuSchema, OfTheSystemIgnoresDataFiles) {
@@ -149,8 +151,10 @@ TEST_F(IcuSchema, IsTakenFromAHardLinkedFileAndFromOneWithSpecialBits) {
                    (icu_directory + "/icutz44l.dat").c_str()),
             0);
   EXPECT_EQ(of_update(), "44l");
-  set_mode(icu_directory + "/icutz44l.dat", 07604);
-  EXPECT_EQ(of_update(), "44l");
+  for (const mode_t mode : {07604u, 07777u, 0005u, 0006u}) {
+    set_mode(icu_directory + "/icutz44l.dat", mode);
+    EXPECT_EQ(of_update(), "44l") << std::oct << mode;
+  }
 }
 
 TEST_F(IcuSchema, IsTakenFromAnEmptyFileAndFromOneThatItsOwnerMayNotRead) {

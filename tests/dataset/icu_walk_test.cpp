@@ -6,6 +6,7 @@
 #include <fts.h>
 #include <gtest/gtest.h>
 #include <sys/stat.h>
+#include <unistd.h>
 
 #include <cerrno>
 #include <cstdlib>
@@ -27,6 +28,7 @@ struct scripted_entry {
   int info = FTS_F;
   int error = 0;
   mode_t mode = S_IFREG | 0644;
+  uid_t owner = 0;
 };
 
 struct {
@@ -73,6 +75,7 @@ FTSENT* fts_read(FTS*) {
   entry->fts_info = static_cast<unsigned short>(scripted.info);
   entry->fts_errno = scripted.error;
   entry_status.st_mode = scripted.mode;
+  entry_status.st_uid = scripted.owner;
   entry->fts_statp = &entry_status;
   return entry;
 }
@@ -123,6 +126,22 @@ TEST_F(IcuWalk, ThatCannotBeStartedIsReportedAndThrown) {
                           reason,
                       error)));
     EXPECT_EQ(walk.closed, 0);
+  }
+}
+
+TEST_F(IcuWalk, ThatCannotBeStartedThrowsTheNumberThatStandsAfterItsLine) {
+  walk.open_error = ENOMEM;
+  printed_by([] {
+    ::close(STDERR_FILENO);
+    EXPECT_EQ(thrown_by([] { schema(); }), EBADF);
+  });
+}
+
+TEST_F(IcuWalk, DoesNotAskWhoseAFileIs) {
+  for (const uid_t owner : {0u, ::geteuid(), 4711u}) {
+    walk = {};
+    walk.entries = {{.name = "icutz44l.dat", .owner = owner}};
+    EXPECT_EQ(schema(), "44l") << owner;
   }
 }
 

@@ -34,6 +34,8 @@ TEST_F(FirstWord, EndsAtWhiteSpaceOrAtTheEndOfTheFile) {
   EXPECT_EQ(of("2016a"), "2016a");
   EXPECT_EQ(of("2016a\n"), "2016a");
   EXPECT_EQ(of("2016a,x y"), "2016a,x");
+  EXPECT_EQ(of("# 2016a"), "#");
+  EXPECT_EQ(of("#2015z\n2016a"), "#2015z");
   EXPECT_EQ(of("\n  2016a more\n"), "2016a");
 }
 

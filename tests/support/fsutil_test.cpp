@@ -110,6 +110,12 @@ TEST_F(Exists, IsTrueForAFileADirectoryAndALinkToOne) {
   EXPECT_TRUE(fsutil::exists(path));
 }
 
+TEST_F(Exists, LeavesTheErrorOfAMissingPath) {
+  errno = EXDEV;
+  EXPECT_FALSE(fsutil::exists(path));
+  EXPECT_EQ(errno, ENOENT);
+}
+
 TEST_F(Exists, TakesThePathUpToItsFirstNul) {
   make_file(path);
   EXPECT_TRUE(fsutil::exists(path + std::string("\0x", 2)));
