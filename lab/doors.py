@@ -40,14 +40,14 @@ class Options(argparse.ArgumentParser):
     """Command-line options; `usage`, if it is given, is all that --help prints."""
 
     def __init__(self, usage="", **options):
-        super().__init__(prog=f"scripts/{NAME}", allow_abbrev=False, **options)
+        super().__init__(**{"prog": f"scripts/{NAME}", "allow_abbrev": False} | options)
         self.text = usage
 
     def format_help(self):
         return self.text or super().format_help()
 
     def error(self, message):
-        stop(2, f"{message}; see --help")
+        self.exit(2, f"{Path(self.prog).name}: {message}; see --help\n")
 
 
 def need(*purposes: str):

@@ -22,7 +22,6 @@ that holds only PATH: each variable more costs some 550 in the C library's start
 every program alike.
 """
 
-import argparse
 import json
 import os
 import re
@@ -33,7 +32,7 @@ from collections.abc import Iterator
 from pathlib import Path
 
 from lab.bench.measure import SCENES
-from lab.doors import need
+from lab.doors import Options, need
 from lab.places import BUILD
 
 BUILDS = f"{BUILD}/bench"
@@ -276,8 +275,7 @@ def hardening():
 
 
 def main():
-    parser = argparse.ArgumentParser("scripts/bench", allow_abbrev=False)
-    parser.format_help = lambda: __doc__
+    parser = Options(__doc__)
     parser.add_argument("--rounds", default="11")
     jobs = parser.add_mutually_exclusive_group()
     for job in (check, record, growth, hardening, parsers):

@@ -13,6 +13,7 @@ import argparse
 import subprocess
 import sys
 
+from lab.doors import Options
 from lab.places import PROJECT
 
 
@@ -23,9 +24,8 @@ def number_of_cuts(text: str) -> int:
 
 
 def main() -> int:
-    parser = argparse.ArgumentParser(
-        prog="scripts/device", description=__doc__,
-        formatter_class=argparse.RawDescriptionHelpFormatter, allow_abbrev=False)
+    parser = Options(prog="scripts/device", description=__doc__,
+                     formatter_class=argparse.RawDescriptionHelpFormatter)
     mode = parser.add_mutually_exclusive_group()
     mode.add_argument("--shell", action="store_true", help="a prompt on the device, "
                       'after the pass; "poweroff -f" ends it')
