@@ -137,6 +137,7 @@ void make_file(const std::string& path, const std::string& content,
 void make_fifo(const std::string& path) {
   fs::create_directories(fs::path(path).parent_path());
   must(::mkfifo(path.c_str(), 0644) == 0, "make the FIFO " + path);
+  ::alarm(30);
 }
 
 void make_socket(const std::string& path) {
@@ -402,6 +403,7 @@ void DeviceTest::SetUp() {
 }
 
 void DeviceTest::TearDown() {
+  ::alarm(0);
   if (HasFailure() && why_not_private().empty())
     std::cout << "The device afterwards:\n" << listing();
 }

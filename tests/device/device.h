@@ -42,6 +42,8 @@ std::string update(const std::string& version);
 void make_directory(const std::string& path, mode_t mode = 0755);
 void make_file(const std::string& path, const std::string& content = {},
                mode_t mode = 0644);
+// Who opens it waits for ever: from here the test has 30 seconds, then SIGALRM
+// ends it.
 void make_fifo(const std::string& path);
 void make_socket(const std::string& path);
 void make_link(const std::string& path, const std::string& target);
