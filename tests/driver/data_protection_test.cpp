@@ -17,13 +17,14 @@ class DataProtection : public DeviceTest {
   // data-protection classes makes them. Descriptors are numbered the same way
   // in every run. What the shell redirects stays so for the program.
   static std::vector<std::string> first_calls(
-      std::size_t count, const std::string& redirections = "") {
+      std::size_t count, const std::string& redirections = "",
+      const std::string& program = MARLIN_WITH_CLASSES) {
     const std::string trace = "/var/db/trace";
     const outcome booted =
         run({"/usr/bin/strace", "-qq", "-o", trace, "-e",
              "trace=open,openat,fcntl,fcntl64,close,access,faccessat", "-E",
              "ASAN_OPTIONS=detect_leaks=0", "/bin/sh", "-c",
-             "exec " MARLIN_WITH_CLASSES " " + redirections});
+             "exec " + program + " " + redirections});
     EXPECT_EQ(booted.exit_status, 0);
     EXPECT_EQ(booted.log, "");
     std::vector<std::string> calls = outcome{0, 0, file_at(trace)}.lines();
@@ -52,6 +53,15 @@ TEST_F(DataProtection, AsksForClassDOnBothDirectoriesBeforeAllElse) {
           HasSubstr("\"/var/db/timezone/tz/\", O_RDONLY|O_CLOEXEC) = 3"),
           AllOf(StartsWith("fcntl(3, 0x40"), HasSubstr(", 0x4)")),
           StartsWith("close(3)"), HasSubstr("\"/var/db/icutz\"")));
+}
+
+TEST_F(DataProtection, AsksForClassDOnADirectoryThatIsNamed) {
+  if (emulated()) GTEST_SKIP() << "strace would show the emulator's calls";
+  EXPECT_THAT(
+      first_calls(9, downloads, CLASS_D),
+      ElementsAre(HasSubstr("\"" + downloads + "\", O_RDONLY|O_CLOEXEC) = 3"),
+                  AllOf(StartsWith("fcntl(3, 0x40"), HasSubstr(", 0x4)")),
+                  StartsWith("close(3)")));
 }
 
 TEST_F(DataProtection, TakesDescriptorZeroForADescriptor) {
