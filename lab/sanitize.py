@@ -128,12 +128,15 @@ class Tool(NamedTuple):
 
 
 TOOLS = {
-    "sanitizers": Tool(BUILD / "asan", "asan", "-fsanitize=address", "*", sanitized),
+    # A sanitizer makes calls of its own.
+    "sanitizers": Tool(BUILD / "asan", "asan", "-fsanitize=address",
+                       "-WholeListOfCalls.*", sanitized),
     # valgrind itself exceeds limits of memory and of file sizes; and there is a number
     # of texts that takes an hour.
     "memcheck": Tool(
         BUILD / "memcheck", "dev", "-g",
-        "-*OnAMillion*:*DoesNotFitIntoMemory*:*CannotBeWrittenWhole*", memchecked),
+        "-*OnAMillion*:*DoesNotFitIntoMemory*:*CannotBeWrittenWhole*:"
+        "WholeListOfCalls.*", memchecked),
 }
 
 
