@@ -58,7 +58,7 @@ TEST_F(DataProtection, AsksForClassDOnBothDirectoriesBeforeAllElse) {
 TEST_F(DataProtection, AsksForClassDOnADirectoryThatIsNamed) {
   if (emulated()) GTEST_SKIP() << "strace would show the emulator's calls";
   EXPECT_THAT(
-      first_calls(9, downloads, CLASS_D),
+      first_calls(3, downloads, CLASS_D),
       ElementsAre(HasSubstr("\"" + downloads + "\", O_RDONLY|O_CLOEXEC) = 3"),
                   AllOf(StartsWith("fcntl(3, 0x40"), HasSubstr(", 0x4)")),
                   StartsWith("close(3)")));
