@@ -81,7 +81,10 @@ void mln_icu::initialize() {
            std::strerror(errno));
     throw errno;
   }
-  if (schema.empty()) schema = first_schema(*walk);
+  // Read also when the schema is known: closing a walk that was never read
+  // leaks in some C libraries.
+  std::string found = first_schema(*walk);
+  if (schema.empty()) schema = std::move(found);
   // Closed here, not at the end of the block, because closing may set the errno
   // that the line below ends with. See
   // IcuWalk.IsClosedBeforeAMissingSchemaIsReported.
