@@ -49,8 +49,8 @@ def differences(left: set[str], where_left: str, right: set[str],
 # Each check yields what does not hold.
 
 def source_rules() -> Iterator[str]:
-    above = {"support": "driver|dataset|tests", "dataset": "driver|tests",
-             "driver": "tests"}
+    above = {"support": "driver|dataset|tools|tests", "dataset": "driver|tools|tests",
+             "driver": "tools|tests"}
     for path in PRODUCT:
         upwards = rf'#include "({above[path.parts[0]]})/'
         for line in matching_lines(path, upwards):
