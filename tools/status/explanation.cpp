@@ -1,0 +1,420 @@
+// SPDX-License-Identifier: BSD-2-Clause
+#include "tools/status/explanation.h"
+
+#include <algorithm>
+#include <cstring>
+#include <stdexcept>
+#include <string_view>
+#include <utility>
+
+#include "tools/escaped.h"
+
+namespace {
+
+// The lines that tell of a decision; each is printed in one place of the boot.
+namespace lines {
+constexpr std::string_view not_migrated =
+    "Could not migrate /var/db/icutz to /var/db/timezone/icutz";
+constexpr std::string_view not_removed = "Could not remove /var/db/icutz";
+constexpr std::string_view invalid_links =
+    "Invalid current symlinks; resetting to system partition";
+constexpr std::string_view incompatible =
+    "Symlink points at data incompatible with installed system";
+constexpr std::string_view refused =
+    "New update not compatible or older version: %s vs. %s";
+constexpr std::string_view last_resort =
+    "Unable to locate data; resetting to system partition";
+constexpr std::string_view correcting = "Correcting localtime link to %s";
+constexpr std::string_view localtime_invalid =
+    "localtime link invalid; resetting to %s";
+// These are printed by what fails below a decision.
+constexpr std::string_view read_failed = "read_symlink: %s";
+constexpr std::string_view create_failed = "create_symlink: from %s to %s";
+constexpr std::string_view bad_path =
+    "mln_dataset::create_components: bad path %s";
+constexpr std::string_view walk_failed =
+    "tz_icu::initialize: fts_open of %s failed, %s";
+}  // namespace lines
+
+struct row {
+  std::string_view name, does, reason;
+  verdict is;
+  // "%1" and "%2" are texts of the device, "%e" the text of an error.
+  std::string_view text;
+};
+
+using enum verdict;
+
+constexpr row table[] = {
+    {"legacy_icu_link", "nothing", "none", sound, "none"},
+    {"legacy_icu_link", "nothing", "dangles", sound,
+     "/var/db/icutz leads nowhere and counts as none"},
+    {"legacy_icu_link", "moved", "no_present_link", changes,
+     "/var/db/icutz moves to /var/db/timezone/icutz"},
+    {"legacy_icu_link", "removed", "present_link_resolves", changes,
+     "/var/db/icutz is removed; /var/db/timezone/icutz is kept"},
+    {"legacy_icu_link", "removed", "not_migrated", wrong,
+     "/var/db/icutz is removed, but could not move to /var/db/timezone/icutz: "
+     "%e"},
+    {"legacy_icu_link", "kept", "not_removed", wrong,
+     "/var/db/icutz cannot be removed: %e"},
+
+    {"old_icu", "nothing", "none", sound, "none"},
+    {"old_icu", "removed", "obsolete", changes, "/var/db/icu is removed"},
+    {"old_icu", "kept", "not_removed", wrong, "/var/db/icu cannot be removed"},
+
+    {"current", "not_reached", "earlier_failure", wrong, "not looked at"},
+    {"current", "read", "system", sound, "zoneinfo names the system partition"},
+    {"current", "read", "update", sound, "zoneinfo names the update %1"},
+    {"current", "reset", "no_link", changes,
+     "there is no link zoneinfo: links are reset to the system partition"},
+    {"current", "reset", "bad_target", wrong,
+     "zoneinfo names no data set: links are reset to the system partition"},
+    {"current", "reset", "not_a_link", wrong,
+     "zoneinfo is not a link: links are reset to the system partition"},
+    {"current", "reset", "unreadable", wrong,
+     "zoneinfo cannot be read: links are reset to the system partition"},
+
+    {"usable", "not_reached", "earlier_failure", wrong, "not looked at"},
+    {"usable", "kept", "fits", sound, "it fits the system"},
+    {"usable", "reset", "other_schema", wrong,
+     "it has %1, the system has %2: links are reset to the system partition"},
+    {"usable", "reset", "older_than_system", wrong,
+     "it is %1, older than the system's %2: links are reset to the system "
+     "partition"},
+    {"usable", "reset", "no_version", wrong,
+     "its name %1 is no version: links are reset to the system partition"},
+
+    {"update", "not_reached", "earlier_failure", wrong, "not looked at"},
+    {"update", "nothing", "none", sound, "none is announced"},
+    {"update", "refused", "same_set", sound, "%1 is in use already"},
+    {"update", "refused", "other_schema", wrong,
+     "%1 is refused: it has %2"},
+    {"update", "refused", "same_version", wrong,
+     "%1 is refused: %2 is of the same version"},
+    {"update", "refused", "no_version", wrong,
+     "%1 is refused: the name is no version"},
+    {"update", "refused", "older", wrong, "%1 is refused: %2 is newer"},
+    {"update", "failed", "last_resort", wrong, "%1 cannot be used"},
+    {"update", "activated", "newer", changes, "%1 is activated: newer than %2"},
+
+    {"last_resort", "nothing", "no_failure", sound, "not needed"},
+    {"last_resort", "reset", "links_not_made", wrong,
+     "a link cannot be made: %e"},
+    {"last_resort", "reset", "announcement_unreadable", wrong,
+     "tz_latest cannot be read: %e"},
+    {"last_resort", "reset", "announcement_elsewhere", wrong,
+     "tz_latest names no place below /var/db/timezone/tz: %1"},
+    {"last_resort", "reset", "system_number_too_large", wrong,
+     "a number in the system's version is too large"},
+    {"last_resort", "reset", "current_number_too_large", wrong,
+     "a number in the name of %1 is too large"},
+    {"last_resort", "reset", "update_number_too_large", wrong,
+     "a number in the name of %1 is too large"},
+    {"last_resort", "reset", "walk_failed", wrong,
+     "an ICU directory cannot be searched"},
+
+    {"localtime", "not_reached", "earlier_failure", wrong, "not looked at"},
+    {"localtime", "kept", "accepted", sound, "the link is kept"},
+    {"localtime", "corrected", "former_place", changes,
+     "the link is corrected to %1"},
+    {"localtime", "reset", "no_link", changes,
+     "there is no link: the default zone is set"},
+    {"localtime", "reset", "elsewhere", wrong,
+     "the link leads elsewhere: the default zone is set"},
+    {"localtime", "reset", "zone_unreachable", wrong,
+     "the zone in the corrected link cannot be reached: the default zone is "
+     "set"},
+    {"localtime", "reset", "not_replaced", wrong,
+     "the corrected link cannot be made: the default zone is set"},
+    {"localtime", "reset", "not_a_link", wrong,
+     "it is not a link: the default zone is set"},
+    {"localtime", "reset", "unreadable", wrong,
+     "it cannot be read: the default zone is set"},
+    {"localtime", "failed", "not_made", wrong,
+     "the default link cannot be made: %e"},
+};
+
+std::string schema_of(const dataset_facts& set) {
+  return set.schema.empty() ? "no ICU schema" : "ICU schema " + set.schema;
+}
+
+class account {
+ public:
+  account(const device_facts& device, const rehearsal& boot,
+          const link_facts& after)
+      : device_(device), boot_(boot), after_(after) {}
+
+  explanation told() {
+    legacy_icu_link();
+    old_icu();
+    select();
+    localtime();
+    if (!boot_.ends_normally)
+      is_wrong("the boot ends abnormally: " + boot_.thrown);
+    state_afterwards();
+    return std::move(told_);
+  }
+
+ private:
+  const line* find(std::string_view format) const {
+    for (const auto& said : boot_.lines)
+      if (said.format == format) return &said;
+    return nullptr;
+  }
+  bool has(std::string_view format) const { return find(format) != nullptr; }
+
+  // The line before the one that tells of a decision; nullptr: none.
+  const line* before(std::string_view format) const {
+    const line* const said = find(format);
+    return said == nullptr || said == boot_.lines.data() ? nullptr : said - 1;
+  }
+  bool follows(std::string_view format, std::string_view cause) const {
+    const line* const said = before(format);
+    return said != nullptr && said->format == cause;
+  }
+
+  void is_wrong(const std::string& reason) {
+    told_.is = wrong;
+    told_.reasons.push_back(reason);
+  }
+
+  void add(std::string_view name, std::string_view does, std::string_view reason,
+           const std::string& first = {}, const std::string& second = {},
+           int error = 0) {
+    const row* const found =
+        std::find_if(std::begin(table), std::end(table), [&](const row& known) {
+          return known.name == name && known.does == does &&
+                 known.reason == reason;
+        });
+    if (found == std::end(table)) throw std::logic_error("no such reason");
+    std::string text;
+    for (std::size_t i = 0; i < found->text.size(); ++i) {
+      if (found->text[i] != '%') {
+        text += found->text[i];
+        continue;
+      }
+      const char what = found->text[++i];
+      text += what == 'e' ? std::strerror(error)
+                          : escaped(what == '1' ? first : second);
+    }
+    if (found->is != sound && does != "not_reached")
+      told_.reasons.push_back(text);
+    told_.is = std::max(told_.is, found->is);
+    told_.steps.push_back(
+        {std::string(name), std::string(does), std::string(reason), text});
+  }
+
+  void legacy_icu_link() {
+    const char* const name = "legacy_icu_link";
+    if (const line* const said = find(lines::not_removed))
+      return add(name, "kept", "not_removed", {}, {}, said->error);
+    if (const line* const said = find(lines::not_migrated))
+      return add(name, "removed", "not_migrated", {}, {}, said->error);
+    if (device_.links.legacy_icutz.what == entry::kind::none)
+      return add(name, "nothing", "none");
+    if (!device_.legacy_resolves) return add(name, "nothing", "dangles");
+    if (device_.icutz_resolves)
+      return add(name, "removed", "present_link_resolves");
+    add(name, "moved", "no_present_link");
+  }
+
+  void old_icu() {
+    if (device_.links.old_icu.what == entry::kind::none)
+      add("old_icu", "nothing", "none");
+    else if (after_.old_icu.what == entry::kind::none)
+      add("old_icu", "removed", "obsolete");
+    else
+      add("old_icu", "kept", "not_removed");
+  }
+
+  // Steps 4 to 8 of a boot. One that fails takes the last resort, and those
+  // after it are not reached.
+  void select() {
+    const bool failed = has(lines::last_resort);
+    if (failed) find_cause();
+    const bool no_current = failed && (cause_ == "system_number_too_large" ||
+                                       cause_ == "announcement_unreadable");
+    current(no_current);
+    const bool no_check = no_current || (failed && failed_at_current());
+    usable(no_check);
+    update(no_check || (failed && failed_in_a_reset()), failed);
+    last_resort(failed);
+  }
+
+  // Only a reset makes this link; an activation makes others.
+  bool failed_in_a_reset() const {
+    const line* const last = before(lines::last_resort);
+    return last != nullptr &&
+           last->text.starts_with(
+               "marlin: create_symlink: from /var/db/timezone/zoneinfo to "
+               "/usr/share/zoneinfo.default: ");
+  }
+  bool failed_at_current() const {
+    if (has(lines::invalid_links))
+      return failed_in_a_reset() && !has(lines::incompatible);
+    return device_.current &&
+           device_.current->ends != dataset_facts::state::built;
+  }
+
+  static bool is_too_large(const std::optional<dataset_facts>& set) {
+    return set && set->ends == dataset_facts::state::number_too_large;
+  }
+
+  void find_cause() {
+    const line none;
+    const line* const last = before(lines::last_resort);
+    const line& cause = last == nullptr ? none : *last;
+    error_ = cause.error;
+    if (cause.format == lines::create_failed) {
+      cause_ = "links_not_made";
+    } else if (cause.format == lines::read_failed) {
+      cause_ = "announcement_unreadable";
+    } else if (cause.format == lines::bad_path) {
+      cause_ = "announcement_elsewhere";
+      text_ = device_.links.tz_latest.text;
+    } else if (cause.format == lines::walk_failed) {
+      cause_ = "walk_failed";
+    } else if (device_.system.ends == dataset_facts::state::number_too_large) {
+      cause_ = "system_number_too_large";
+    } else if (!has(lines::invalid_links) && is_too_large(device_.current)) {
+      cause_ = "current_number_too_large";
+      text_ = device_.current->path;
+    } else if (is_too_large(device_.update)) {
+      cause_ = "update_number_too_large";
+      text_ = device_.update->path;
+    } else {
+      throw std::logic_error("a last resort without a reason");
+    }
+  }
+
+  void current(bool not_reached) {
+    if (not_reached) return add("current", "not_reached", "earlier_failure");
+    if (!has(lines::invalid_links)) {
+      const std::string& path = device_.links.current_path.value();
+      return add("current", "read", path.empty() ? "system" : "update", path);
+    }
+    switch (device_.links.zoneinfo.what) {
+      case entry::kind::none:
+        return add("current", "reset", "no_link");
+      case entry::kind::link:
+        return add("current", "reset", "bad_target");
+      case entry::kind::unknown:
+        return add("current", "reset", "unreadable");
+      default:
+        return add("current", "reset", "not_a_link");
+    }
+  }
+
+  // The data set that the rest of the boot compares with.
+  const dataset_facts& compared() const {
+    return has(lines::invalid_links) || !device_.current ? device_.system
+                                                         : *device_.current;
+  }
+
+  void usable(bool not_reached) {
+    const dataset_facts& set = compared();
+    if (not_reached) return add("usable", "not_reached", "earlier_failure");
+    if (!has(lines::incompatible)) return add("usable", "kept", "fits");
+    if (!set.fits_system)
+      return add("usable", "reset", "other_schema", schema_of(set),
+                 schema_of(device_.system));
+    if (!set.has_version())
+      return add("usable", "reset", "no_version", set.version_text);
+    add("usable", "reset", "older_than_system", set.version_text,
+        device_.system.version_text);
+  }
+
+  void update(bool not_reached, bool failed) {
+    if (not_reached) return add("update", "not_reached", "earlier_failure");
+    if (failed)
+      return add("update", "failed", "last_resort",
+                 device_.links.tz_latest.text);
+    if (!device_.update) return add("update", "nothing", "none");
+    const dataset_facts& set = *device_.update;
+    const dataset_facts& in_use = compared();
+    if (!has(lines::refused))
+      return add("update", "activated", "newer", set.version_text,
+                 in_use.has_version() ? in_use.version_text : "no version");
+    if (!set.fits_system)
+      return add("update", "refused", "other_schema", set.version_text,
+                 schema_of(set));
+    // Reset in this boot, it is in use no longer.
+    if (set.path == in_use.path && !has(lines::incompatible))
+      return add("update", "refused", "same_set", set.version_text);
+    if (!set.has_version())
+      return add("update", "refused", "no_version", set.version_text);
+    add("update", "refused", set.version == in_use.version ? "same_version" : "older",
+        set.version_text, in_use.version_text);
+  }
+
+  void last_resort(bool failed) {
+    if (failed)
+      add("last_resort", "reset", cause_, text_, {}, error_);
+    else
+      add("last_resort", "nothing", "no_failure");
+  }
+
+  void localtime() {
+    const char* const name = "localtime";
+    const bool is_invalid = has(lines::localtime_invalid);
+    if (!boot_.ends_normally && !is_invalid)
+      return add(name, "not_reached", "earlier_failure");
+    if (!boot_.ends_normally)
+      return add(name, "failed", "not_made", {}, {}, boot_.lines.back().error);
+    if (!is_invalid) {
+      if (has(lines::correcting))
+        return add(name, "corrected", "former_place", after_.localtime.text);
+      return add(name, "kept", "accepted");
+    }
+    if (follows(lines::localtime_invalid, lines::create_failed))
+      return add(name, "reset", "not_replaced");
+    if (has(lines::correcting)) return add(name, "reset", "zone_unreachable");
+    switch (device_.links.localtime.what) {
+      case entry::kind::none:
+        return add(name, "reset", "no_link");
+      case entry::kind::link:
+        return add(name, "reset", "elsewhere");
+      case entry::kind::unknown:
+        return add(name, "reset", "unreadable");
+      default:
+        return add(name, "reset", "not_a_link");
+    }
+  }
+
+  // What no later boot mends either.
+  void state_afterwards() {
+    if (!device_.system.has_version())
+      is_wrong("the system partition's data has no version");
+    if (device_.system.schema.empty())
+      is_wrong("the system partition's data has no ICU schema");
+    if (!boot_.ends_normally) return;
+    if (after_.pair != link_pair::system && after_.pair != link_pair::update)
+      is_wrong("zoneinfo and icutz do not name the same data after the boot");
+    if (!after_.zone_is_file)
+      is_wrong("the local zone's file cannot be reached after the boot");
+  }
+
+  const device_facts& device_;
+  const rehearsal& boot_;
+  const link_facts& after_;
+  explanation told_{};
+  std::string cause_{};
+  std::string text_{};
+  int error_ = 0;
+};
+
+}  // namespace
+
+explanation explain(const device_facts& device, const rehearsal& boot,
+                    const link_facts& after) {
+  return account(device, boot, after).told();
+}
+
+std::vector<std::string> all_reasons() {
+  std::vector<std::string> all;
+  for (const auto& known : table)
+    all.push_back(std::string(known.name) + ' ' + std::string(known.does) + ' ' +
+                  std::string(known.reason));
+  return all;
+}

@@ -1,0 +1,38 @@
+// SPDX-License-Identifier: BSD-2-Clause
+//
+// What a rehearsed boot did, and why: its lines and its effect, explained by
+// the facts. Nothing is decided here that the boot has not shown.
+#pragma once
+
+#include <string>
+#include <vector>
+
+#include "tools/status/facts.h"
+#include "tools/status/rehearsal.h"
+
+enum class verdict {
+  sound = 0,    // the boot changes nothing
+  changes = 1,  // it changes something on purpose
+  wrong = 2,    // something is wrong, now or after the boot
+};
+
+struct step {
+  std::string name;    // such as "update"
+  std::string does;    // such as "refused"
+  std::string reason;  // such as "older"; together they name a row of the table
+  std::string text;    // the same for a person, device texts escaped
+};
+
+struct explanation {
+  std::vector<step> steps{};  // in the order of the boot
+  verdict is = verdict::sound;
+  std::vector<std::string> reasons{};  // for a verdict other than sound
+};
+
+// `after` is what read_links() gives when the boot is over. Throws
+// std::bad_alloc only, and std::logic_error if a boot did what is in no table.
+explanation explain(const device_facts& device, const rehearsal& boot,
+                    const link_facts& after);
+
+// All steps, doings and reasons that explain() knows, as "STEP DOES REASON".
+std::vector<std::string> all_reasons();

@@ -1,0 +1,188 @@
+// SPDX-License-Identifier: BSD-2-Clause
+#include "tools/status/facts.h"
+
+#include <dirent.h>
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <cstring>
+#include <memory>
+#include <new>
+#include <stdexcept>
+
+#include "dataset/dataset.h"
+#include "dataset/icu_file_name.h"
+#include "driver/dataset_links.h"
+#include "support/fsutil.h"
+#include "support/paths.h"
+
+namespace {
+
+constexpr std::size_t longest_text = 4096;
+constexpr std::size_t most_names = 10000;
+
+unsigned refusals = 0;
+
+void note_refusal() {
+  ++refusals;
+  throw std::bad_alloc();
+}
+
+bool is_regular(const std::string& path) {
+  struct stat status {};
+  return ::stat(path.c_str(), &status) == 0 && S_ISREG(status.st_mode);
+}
+
+entry entry_at(const char* path) {
+  struct stat status {};
+  if (::lstat(path, &status) != 0) {
+    if (errno == ENOENT) return {};
+    return {entry::kind::unknown, {}, errno};
+  }
+  if (S_ISREG(status.st_mode)) return {entry::kind::file};
+  if (S_ISDIR(status.st_mode)) return {entry::kind::directory};
+  if (!S_ISLNK(status.st_mode)) return {entry::kind::special};
+  char target[longest_text];
+  const ssize_t length = ::readlink(path, target, sizeof target);
+  if (length < 0) return {entry::kind::unknown, {}, errno};
+  return {entry::kind::link, {target, static_cast<std::size_t>(length)}};
+}
+
+// The text of a record, for which links are followed, as the boot does.
+entry record_at(const char* path) {
+  entry record = entry_at(path);
+  if (!is_regular(path)) return record;
+  const int file = ::open(path, O_RDONLY | O_CLOEXEC);
+  if (file < 0) return record;
+  char text[longest_text];
+  const ssize_t length = ::read(file, text, sizeof text);
+  ::close(file);
+  if (length > 0 && record.what == entry::kind::file)
+    record.text.assign(text, static_cast<std::size_t>(length));
+  return record;
+}
+
+link_pair pair_of(const link_facts& links) {
+  if (!links.current_path) return link_pair::no_dataset;
+  const std::string& path = *links.current_path;
+  const bool has_icu = links.icutz.what != entry::kind::none;
+  if (path.empty())
+    return has_icu ? link_pair::system_with_icu : link_pair::system;
+  if (links.zoneinfo.text != path + "/zoneinfo") return link_pair::not_the_tree;
+  if (!has_icu) return link_pair::update_without_icu;
+  return links.icutz.text == path + "/icutz" ? link_pair::update
+                                             : link_pair::update_with_other_icu;
+}
+
+// The names in a directory, as it lists them, no more than anybody reads.
+int list(const std::string& path, std::vector<std::string>& names) {
+  DIR* const directory = ::opendir(path.c_str());
+  if (directory == nullptr) return errno;
+  while (const dirent* const item = ::readdir(directory)) {
+    const std::string name = item->d_name;
+    if (name != "." && name != "..") names.push_back(name);
+    if (names.size() == most_names) break;
+  }
+  ::closedir(directory);
+  return 0;
+}
+
+void expect_file(dataset_facts& facts, const std::string& path) {
+  if (is_regular(path) && ::access(path.c_str(), R_OK) == 0) return;
+  facts.unreadable.push_back(
+      path + ": " +
+      (is_regular(path) || errno != 0 ? std::strerror(errno) : "not a file"));
+}
+
+void note_unreadable(dataset_facts& facts) {
+  errno = 0;
+  if (facts.path.empty()) {
+    expect_file(facts, std::string(paths::system_zoneinfo) + "/+VERSION");
+    errno = 0;
+    expect_file(facts, std::string(paths::system_icu) + "/icutzformat.txt");
+    return;
+  }
+  expect_file(facts, facts.path + "/zoneinfo/+VERSION");
+  std::vector<std::string> names;
+  const std::string icu = facts.path + "/icutz";
+  if (const int error = list(icu, names); error != 0)
+    facts.unreadable.push_back(icu + ": " + std::strerror(error));
+  std::vector<std::string> schemas;
+  for (const auto& name : names) {
+    const std::string schema(icu_schema_in(name));
+    if (!schema.empty() && is_regular(icu + "/" + name)) schemas.push_back(schema);
+  }
+  facts.has_several_schemas =
+      !schemas.empty() && !std::all_of(schemas.begin(), schemas.end(),
+                                       [&](const std::string& schema) {
+                                         return schema == schemas.front();
+                                       });
+}
+
+// Building it tells; what is kept afterwards is short.
+dataset_facts facts_of(const std::string& path, const mln_dataset* system) {
+  dataset_facts facts;
+  facts.path = path;
+  const unsigned before = refusals;
+  try {
+    const mln_dataset built(path);
+    facts.version_text = built.version_string.substr(0, longest_text);
+    facts.version = built.version;
+    facts.schema = dynamic_cast<const mln_icu&>(*built.components.back())
+                       .schema.substr(0, longest_text);
+    facts.fits_system = path.empty() || (system != nullptr && built.compatible_with(*system));
+  } catch (const std::invalid_argument&) {
+    facts.ends = dataset_facts::state::bad_path;
+  } catch (const std::out_of_range&) {
+    facts.ends = dataset_facts::state::number_too_large;
+  } catch (int) {
+    facts.ends = dataset_facts::state::walk_failed;
+  } catch (const std::exception&) {
+    facts.ends = dataset_facts::state::no_memory;
+  }
+  facts.word_is_cut = refusals != before;
+  if (facts.ends != dataset_facts::state::bad_path) note_unreadable(facts);
+  return facts;
+}
+
+}  // namespace
+
+link_facts read_links() {
+  link_facts links;
+  links.zoneinfo = entry_at(paths::zoneinfo_link);
+  links.icutz = entry_at(paths::icu_link);
+  links.localtime = entry_at(paths::localtime_link);
+  links.tz_latest = entry_at(paths::latest_update_link);
+  links.record = record_at(paths::version_record);
+  links.legacy_icutz = entry_at(paths::legacy_icu_link);
+  links.old_icu = entry_at(paths::obsolete_icu);
+  links.zone_is_file = is_regular(paths::localtime_link);
+  try {
+    links.current_path = current_dataset_path();
+  } catch (int) {
+  }
+  links.pair = pair_of(links);
+  return links;
+}
+
+device_facts read_device() {
+  std::set_new_handler(note_refusal);
+  device_facts device;
+  device.links = read_links();
+  device.legacy_resolves = fsutil::exists(paths::legacy_icu_link);
+  device.icutz_resolves = fsutil::exists(paths::icu_link);
+  std::unique_ptr<mln_dataset> system;
+  device.system = facts_of({}, nullptr);
+  if (device.system.ends == dataset_facts::state::built)
+    system = std::make_unique<mln_dataset>();
+  if (device.links.current_path)
+    device.current = facts_of(*device.links.current_path, system.get());
+  if (device.links.tz_latest.what == entry::kind::link)
+    device.update = facts_of(latest_update_path(), system.get());
+  device.downloads_error = list(paths::download_root, device.downloads);
+  std::sort(device.downloads.begin(), device.downloads.end());
+  return device;
+}

@@ -1,0 +1,117 @@
+// SPDX-License-Identifier: BSD-2-Clause
+#include <cstring>
+#include <nlohmann/json.hpp>
+
+#include "tools/escaped.h"
+#include "tools/status/report.h"
+#include "tools/status/words.h"
+
+namespace {
+
+using json = nlohmann::ordered_json;
+
+json text_or_null(const std::string& text) {
+  return text.empty() ? json() : json(escaped(text));
+}
+
+json object_of(const entry& here) {
+  json object{{"kind", kind_of(here)}};
+  if (here.what == entry::kind::link) object["target"] = escaped(here.text);
+  if (here.what == entry::kind::unknown)
+    object["error"] = std::strerror(here.error);
+  return object;
+}
+
+json version_of(const dataset_facts& set) {
+  return set.has_version() ? text_or_null(set.version_text) : json();
+}
+
+json list_of(const std::vector<std::string>& texts) {
+  json list = json::array();
+  for (const auto& text : texts) list.push_back(escaped(text));
+  return list;
+}
+
+const char* name_of(dataset_facts::state ends) {
+  switch (ends) {
+    case dataset_facts::state::built:
+      return "readable";
+    case dataset_facts::state::bad_path:
+      return "elsewhere";
+    case dataset_facts::state::number_too_large:
+      return "number_too_large";
+    case dataset_facts::state::walk_failed:
+      return "walk_failed";
+    case dataset_facts::state::no_memory:
+      break;
+  }
+  return "no_memory";
+}
+
+json object_of(const dataset_facts& set) {
+  json object{{"path", text_or_null(set.path)},
+              {"version", version_of(set)},
+              {"schema", text_or_null(set.schema)},
+              {"state", name_of(set.ends)},
+              {"unreadable", list_of(set.unreadable)}};
+  if (!set.path.empty()) object["fits_system"] = set.fits_system;
+  return object;
+}
+
+json object_of(const link_facts& links) {
+  json record = object_of(links.record);
+  if (links.record.what == entry::kind::file)
+    record["text"] = escaped(links.record.text);
+  return {{"in_use", data_in_use(links)},
+          {"pair", name_of(links.pair)},
+          {"zoneinfo", object_of(links.zoneinfo)},
+          {"icutz", object_of(links.icutz)},
+          {"localtime", object_of(links.localtime)},
+          {"zone", text_or_null(zone_of(links))},
+          {"zone_is_file", links.zone_is_file},
+          {"tz_latest", object_of(links.tz_latest)},
+          {"record", record},
+          {"legacy_icutz", object_of(links.legacy_icutz)},
+          {"old_icu", object_of(links.old_icu)}};
+}
+
+json object_of(const rehearsal& boot) {
+  json lines = json::array();
+  for (const auto& said : boot.lines) lines.push_back(escaped(said.text));
+  json object{{"ends", boot.ends_normally ? "normally" : "abnormally"}};
+  if (!boot.ends_normally) object["thrown"] = escaped(boot.thrown);
+  object["lines"] = lines;
+  return object;
+}
+
+}  // namespace
+
+std::string in_json(const report& told) {
+  json object{{"format", 1}};
+  object["status"] = static_cast<int>(told.why.is);
+  object["reasons"] = told.why.reasons;
+  object["now"] = object_of(told.device.links);
+  object["system"] = object_of(told.device.system);
+  object["current"] =
+      told.device.current ? object_of(*told.device.current) : json();
+  object["announced"] =
+      told.device.update ? object_of(*told.device.update) : json();
+  json downloads = json::array();
+  for (const auto& name : told.device.downloads)
+    downloads.push_back({{"name", escaped(name)},
+                         {"needed_by", needed_by(told.device.links, name)}});
+  object["downloads"] = downloads;
+
+  json boot = object_of(told.boot);
+  json steps = json::array();
+  for (const auto& done : told.why.steps)
+    steps.push_back({{"step", done.name},
+                     {"does", done.does},
+                     {"reason", done.reason},
+                     {"text", done.text}});
+  boot["steps"] = steps;
+  boot["after"] = object_of(told.after);
+  object["next_boot"] = boot;
+  object["cannot_know"] = told.cannot_know;
+  return object.dump(2) + "\n";
+}

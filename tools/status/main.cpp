@@ -1,0 +1,205 @@
+// SPDX-License-Identifier: BSD-2-Clause
+//
+// marlin-status: which data a device uses, and what its next boot will do.
+#include <getopt.h>
+#include <sys/ioctl.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <exception>
+#include <string>
+
+#include "tools/escaped.h"
+#include "tools/status/report.h"
+#include "tools/status/throwaway.h"
+
+namespace {
+
+constexpr int bad_use = 64;
+constexpr int not_here = 77;
+
+// What a hostile device may cost before the answer is that it cannot be told.
+constexpr unsigned long most_memory = 48ul << 20;
+constexpr unsigned most_seconds = 1;
+constexpr unsigned longest_wait = 30;  // seconds, for storage that never answers
+
+constexpr char help[] =
+    "usage: marlin-status [--root DIR] [--json | --check]\n"
+    "\n"
+    "Tells which time-zone data a device uses, and what its next boot will do.\n"
+    "Nothing is changed: the boot is run in a throw-away layer over the device.\n"
+    "\n"
+    "  --root DIR   the device unpacked or mounted in DIR, not this system\n"
+    "  --json       one JSON object\n"
+    "  --check      only the reasons for a status of 1 or 2\n"
+    "  --version    the version of this program\n"
+    "\n"
+    "Exit status: 0 sound, 1 the next boot changes something on purpose,\n"
+    "2 something is wrong, 64 bad use, 77 it cannot be told here.\n";
+
+enum class form { rows, json, reasons };
+
+struct options {
+  std::string root = "/";
+  form wanted = form::rows;
+};
+
+[[noreturn]] void refuse(int status, const std::string& why) {
+  std::fprintf(stderr, "marlin-status: %s\n", why.c_str());
+  std::exit(status);
+}
+
+// Ends the program, after --help and --version too.
+void print_and_exit(const std::string& text) {
+  const bool is_written =
+      std::fwrite(text.data(), 1, text.size(), stdout) == text.size() &&
+      std::fflush(stdout) == 0;
+  std::exit(is_written ? 0 : not_here);
+}
+
+options parse(int count, char** words) {
+  static const option known[] = {{"root", required_argument, nullptr, 'r'},
+                                 {"json", no_argument, nullptr, 'j'},
+                                 {"check", no_argument, nullptr, 'c'},
+                                 {"help", no_argument, nullptr, 'h'},
+                                 {"version", no_argument, nullptr, 'v'},
+                                 {}};
+  options chosen;
+  int letter = 0;
+  opterr = 0;
+  while ((letter = getopt_long(count, words, "+h", known, nullptr)) != -1) {
+    switch (letter) {
+      case 'r':
+        chosen.root = optarg;
+        break;
+      case 'j':
+        chosen.wanted = form::json;
+        break;
+      case 'c':
+        chosen.wanted = form::reasons;
+        break;
+      case 'h':
+        print_and_exit(help);
+        break;
+      case 'v':
+        print_and_exit("marlin-status " MARLIN_VERSION "\n");
+        break;
+      default:
+        refuse(bad_use, escaped(words[optind - 1]) +
+                            " is not understood; see --help");
+    }
+  }
+  if (optind != count)
+    refuse(bad_use, escaped(words[optind]) + " is not expected; see --help");
+  return chosen;
+}
+
+look of_terminal() {
+  winsize size{};
+  look wanted;
+  if (::isatty(STDOUT_FILENO) == 0) return wanted;
+  if (::ioctl(STDOUT_FILENO, TIOCGWINSZ, &size) == 0) wanted.width = size.ws_col;
+  const char* const colourless = std::getenv("NO_COLOR");
+  wanted.has_colour = colourless == nullptr || *colourless == '\0';
+  return wanted;
+}
+
+std::vector<std::string> unknown(const report& told, bool is_running_system) {
+  std::vector<std::string> texts;
+  const auto has_several = [](const std::optional<dataset_facts>& set) {
+    return set && set->has_several_schemas;
+  };
+  if (!is_running_system && (has_several(told.device.current) ||
+                             has_several(told.device.update)))
+    texts.push_back(
+        "which ICU data file comes first on the device's own file system");
+  if (!(told.after.zoneinfo == told.device.links.zoneinfo) ||
+      !(told.after.localtime == told.device.links.localtime))
+    texts.push_back("whether there is space for the links");
+  if (!is_running_system)
+    texts.push_back("what the device mounts over this tree");
+  return texts;
+}
+
+bool is_like_before(const report& told) {
+  return told.boot.lines.empty() && told.boot.ends_normally &&
+         told.after.zoneinfo == told.device.links.zoneinfo &&
+         told.after.icutz == told.device.links.icutz;
+}
+
+report examine(const options& chosen) {
+  const bool is_ours = enter_throwaway_device(chosen.root);
+  become_the_boot(most_memory, most_seconds);
+  report told;
+  told.device = read_device();
+  told.boot = rehearse_boot();
+  told.after = read_links();
+
+  // A word that is cut costs one refusal, and an update's decides nothing.
+  unsigned expected = 0;
+  for (const auto* set : {&told.device.current, &told.device.update})
+    if (*set && !(*set)->path.empty() && (*set)->word_is_cut) ++expected;
+  if (told.device.system.word_is_cut || told.boot.refusals > expected)
+    throw cannot_tell("the next boot takes more than " +
+                      std::to_string(most_memory >> 20) + " MB of memory");
+  for (const auto& said : told.boot.lines)
+    if (said.error == EOVERFLOW)
+      throw cannot_tell("a change to an owner's files cannot be tried by this "
+                        "user");
+  if (!is_ours && !is_like_before(told))
+    throw cannot_tell(
+        "what the next boot changes: the device belongs to another user; run this "
+        "as its root");
+  told.why = explain(told.device, told.boot, told.after);
+  told.cannot_know = unknown(told, chosen.root == "/");
+  return told;
+}
+
+int tell(const options& chosen) {
+  const look wanted = of_terminal();
+  const report told = examine(chosen);
+  const std::string text = chosen.wanted == form::json ? in_json(told)
+                           : chosen.wanted == form::reasons
+                               ? in_reasons(told)
+                               : in_rows(told, wanted);
+  if (std::fwrite(text.data(), 1, text.size(), stdout) != text.size() ||
+      std::fflush(stdout) != 0)
+    throw cannot_tell(std::string("standard output: ") + std::strerror(errno));
+  return static_cast<int>(told.why.is);
+}
+
+// In a child: whatever a device does to it, there is an answer.
+int tell_or_say_why_not(const options& chosen) {
+  try {
+    return tell(chosen);
+  } catch (const std::exception& reason) {
+    std::fprintf(stderr, "marlin-status: cannot tell: %s\n", reason.what());
+    return not_here;
+  }
+}
+
+}  // namespace
+
+int main(int count, char** words) {
+  const options chosen = parse(count, words);
+  const pid_t child = ::fork();
+  if (child < 0) refuse(not_here, std::string("fork: ") + std::strerror(errno));
+  if (child == 0) std::_Exit(tell_or_say_why_not(chosen));
+
+  // The default action of the alarm would be silent.
+  ::signal(SIGALRM, [](int) {
+    constexpr char text[] = "marlin-status: cannot tell: the device does not answer\n";
+    static_cast<void>(!::write(STDERR_FILENO, text, sizeof text - 1));
+    std::_Exit(not_here);
+  });
+  ::alarm(longest_wait);
+  int status = 0;
+  ::waitpid(child, &status, 0);
+  if (WIFEXITED(status)) return WEXITSTATUS(status);
+  refuse(not_here, std::string("cannot tell: ended here by ") +
+                       ::strsignal(WTERMSIG(status)));
+}

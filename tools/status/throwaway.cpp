@@ -1,0 +1,329 @@
+// SPDX-License-Identifier: BSD-2-Clause
+#include "tools/status/throwaway.h"
+
+#include <fcntl.h>
+#include <grp.h>
+#include <linux/capability.h>
+#include <linux/openat2.h>
+#include <sched.h>
+#include <sys/mount.h>
+#include <sys/prctl.h>
+#include <sys/resource.h>
+#include <sys/stat.h>
+#include <sys/statvfs.h>
+#include <sys/syscall.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdint>
+#include <cstring>
+#include <utility>
+#include <vector>
+
+#include "tools/escaped.h"
+#include "tools/status/mounts.h"
+
+namespace {
+
+constexpr char writable[] = "/var/db";
+constexpr char downloads[] = "/var/db/timezone/tz";
+
+[[noreturn]] void fail(const std::string& what) {
+  const int error = errno;
+  throw cannot_tell(what + ": " + std::strerror(error));
+}
+
+void must(long result, const std::string& what) {
+  if (result < 0) fail(what);
+}
+
+class descriptor {
+ public:
+  explicit descriptor(int number) : number_(number) {}
+  ~descriptor() {
+    if (number_ >= 0) ::close(number_);
+  }
+  descriptor(const descriptor&) = delete;
+  descriptor& operator=(const descriptor&) = delete;
+  descriptor(descriptor&& other) noexcept : number_(other.number_) {
+    other.number_ = -1;
+  }
+  int get() const { return number_; }
+
+ private:
+  int number_;
+};
+
+descriptor open_directory(const std::string& path) {
+  descriptor opened(::open(path.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
+  must(opened.get(), escaped(path));
+  return opened;
+}
+
+void write_file(const char* path, const std::string& text) {
+  const descriptor file(::open(path, O_WRONLY | O_CLOEXEC));
+  must(file.get(), path);
+  must(::write(file.get(), text.data(), text.size()), path);
+}
+
+void map_to_root(const char* file, unsigned id) {
+  write_file(file, "0 " + std::to_string(id) + " 1\n");
+}
+
+void enter_namespaces() {
+  const unsigned user = ::geteuid();
+  const unsigned group = ::getegid();
+  if (::unshare(CLONE_NEWNS) == 0) return;
+  if (errno != EPERM) fail("unshare");
+  must(::unshare(CLONE_NEWUSER | CLONE_NEWNS),
+       "this user may not have namespaces");
+  write_file("/proc/self/setgroups", "deny");
+  map_to_root("/proc/self/uid_map", user);
+  map_to_root("/proc/self/gid_map", group);
+}
+
+void set_attributes(int tree, unsigned flags, unsigned long attributes) {
+  mount_attr wanted{};
+  wanted.attr_set = attributes;
+  must(::mount_setattr(tree, "", AT_EMPTY_PATH | flags, &wanted, sizeof wanted),
+       "mount_setattr");
+}
+
+// Read only with all that is mounted below, without updates of access times
+// where the system lets them be switched off.
+void protect(int tree) {
+  set_attributes(tree, AT_RECURSIVE, MOUNT_ATTR_RDONLY);
+  try {
+    mount_attr wanted{};
+    wanted.attr_set = MOUNT_ATTR_NOATIME;
+    wanted.attr_clr = MOUNT_ATTR__ATIME;
+    must(::mount_setattr(tree, "", AT_EMPTY_PATH | AT_RECURSIVE, &wanted,
+                         sizeof wanted),
+         "mount_setattr");
+  } catch (const cannot_tell&) {
+  }
+}
+
+// A writable layer over the directory in which this process is. The layer's own
+// place is the directory `layer` of the root that this process has, so that no
+// name of the device's becomes part of a list of options.
+descriptor make_layer(const std::string& layer) {
+  const std::string upper = layer + "/upper";
+  const std::string work = layer + "/work";
+  must(::mkdir(layer.c_str(), 0700), "mkdir");
+  must(::mkdir(upper.c_str(), 0755), "mkdir");
+  must(::mkdir(work.c_str(), 0755), "mkdir");
+  // The layer's own root gives the merged directory its owner and mode.
+  struct stat status {};
+  must(::stat(".", &status), "stat");
+  // Owners that this user cannot stand in for are noticed by belongs_to_us().
+  if (::chown(upper.c_str(), status.st_uid, status.st_gid) != 0 &&
+      errno != EINVAL && errno != EPERM)
+    fail("chown");
+  must(::chmod(upper.c_str(), status.st_mode & 07777), "chmod");
+
+  const descriptor options(::fsopen("overlay", FSOPEN_CLOEXEC));
+  must(options.get(), "no overlay file system here: fsopen");
+  const auto set = [&](const char* key, const char* value) {
+    must(::fsconfig(options.get(),
+                    value == nullptr ? FSCONFIG_SET_FLAG : FSCONFIG_SET_STRING,
+                    key, value, 0),
+         "overlay");
+  };
+  set("lowerdir", ".");
+  set("upperdir", upper.c_str());
+  set("workdir", work.c_str());
+  // Ordinary users may not set the attributes of the other kind.
+  set("userxattr", nullptr);
+  must(::fsconfig(options.get(), FSCONFIG_CMD_CREATE, nullptr, nullptr, 0),
+       "overlay");
+  descriptor mounted(::fsmount(options.get(), FSMOUNT_CLOEXEC, 0));
+  must(mounted.get(), "overlay");
+  return mounted;
+}
+
+
+// Inside `root`, whatever links say.
+descriptor open_inside(int root, const std::string& path, std::uint64_t flags) {
+  open_how how{};
+  how.flags = O_PATH | O_CLOEXEC | flags;
+  how.resolve = RESOLVE_IN_ROOT | RESOLVE_NO_MAGICLINKS;
+  return descriptor(static_cast<int>(
+      ::syscall(SYS_openat2, root, path.c_str(), &how, sizeof how)));
+}
+
+// A directory of the kernel's about this process, which stays in reach when the
+// root is another.
+class process {
+ public:
+  process() : directory_(open_directory("/proc")) {}
+
+  std::string path_of(const descriptor& opened) const {
+    char path[4096];
+    const std::string link = "self/fd/" + std::to_string(opened.get());
+    const ssize_t length =
+        ::readlinkat(directory_.get(), link.c_str(), path, sizeof path);
+    must(length, "readlink");
+    return std::string(path, static_cast<std::size_t>(length));
+  }
+
+  std::string mounts() const {
+    const descriptor file(::openat(directory_.get(), "self/mountinfo",
+                                   O_RDONLY | O_CLOEXEC));
+    must(file.get(), "/proc/self/mountinfo");
+    std::string text;
+    char buffer[4096];
+    ssize_t count = 0;
+    while ((count = ::read(file.get(), buffer, sizeof buffer)) > 0)
+      text.append(buffer, static_cast<std::size_t>(count));
+    must(count, "/proc/self/mountinfo");
+    return text;
+  }
+
+ private:
+  descriptor directory_;
+};
+
+descriptor clone_tree(int directory, unsigned flags) {
+  descriptor tree(::open_tree(
+      directory, "", AT_EMPTY_PATH | OPEN_TREE_CLONE | OPEN_TREE_CLOEXEC | flags));
+  must(tree.get(), "open_tree");
+  return tree;
+}
+
+void attach(const descriptor& tree, int target) {
+  must(::move_mount(tree.get(), "", target, "",
+                    MOVE_MOUNT_F_EMPTY_PATH | MOVE_MOUNT_T_EMPTY_PATH),
+       "move_mount");
+}
+
+bool belongs_to_us(int root, const char* path) {
+  const descriptor directory = open_inside(root, path, O_DIRECTORY);
+  struct stat status {};
+  return ::fstat(directory.get(), &status) != 0 || status.st_uid == ::geteuid();
+}
+
+bool is_below(const std::string& path, const std::string& directory) {
+  return path.starts_with(directory) &&
+         (path.size() == directory.size() || path[directory.size()] == '/');
+}
+
+// The layers over "/var/db" and what is mounted below. All paths here are seen
+// from the base, in which the device is "/root". `original` is the device as it
+// was, if what is read only there is to stay so, otherwise -1.
+class layers {
+ public:
+  layers(int root, const process& self, int original)
+      : root_(root), self_(self), original_(original) {}
+
+  void lay() {
+    const descriptor base = open_inside(root_, writable, O_DIRECTORY);
+    // Without the directory there is nothing that a boot could write to.
+    if (base.get() < 0) return;
+    const std::string top = self_.path_of(base);
+    const descriptor tz = open_inside(root_, downloads, O_DIRECTORY);
+    const std::string read_only = tz.get() < 0 ? "//" : self_.path_of(tz);
+
+    std::vector<std::pair<std::string, descriptor>> mounted;
+    for (const auto& place : mounts_below(self_.mounts(), top))
+      mounted.emplace_back(place, open_inside(root_, inside(place), 0));
+    over(base, base.get(), inside(top));
+    for (const auto& [place, lower] : mounted) {
+      const descriptor target = open_inside(root_, inside(place), 0);
+      if (lower.get() < 0 || target.get() < 0) continue;
+      if (!is_directory(lower) || is_below(place, read_only))
+        attach(clone_tree(lower.get(), 0), target.get());
+      else
+        over(lower, target.get(), inside(place));
+    }
+    protect_downloads();
+  }
+
+ private:
+  static std::string inside(const std::string& place) {
+    return place.substr(std::strlen("/root"));
+  }
+
+  static bool is_directory(const descriptor& opened) {
+    struct stat status {};
+    return ::fstat(opened.get(), &status) == 0 && S_ISDIR(status.st_mode);
+  }
+
+  bool is_read_only(const std::string& place) const {
+    if (original_ < 0) return false;
+    const descriptor before = open_inside(original_, place, 0);
+    struct statvfs status {};
+    must(::fstatvfs(before.get(), &status), "statvfs");
+    return (status.f_flag & ST_RDONLY) != 0;
+  }
+
+  void over(const descriptor& lower, int target, const std::string& place) {
+    must(::fchdir(lower.get()), "chdir");
+    const descriptor layer = make_layer("/" + std::to_string(count_++));
+    must(::chdir("/"), "chdir");
+    if (is_read_only(place)) set_attributes(layer.get(), 0, MOUNT_ATTR_RDONLY);
+    attach(layer, target);
+  }
+
+  void protect_downloads() const {
+    const descriptor tz = open_inside(root_, downloads, O_DIRECTORY);
+    if (tz.get() < 0) return;
+    const descriptor copy = clone_tree(tz.get(), AT_RECURSIVE);
+    set_attributes(copy.get(), AT_RECURSIVE, MOUNT_ATTR_RDONLY);
+    attach(copy, tz.get());
+  }
+
+  int root_;
+  const process& self_;
+  int original_;
+  int count_ = 0;
+};
+
+}  // namespace
+
+bool enter_throwaway_device(const std::string& root) {
+  enter_namespaces();
+  must(::mount(nullptr, "/", nullptr, MS_REC | MS_PRIVATE, nullptr), "mount");
+  const descriptor device = open_directory(root);
+  const process self;
+  const bool is_running_system = self.path_of(device) == "/";
+
+  // Taken before anything is covered.
+  const descriptor tree = clone_tree(device.get(), AT_RECURSIVE);
+  protect(tree.get());
+  // A base of our own. Where it lies does not matter: this process sees nothing
+  // else from then on, and no other process sees it.
+  must(::mount("base", "/proc", "tmpfs", 0, "mode=0755"), "tmpfs");
+  must(::chdir("/proc"), "chdir");
+  must(::chroot("."), "chroot");
+  must(::mkdir("/root", 0700), "mkdir");
+  attach(tree, open_directory("/root").get());
+  const descriptor inside = open_directory("/root");
+  const bool is_ours = belongs_to_us(inside.get(), "/var/db") &&
+                       belongs_to_us(inside.get(), "/var/db/timezone");
+  layers(inside.get(), self, is_running_system ? device.get() : -1).lay();
+  must(::fchdir(inside.get()), "chdir");
+  must(::chroot("."), "chroot");
+  must(::chdir("/"), "chdir");
+  return is_ours;
+}
+
+void become_the_boot(unsigned long memory, unsigned seconds) {
+  ::umask(022);
+  // Not allowed where this user is not really root, and needless there.
+  ::setgroups(0, nullptr);
+  const auto limit = [](auto resource, rlim_t value) {
+    const rlimit both{value, value};
+    must(::setrlimit(resource, &both), "setrlimit");
+  };
+  limit(RLIMIT_CORE, 0);
+  limit(RLIMIT_CPU, seconds);
+#if !defined(__SANITIZE_ADDRESS__)
+  // Sanitizers reserve terabytes of addresses.
+  limit(RLIMIT_AS, memory);
+#endif
+  must(::prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0), "no_new_privs");
+  __user_cap_header_struct header{_LINUX_CAPABILITY_VERSION_3, 0};
+  const __user_cap_data_struct none[2] = {};
+  must(::syscall(SYS_capset, &header, none), "capset");
+}
