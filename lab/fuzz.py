@@ -19,7 +19,7 @@ from lab.doors import build, need
 from lab.places import BUILD, PROJECT
 
 PLACE = BUILD / "fuzz"
-TARGETS = ["version_text", "icu_file_name", "zoneinfo_link", "first_word"]
+TARGETS = ["version_text", "icu_file_name", "zoneinfo_link", "first_word", "mounts"]
 
 # The format is told in the first line of every file; tests/fuzz/replay.cpp reads
 # it too.

@@ -11,7 +11,7 @@ takes samples, in eight minutes.
   states     many thousand devices composed at random
   load       too much of everything
   log        a log that is lost, or fails in the middle
-  lab        the lab's own carriers
+  status     what marlin-status says, against what then happens
   fuzz       hostile texts
   sanitize   the tests under sanitizers and (not with --quick) valgrind
   coverage   lines and branches that the tests run through
@@ -38,7 +38,7 @@ TRIALS = {
     "states": ["test_states.py"],
     "load": ["test_load.py"],
     "log": ["test_log.py"],
-    "lab": ["test_archive.py"],
+    "status": ["test_status.py"],
 }
 OTHERS = {  # the whole, and with --quick
     "fuzz": (["lab.fuzz", "--seconds", "600"], ["lab.fuzz", "--seconds", "60"]),
@@ -52,9 +52,15 @@ OTHERS = {  # the whole, and with --quick
 def trials(name: str, *arguments: str) -> list[str]:
     """The command that runs tests in workers, each on a private device of its own."""
     workers = min(os.cpu_count() or 1, 8)
-    return [*PYTHON, "pytest", "-c", "lab/pytest.ini", f"--rootdir={PROJECT}", "-q",
-            "--tx", f"{workers}*popen//python=lab/worker", "--dist", "load",
-            "--maxfail", "10", f"--junit-xml={BUILD}/prove/{name}.xml", *arguments]
+    command = [
+        *PYTHON, "pytest", "-c", "lab/pytest.ini", f"--rootdir={PROJECT}", "-q",
+        "--tx", f"{workers}*popen//python=lab/worker", "--dist", "load",
+        "--maxfail", "10", f"--junit-xml={BUILD}/prove/{name}.xml", *arguments]
+    if os.geteuid() == 0 and "lab/test_status.py" in " ".join(arguments):
+        # On a private device root has no capability, and may then not have the
+        # namespaces that any other user may have.
+        return "bwrap --unshare-user --uid 1000 --gid 1000 --dev-bind / /".split() + command
+    return command
 
 
 def prove(name: str, command: list[str]) -> tuple[bool, str]:

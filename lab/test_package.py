@@ -26,6 +26,7 @@ WORK = BUILD / "packaging"
 ARCHITECTURES = {"release": "amd64", "arm64-release": "arm64"}  # by preset
 
 CONTENT = dict(reversed(line.split(maxsplit=1)) for line in """
+    755 /usr/bin/marlin-status
     644 /usr/lib/systemd/system/marlin.service
     777 /usr/lib/systemd/system/sysinit.target.wants/marlin.service -> ../marlin.service
     644 /usr/lib/tmpfiles.d/marlin.conf
@@ -44,6 +45,7 @@ CONTENT = dict(reversed(line.split(maxsplit=1)) for line in """
     644 /usr/share/doc/marlin/examples/inittab
     644 /usr/share/lintian/overrides/marlin
     644 /usr/share/man/man5/marlin-layout.5.gz
+    644 /usr/share/man/man8/marlin-status.8.gz
     644 /usr/share/man/man8/marlin.8.gz
 """.strip().splitlines())
 

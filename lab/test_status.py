@@ -5,19 +5,25 @@ then the device is really booted. Asking leaves no trace on the device.
 This takes a user who may have namespaces and is not root: lab.prove starts it so.
 """
 
+import contextlib
 import json
 import os
 import random
 import re
+import shutil
+import stat
 import subprocess
+import termios
+from collections.abc import Callable
 from errno import ENOENT
+from pathlib import Path
 from typing import NamedTuple
 
 import pytest
 
 from lab import boot, lines
 from lab.carriers import namespace
-from lab.device import Device, Node
+from lab.device import Device, Node, encoded
 from lab.devices import CHOSEN
 from lab.paths import (DOWNLOADS, ICUTZ, LEGACY_ICUTZ, LOCALTIME, OLD_ICU, RECORD,
                        SYSTEM_ICU, SYSTEM_ZONEINFO, TZ_LATEST, ZONEINFO, update_path)
@@ -118,8 +124,8 @@ def boot_differences(said: dict, seen: Seen) -> list[str]:
 
 
 def status_differences(said: dict, seen: Seen) -> list[str]:
-    before, after = (as_device(entries).contents() for entries in
-                     (seen.before, seen.after))
+    before, after = ({path: (here.kind, here.text) for path, here in entries.items()}
+                     for entries in (seen.before, seen.after))
     if said["status"] == 0 and (before != after or seen.ending != "exit 0"):
         return ["said that nothing changes"]
     if said["status"] == 1 and before == after:
@@ -127,6 +133,50 @@ def status_differences(said: dict, seen: Seen) -> list[str]:
     if (said["status"] == 0) != (said["reasons"] == []):
         return [f"status {said['status']} for the reasons {said['reasons']}"]
     return []
+
+
+def version_of(text: str) -> tuple:
+    """A reading of versions that is not the program's."""
+    groups = re.fullmatch(r"0*(\d+)([a-z]+)(?:\.(\d+))?(?:\.(\d+))?", text)
+    return (-1,) if not groups else (int(groups[1]), groups[2], int(groups[3] or -1),
+                                     int(groups[4] or -1))
+
+
+def name_in(path: str | None, system: dict) -> str:
+    return (unescaped(path).removeprefix(DOWNLOADS) if path
+            else unescaped(system["version"] or ""))
+
+
+def reason_differences(said: dict) -> list[str]:
+    """Whether the reasons of the two comparisons are true of the data sets."""
+    reasons = {step["step"]: step["reason"] for step in said["next_boot"]["steps"]}
+    was_reset = "reset" in {step["does"] for step in said["next_boot"]["steps"]
+                            if step["step"] == "current"}
+    system, update = said["system"], said["announced"]
+    current = system if was_reset or not said["current"] else said["current"]
+    ours = version_of(name_in(system["path"], system))
+    theirs = version_of(name_in(current["path"], system))
+    new = version_of(name_in(update["path"], system)) if update else None
+    true = {
+        "fits": lambda: current["schema"] == system["schema"] and not ours > theirs,
+        "other_schema": lambda: current["schema"] != system["schema"],
+        "older_than_system": lambda: ours > theirs != (-1,),
+        "no_version": lambda: theirs == (-1,) and ours > theirs,
+    }
+    of_update = {
+        "none": lambda: update is None,
+        "newer": lambda: new > theirs and update["schema"] == system["schema"],
+        "same_set": lambda: update["path"] == current["path"],
+        "other_schema": lambda: update["schema"] != system["schema"],
+        "same_version": lambda: new == theirs != (-1,),
+        "no_version": lambda: new == (-1,),
+        "older": lambda: theirs > new != (-1,),
+    }
+    found = []
+    for step, table in ("usable", true), ("update", of_update):
+        if reasons[step] in table and not table[reasons[step]]():
+            found.append(f"said of {step}: {reasons[step]}, which is not so")
+    return found
 
 
 def examine(device: Device, tell: str, count):
@@ -143,7 +193,7 @@ def examine(device: Device, tell: str, count):
     seen = Seen(before, namespace.look(), *booted)
     found += link_differences(said["now"], before)
     found += boot_differences(said["next_boot"], seen)
-    found += status_differences(said, seen)
+    found += status_differences(said, seen) + reason_differences(said)
     if answer.status != said["status"] or answer.errors:
         found.append(f"exit status {answer.status}, {answer.errors!r}")
     if found:
@@ -170,3 +220,371 @@ def test_random_devices(numbers, count):
     for number in numbers:
         examine(compose(random.Random(f"status/{number}")), f"status/{number}", count)
         count("devices asked about")
+
+
+# --- Trees that lie -----------------------------------------------------------------
+
+TREE = Path("/tmp/device")
+ODD_NAME = "a\nb\033[2J %s\xff\\"
+
+
+class Tree:
+    """A device unpacked below TREE; paths are the device's."""
+
+    def __init__(self):
+        if TREE.exists():
+            subprocess.run(["/bin/chmod", "-R", "u+rwx", TREE], check=True)
+            shutil.rmtree(TREE)
+        for folder in ("/var/db/timezone/tz", SYSTEM_ZONEINFO + "/Europe", SYSTEM_ICU):
+            self.directory(folder)
+        self.file(SYSTEM_ZONEINFO + "/+VERSION", "2023c\n")
+        self.file(SYSTEM_ZONEINFO + "/Europe/Paris", "TZif")
+        self.file(SYSTEM_ICU + "/icutzformat.txt", "44l\n")
+        self.link(ZONEINFO, SYSTEM_ZONEINFO)
+        self.link(LOCALTIME, f"{ZONEINFO}/Europe/Paris")
+
+    @staticmethod
+    def at(path: str) -> bytes:
+        return os.fsencode(TREE) + encoded(path)
+
+    def drop(self, path):
+        place = self.at(path)
+        if os.path.isdir(place) and not os.path.islink(place):
+            shutil.rmtree(place)
+        elif os.path.lexists(place):
+            os.unlink(place)
+
+    def directory(self, path, mode=0o755):
+        os.makedirs(self.at(path), exist_ok=True)
+        os.chmod(self.at(path), mode)
+
+    def file(self, path, text="", mode=0o644):
+        self.drop(path)
+        Path(os.fsdecode(self.at(path))).write_bytes(encoded(text))
+        os.chmod(self.at(path), mode)
+
+    def sparse(self, path, size):
+        self.file(path)
+        os.truncate(self.at(path), size)
+
+    def link(self, path, target):
+        self.drop(path)
+        os.symlink(encoded(target), self.at(path))
+
+    def fifo(self, path):
+        self.drop(path)
+        os.mkfifo(self.at(path))
+
+    def socket(self, path):
+        self.drop(path)
+        os.mknod(self.at(path), 0o644 | stat.S_IFSOCK)
+
+    def move(self, path, to):
+        os.rename(self.at(path), self.at(to))
+
+    def update(self, version, schema="44l"):
+        self.directory(f"{update_path(version)}/zoneinfo/Europe")
+        self.directory(f"{update_path(version)}/icutz")
+        self.file(f"{update_path(version)}/zoneinfo/+VERSION", version.split(".")[0])
+        self.file(f"{update_path(version)}/zoneinfo/Europe/Paris", "TZif")
+        self.file(f"{update_path(version)}/icutz/icutz{schema}.dat", "ICU")
+
+    def use(self, version):
+        self.update(version)
+        self.link(ZONEINFO, f"{update_path(version)}/zoneinfo")
+        self.link(ICUTZ, f"{update_path(version)}/icutz")
+
+    def announce(self, version, schema="44l"):
+        self.update(version, schema)
+        self.link(TZ_LATEST, update_path(version))
+
+
+class Case(NamedTuple):
+    change: Callable[[Tree], object]
+    status: int
+    facts: dict  # dotted name -> what is said there
+
+
+def fact(said, name: str):
+    for part in name.split("."):
+        said = said[int(part)] if part.isdigit() else said[part]
+    return said
+
+
+def case(status: int, *changes: Callable[[Tree], object], **facts) -> Case:
+    return Case(lambda tree: [change(tree) for change in changes], status,
+                {name.replace("__", "."): value for name, value in facts.items()})
+
+
+def does(step: str) -> str:
+    """The place of a step in the list of them."""
+    steps = "legacy_icu_link old_icu current usable update last_resort localtime"
+    return f"next_boot__steps__{steps.split().index(step)}__reason"
+
+
+OUTSIDE = "../../../../../../../../../../etc"
+CASES = {
+    "sound": case(0, now__pair="system"),
+    "an update": case(0, lambda t: t.use("2024a.1.0"), now__pair="update",
+                      current__version="2024a.1.0"),
+    "an announcement": case(1, lambda t: t.announce("2024a.1.0"),
+                            **{does("update"): "newer"}),
+    "another schema": case(2, lambda t: t.announce("2024a.1.0", "45l"),
+                           **{does("update"): "other_schema"}),
+    "an old announcement": case(2, lambda t: t.announce("2022a.1.0"),
+                                **{does("update"): "older"}),
+    "the same data again": case(0, lambda t: t.use("2024a.1.0"),
+                                lambda t: t.announce("2024a.1.0"),
+                                **{does("update"): "same_set"}),
+    "a lost icutz": case(2, lambda t: t.use("2024a.1.0"), lambda t: t.drop(ICUTZ),
+                         now__pair="update_without_icu"),
+    "a stale icutz": case(2, lambda t: t.use("2024a.1.0"),
+                          lambda t: t.link(ICUTZ, update_path("2023d.1.0/icutz")),
+                          now__pair="update_with_other_icu"),
+    "an icutz left over": case(2, lambda t: t.link(ICUTZ, update_path("2024a.1.0")),
+                               now__pair="system_with_icu"),
+    "icutz is a directory": case(2, lambda t: t.directory(ICUTZ),
+                                 now__icutz__kind="directory"),
+    "zoneinfo is not the tree": case(
+        2, lambda t: t.use("2024a.1.0"),
+        lambda t: t.link(ZONEINFO, update_path("2024a.1.0/x")),
+        now__pair="not_the_tree"),
+    "no links": case(1, lambda t: t.drop(ZONEINFO), now__zoneinfo__kind="none",
+                     **{does("current"): "no_link"}),
+    "a link named none": case(2, lambda t: t.link(ZONEINFO, "none"),
+                              now__zoneinfo={"kind": "link", "target": "none"}),
+    "a link named a directory": case(
+        2, lambda t: t.link(ZONEINFO, "(a directory)"),
+        now__zoneinfo={"kind": "link", "target": "(a directory)"}),
+    "zoneinfo is a file": case(2, lambda t: t.file(ZONEINFO), now__in_use="none"),
+    "zoneinfo is a directory": case(2, lambda t: t.drop(ZONEINFO),
+                                    lambda t: t.directory(ZONEINFO + "/x"),
+                                    next_boot__ends="abnormally"),
+    "zoneinfo is a FIFO": case(2, lambda t: t.fifo(ZONEINFO)),
+    "zoneinfo is a socket": case(2, lambda t: t.socket(ZONEINFO)),
+    "an odd name": case(
+        2, lambda t: t.announce(ODD_NAME),
+        now__tz_latest__target=r"/var/db/timezone/tz/a\x0ab\x1b[2J %s\xff\\"),
+    "a forged line": case(
+        2, lambda t: t.link(ZONEINFO, "x\nmarlin: forged: No error"),
+        next_boot__lines__0=r"marlin: Bad zoneinfo link x\x0amarlin: forged: "
+                            "No error: No such file or directory"),
+    "a huge number": case(2, lambda t: t.announce("2147483648a"),
+                          announced__state="number_too_large"),
+    "a huge number in use": case(2, lambda t: t.use("2147483648a")),
+    "the system's number": case(
+        2, lambda t: t.file(SYSTEM_ZONEINFO + "/+VERSION", "2147483648a"),
+        next_boot__ends="abnormally", system__version=None),
+    "no version": case(2, lambda t: t.drop(SYSTEM_ZONEINFO + "/+VERSION"),
+                       system__version=None),
+    "no system tree": case(2, lambda t: t.drop(SYSTEM_ZONEINFO), system__version=None),
+    "no format": case(2, lambda t: t.drop(SYSTEM_ICU + "/icutzformat.txt"),
+                      system__schema=None),
+    "a version that is a directory": case(
+        2, lambda t: t.drop(SYSTEM_ZONEINFO + "/+VERSION"),
+        lambda t: t.directory(SYSTEM_ZONEINFO + "/+VERSION"), system__version=None),
+    "a version that is a FIFO": case(2, lambda t: t.fifo(SYSTEM_ZONEINFO + "/+VERSION"),
+                                     system__version=None),
+    "an update's version that is a FIFO": case(
+        1, lambda t: t.announce("2024a.1.0"),
+        lambda t: t.fifo(update_path("2024a.1.0/zoneinfo/+VERSION"))),
+    "icu data that is a FIFO": case(
+        2, lambda t: t.announce("2024a.1.0"),
+        lambda t: t.fifo(update_path("2024a.1.0/icutz/icutz44l.dat")),
+        announced__schema=None),
+    "icu data that others may not read": case(
+        2, lambda t: t.announce("2024a.1.0"),
+        lambda t: os.chmod(t.at(update_path("2024a.1.0/icutz/icutz44l.dat")), 0o640),
+        announced__schema=None),
+    "no icu data": case(2, lambda t: t.announce("2024a.1.0"),
+                        lambda t: t.drop(update_path("2024a.1.0/icutz"))),
+    "two icu data files": case(
+        2, lambda t: t.use("2024a.1.0"),
+        lambda t: t.file(update_path("2024a.1.0/icutz/icutz45l.dat")),
+        lambda t: t.file(update_path("2024a.1.0/icutz/icutz46l.dat")),
+        lambda t: t.drop(update_path("2024a.1.0/icutz/icutz44l.dat"))),
+    "an update that is a link to the host": case(
+        2, lambda t: t.link(update_path("2024a.1.0"), OUTSIDE),
+        lambda t: t.link(TZ_LATEST, update_path("2024a.1.0")), announced__schema=None),
+    "a tree that is a link to the host": case(
+        2, lambda t: t.drop(SYSTEM_ZONEINFO),
+        lambda t: t.link(SYSTEM_ZONEINFO, "/proc/self/root/usr"), system__version=None),
+    "a version that is the host's file": case(
+        2, lambda t: t.link(SYSTEM_ZONEINFO + "/+VERSION", "/etc/hostname"),
+        system__version=None),
+    "a zone that is the host's file": case(
+        2, lambda t: t.link(LOCALTIME, ZONEINFO + OUTSIDE + "/passwd"),
+        now__zone_is_file=False),
+    "a record that is a link to the host": case(
+        1, lambda t: t.announce("2024a.1.0"), lambda t: t.link(RECORD, "/etc/passwd"),
+        next_boot__after__record={"kind": "link", "target": "/etc/passwd"}),
+    "a record that is a directory": case(
+        1, lambda t: t.announce("2024a.1.0"), lambda t: t.directory(RECORD)),
+    "var is a link inside": case(0, lambda t: t.move("/var", "/data"),
+                                 lambda t: t.link("/var", "data")),
+    "var is an absolute link inside": case(0, lambda t: t.move("/var", "/data"),
+                                           lambda t: t.link("/var", "/data")),
+    "the tree is a link inside": case(
+        0, lambda t: t.move(SYSTEM_ZONEINFO, "/tree"),
+        lambda t: t.link(SYSTEM_ZONEINFO, "/tree"), system__version="2023c.1.0"),
+    "the directory is a link inside": case(
+        0, lambda t: t.move("/var/db/timezone", "/var/db/zones"),
+        lambda t: t.link("/var/db/timezone", "/var/db/zones")),
+    "the downloads are a link inside": case(
+        1, lambda t: t.announce("2024a.1.0"), lambda t: t.move(DOWNLOADS, "/updates"),
+        lambda t: t.link("/var/db/timezone/tz", "/updates")),
+    # The boot may write below "/var/db" only.
+    "the directory is a link elsewhere": case(
+        2, lambda t: t.drop(ZONEINFO),
+        lambda t: t.move("/var/db/timezone", "/zones"),
+        lambda t: t.link("/var/db/timezone", "/zones"), next_boot__ends="abnormally"),
+    "a directory that nobody may write": case(
+        2, lambda t: t.announce("2024a.1.0"),
+        lambda t: t.directory("/var/db/timezone", 0o555), next_boot__ends="abnormally"),
+    "a directory that nobody may read": case(
+        2, lambda t: t.directory("/var/db/timezone", 0o000)),
+    "downloads that nobody may read": case(
+        0, lambda t: t.directory("/var/db/timezone/tz", 0o000)),
+    "no var": case(2, lambda t: t.drop("/var")),
+    "no timezone directory": case(2, lambda t: t.drop("/var/db/timezone"),
+                                  next_boot__ends="abnormally"),
+    "nothing at all": case(2, lambda t: t.drop("/var"), lambda t: t.drop("/usr")),
+    "no local zone": case(2, lambda t: t.drop(LOCALTIME),
+                          **{does("localtime"): "no_link"}),
+    "an old local zone": case(
+        1, lambda t: t.link(LOCALTIME, "/usr/share/zoneinfo/Europe/Paris"),
+        **{does("localtime"): "former_place"}),
+    "a local zone that is missing": case(
+        2, lambda t: t.link(LOCALTIME, ZONEINFO + "/Europe/Nowhere"),
+        now__zone_is_file=False),
+    "a loop of links": case(2, lambda t: t.link(LOCALTIME, "localtime")),
+    "a legacy link": case(2, lambda t: t.link(LEGACY_ICUTZ, SYSTEM_ICU),
+                          **{does("legacy_icu_link"): "no_present_link"}),
+    "a legacy directory": case(2, lambda t: t.directory(LEGACY_ICUTZ)),
+    "old data": case(1, lambda t: t.directory(OLD_ICU)),
+    "old data that stays": case(2, lambda t: t.directory(OLD_ICU + "/x")),
+    "a sparse version": case(
+        1, lambda t: t.announce("2024a.1.0"),
+        lambda t: t.sparse(update_path("2024a.1.0/zoneinfo/+VERSION"), 1 << 40)),
+    "many downloads": case(
+        0, lambda t: [t.directory(update_path(f"{n}a.1.0")) for n in range(500)]),
+}
+
+
+@pytest.mark.parametrize("name", CASES)
+def test_a_tree(name):
+    """Whatever it holds: the status, the facts, and not a trace left on it."""
+    change, status, facts = CASES[name]
+    namespace.insist_on_private_device()
+    change(Tree())
+    before = of_tree()
+    answer = ask("--root", str(TREE), "--json")
+    assert of_tree() == before
+    assert (answer.status, answer.errors) == (status, ""), answer.output
+    for name, value in facts.items():
+        assert fact(answer.said, name) == value, name
+    rows = ask("--root", str(TREE))
+    assert (rows.status, rows.errors) == (status, "")
+    assert re.fullmatch(r"[ -~\n]*", rows.output)
+    # Lines of the boot aside, which have it.
+    assert ".1.0" not in re.sub(r"marlin: .*|20\d\d[a-z]\.1\.0|a\.1\.0", "", rows.output)
+    check = ask("--root", str(TREE), "--check")
+    assert check.status == status
+    assert check.output == "".join(f"{reason}\n" for reason in answer.said["reasons"])
+
+
+def of_tree() -> dict:
+    found = {}
+    for folder, folders, names in os.walk(os.fsencode(TREE)):
+        for path in [folder, *(os.path.join(folder, name) for name in names + folders)]:
+            with contextlib.suppress(PermissionError):
+                status = os.lstat(path)
+                found[path] = (status.st_ino, status.st_mode, status.st_mtime_ns,
+                               status.st_ctime_ns, stat.S_ISLNK(status.st_mode)
+                               and os.readlink(path))
+    return found
+
+
+def test_too_much_icu_data_cannot_be_told():
+    """A bound on memory or time is not a guess."""
+    tree = Tree()
+    tree.announce("2024a.1.0", "45l")
+    folder = tree.at(update_path("2024a.1.0/icutz/"))
+    for number in range(200_000):
+        os.mknod(folder + b"%d" % number)
+    answer = ask("--root", str(TREE))
+    assert answer.status in (2, 77)
+    assert answer.status == 2 or re.fullmatch(
+        "marlin-status: cannot tell: .*\n", answer.errors)
+
+
+def test_nothing_outside_is_opened():
+    """Before the root is the tree, only what the program needs for that."""
+    tree = Tree()
+    for path in (SYSTEM_ZONEINFO + "/+VERSION", SYSTEM_ICU + "/icutzformat.txt", RECORD,
+                 update_path("x"), OLD_ICU, LEGACY_ICUTZ):
+        tree.link(path, "/etc/passwd")
+    subprocess.run(["/usr/bin/strace", "-f", "-o", "/tmp/trace", "-e", "trace=%file",
+                    STATUS, "--root", TREE], capture_output=True)
+    before, _, after = Path("/tmp/trace").read_text().rpartition('chroot(".")')
+    assert not re.search(r'open\w*\([^"]*"/etc', after)
+    opened = set(re.findall(r'open\w*\([^"]*"([^"]*)"', before))
+    assert opened and opened <= {
+        "", str(TREE), "/proc", "/proc/self/setgroups", "/proc/self/uid_map",
+        "/proc/self/gid_map", "self/mountinfo", "/root", "var/db", "/var/db",
+        "/var/db/timezone", "/var/db/timezone/tz"}, opened
+
+
+def test_a_tree_that_disappears():
+    for _ in range(20):
+        Tree()
+        asked = subprocess.Popen([STATUS, "--root", TREE], stdout=subprocess.DEVNULL,
+                                 stderr=subprocess.PIPE)
+        shutil.rmtree(TREE)
+        errors = asked.communicate(timeout=30)[1].decode()
+        assert asked.returncode in (0, 1, 2, 77), errors
+        assert asked.returncode == 77 or errors == ""
+
+
+@pytest.mark.parametrize("words, status, line", [
+    (["--rot"], 64, "--rot is not understood; see --help"),
+    (["--root"], 64, "--root is not understood; see --help"),
+    (["x\033[2J"], 64, r"x\x1b[2J is not expected; see --help"),
+    (["--", "--json"], 64, "--json is not expected; see --help"),
+    (["--root", "/nowhere"], 77, "cannot tell: /nowhere: No such file or directory"),
+    (["--root", "/etc/passwd"], 77, "cannot tell: /etc/passwd: Not a directory"),
+])
+def test_bad_use_is_one_line(words, status, line):
+    assert ask(*words) == Answer(status, "", f"marlin-status: {line}\n")
+
+
+def test_it_tells_about_itself():
+    assert ask("--help").output.startswith("usage: marlin-status ")
+    assert re.fullmatch(r"marlin-status \d+\.\d+\.\d+\n", ask("--version").output)
+
+
+def test_a_full_standard_output_is_a_failure():
+    Tree()
+    with open("/dev/full", "wb") as full:
+        done = subprocess.run([STATUS, "--root", TREE], stdout=full,
+                              stderr=subprocess.PIPE)
+    assert done.returncode == 77
+    assert done.stderr.startswith(b"marlin-status: cannot tell: standard output: ")
+
+
+def test_rows_fit_a_terminal():
+    """As wide as the terminal is, with colour only there and only if it is wanted."""
+    Tree().link(ZONEINFO, "x" * 300)
+    for environment, colours in ({}, True), ({"NO_COLOR": "1"}, False):
+        ours, terminal = os.openpty()
+        termios.tcsetwinsize(terminal, (24, 60))
+        subprocess.run([STATUS, "--root", TREE], stdout=terminal, env=environment)
+        os.close(terminal)
+        text = b""
+        with contextlib.suppress(OSError):
+            while piece := os.read(ours, 65536):
+                text += piece
+        os.close(ours)
+        assert (b"\033[" in text) == colours
+        plain = re.sub(rb"\033\[\d*m", b"", text)
+        assert max(map(len, plain.replace(b"\r", b"").split(b"\n"))) <= 60

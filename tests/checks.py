@@ -151,6 +151,19 @@ def manual_pages() -> Iterator[str]:
     yield from differences(texts, "the program", told, "DIAGNOSTICS")
     yield from differences(texts, "the program", set(lines.FORMATS), "lab/lines.py")
 
+    # What marlin-status knows of a boot: its lines, and why it does what.
+    known = Path("tools/status/explanation.cpp").read_text()
+    named = re.search(r"namespace lines \{\n(.*?)\n\}", known, re.S)[1]
+    for text in re.findall(r'=\s*"([^"]*)";', named):
+        if text not in texts:
+            yield f"marlin-status looks for a line that no boot prints: {text}"
+    reasons = {" ".join(row) for row in re.findall(
+        r'^    \{"(\w+)", "(\w+)", "(\w+)",', known, re.M)}
+    told, page = set(), Path("docs/marlin-status.8").read_text()
+    for name, rows in re.findall(r"^\.It Cm (\w+)\n(.*?)^\.El", page, re.M | re.S):
+        told |= {f"{name} {row}" for row in re.findall(r"^\.It (.*)", rows, re.M)}
+    yield from differences(reasons, "marlin-status", told, "its manual page")
+
     zones = re.findall(r'default_zone\[\] = "([^"]+)"', code)
     told_zones = re.findall(r"default zone, ([\w/]+)", marlin)
     if len(zones) != 1 or told_zones != zones:

@@ -7,6 +7,10 @@ include(GNUInstallDirs)
 
 install(TARGETS marlin RUNTIME DESTINATION ${CMAKE_INSTALL_LIBEXECDIR})
 install(FILES docs/marlin.8 DESTINATION ${CMAKE_INSTALL_MANDIR}/man8)
+if(TARGET marlin-status)
+  install(TARGETS marlin-status RUNTIME DESTINATION ${CMAKE_INSTALL_BINDIR})
+  install(FILES docs/marlin-status.8 DESTINATION ${CMAKE_INSTALL_MANDIR}/man8)
+endif()
 install(FILES docs/marlin-layout.5 DESTINATION ${CMAKE_INSTALL_MANDIR}/man5)
 
 if(MARLIN_UNIT_DIR)

@@ -1,0 +1,146 @@
+// SPDX-License-Identifier: BSD-2-Clause
+//
+// The parts of marlin-status that need no device. What it says of devices is
+// compared with real boots elsewhere.
+#include <gmock/gmock.h>
+
+#include <nlohmann/json.hpp>
+#include <set>
+
+#include "tools/status/mounts.h"
+#include "tools/status/report.h"
+#include "tools/status/words.h"
+
+namespace {
+
+using testing::ElementsAre;
+using testing::HasSubstr;
+using testing::IsEmpty;
+using testing::Not;
+
+std::string mount_at(const std::string& place) {
+  return "36 35 98:0 / " + place + " rw,noatime - ext4 /dev/root rw\n";
+}
+
+TEST(MountsBelow, AreThoseInsideTheDirectory) {
+  EXPECT_THAT(mounts_below(mount_at("/a/b") + mount_at("/a") + mount_at("/ab") +
+                               mount_at("/"),
+                           "/a"),
+              ElementsAre("/a/b"));
+}
+
+TEST(MountsBelow, ComeParentsFirstAndOnce) {
+  EXPECT_THAT(mounts_below(mount_at("/a/b/c") + mount_at("/a/b") +
+                               mount_at("/a/b") + mount_at("/a/b/c/d"),
+                           "/a"),
+              ElementsAre("/a/b", "/a/b/c", "/a/b/c/d"));
+}
+
+TEST(MountsBelow, AreDecoded) {
+  EXPECT_THAT(mounts_below(mount_at("/a/x\\040y\\134z\\012"), "/a"),
+              ElementsAre("/a/x y\\z\n"));
+  EXPECT_THAT(mounts_below(mount_at("/a/x\\04"), "/a"), ElementsAre("/a/x\\04"));
+  EXPECT_THAT(mounts_below(mount_at("/a/x\\189"), "/a"),
+              ElementsAre("/a/x\\189"));
+}
+
+TEST(MountsBelow, AreNoneInWhatIsNotAList) {
+  EXPECT_THAT(mounts_below("", "/a"), IsEmpty());
+  EXPECT_THAT(mounts_below("\n\n1 2 3\n/a/b /a/b\n", "/a"), IsEmpty());
+}
+
+std::string all_bytes() {
+  std::string bytes;
+  for (int byte = 1; byte < 256; ++byte) bytes += static_cast<char>(byte);
+  return bytes;
+}
+
+// A report in which every text of the device is hostile.
+report hostile() {
+  report told;
+  told.device.links.zoneinfo = {entry::kind::link, all_bytes()};
+  told.device.links.localtime = {entry::kind::link, all_bytes()};
+  told.device.links.tz_latest = {entry::kind::link, all_bytes()};
+  told.device.links.record = {entry::kind::file, all_bytes()};
+  told.device.system.version_text = all_bytes();
+  told.device.system.version.year = 1;
+  told.device.system.schema = all_bytes();
+  told.device.system.unreadable = {all_bytes()};
+  told.device.update = told.device.system;
+  told.device.update->path = all_bytes();
+  told.device.downloads = {all_bytes()};
+  told.boot.lines = {{"%s", all_bytes(), 0}};
+  told.after = told.device.links;
+  return told;
+}
+
+TEST(Json, HoldsAnyBytes) {
+  const std::string text = in_json(hostile());
+  const auto object = nlohmann::json::parse(text);
+  EXPECT_THAT(object["now"]["zoneinfo"]["target"].get<std::string>(),
+              HasSubstr("\\x0a"));
+  for (const char byte : text) EXPECT_TRUE(byte == '\n' || (byte >= ' ' && byte <= '~'));
+}
+
+TEST(Json, HasNullForWhatThereIsNot) {
+  const auto object = nlohmann::json::parse(in_json({}));
+  EXPECT_TRUE(object["system"]["version"].is_null());
+  EXPECT_TRUE(object["system"]["schema"].is_null());
+  EXPECT_TRUE(object["announced"].is_null());
+  EXPECT_EQ(object["now"]["zoneinfo"]["kind"], "none");
+}
+
+TEST(Rows, HoldNoByteThatATerminalObeys) {
+  for (const char byte : in_rows(hostile(), {}))
+    EXPECT_TRUE(byte == '\n' || (byte >= ' ' && byte <= '~'));
+}
+
+TEST(Rows, FitTheWidth) {
+  const std::string text = in_rows(hostile(), {60, false});
+  std::size_t start = 0;
+  for (std::size_t end = 0; (end = text.find('\n', start)) != std::string::npos;
+       start = end + 1)
+    EXPECT_LE(end - start, 60u);
+}
+
+TEST(Rows, AreColouredOnlyWhenThatIsWanted) {
+  EXPECT_THAT(in_rows({}, {80, true}), HasSubstr("\033[1m"));
+  EXPECT_THAT(in_rows({}, {80, false}), Not(HasSubstr("\033")));
+}
+
+TEST(Rows, TellAMissingLinkFromOneThatReadsSo) {
+  report told;
+  told.device.links.tz_latest = {entry::kind::link, "none"};
+  EXPECT_THAT(in_rows(told, {}), HasSubstr("announced   -> none\n"));
+  told.device.links.tz_latest = {};
+  EXPECT_THAT(in_rows(told, {}), HasSubstr("announced   none\n"));
+  told.device.links.tz_latest = {entry::kind::directory};
+  EXPECT_THAT(in_rows(told, {}), HasSubstr("announced   (a directory)\n"));
+}
+
+TEST(Zone, IsWhatFollowsTheTree) {
+  link_facts links;
+  const auto zone_in = [&](const std::string& target) {
+    links.localtime = {entry::kind::link, target};
+    return zone_of(links);
+  };
+  EXPECT_EQ(zone_in("/var/db/timezone/zoneinfo/Europe/Paris"), "Europe/Paris");
+  EXPECT_EQ(zone_in("/var/db/timezone/zoneinfox"), "");
+  EXPECT_EQ(zone_in("/var/db/timezone/zoneinfo"), "");
+}
+
+TEST(Downloads, AreNeededByWhatLeadsIntoThem) {
+  link_facts links;
+  links.zoneinfo = {entry::kind::link, "/var/db/timezone/tz/2024a.1.0/zoneinfo"};
+  links.tz_latest = {entry::kind::link, "/var/db/timezone/tz/2024a.1.0"};
+  EXPECT_EQ(needed_by(links, "2024a.1.0"), "zoneinfo, tz_latest");
+  EXPECT_EQ(needed_by(links, "2024a.1"), "");
+  EXPECT_EQ(needed_by(links, "2024a.1.0.1"), "");
+}
+
+TEST(Reasons, HaveDifferentNames) {
+  const auto all = all_reasons();
+  EXPECT_EQ(std::set<std::string>(all.begin(), all.end()).size(), all.size());
+}
+
+}  // namespace
