@@ -59,7 +59,8 @@ def trials(name: str, *arguments: str) -> list[str]:
     if os.geteuid() == 0 and "lab/test_status.py" in " ".join(arguments):
         # On a private device root has no capability, and may then not have the
         # namespaces that any other user may have.
-        return "bwrap --unshare-user --uid 1000 --gid 1000 --dev-bind / /".split() + command
+        other = "bwrap --unshare-user --uid 1000 --gid 1000 --dev-bind / /"
+        return other.split() + command
     return command
 
 

@@ -1,6 +1,7 @@
 # SPDX-License-Identifier: BSD-2-Clause
 """usage: scripts/bench [--rounds N]
-       scripts/bench --check | --record | --growth | --hardening | --parsers
+       scripts/bench --check | --record | --growth | --hardening | --parsers |
+                     --companions
 
 Measures marlin, as it ships, inside a private device. Without an option: beside the
 least that its system calls can cost ("the floor", lab/bench/floor.c), its own dynamic
@@ -16,6 +17,7 @@ user-space instructions to the size of the file.
                 grow in step; writes the plot docs/growth.svg
   --hardening   what each hardening option costs
   --parsers     the two parsers, against std::regex
+  --companions  marlin-status, on a large device and on hostile ones
 
 Installs the Debian packages that it needs. Instructions are those of an environment
 that holds only PATH: each variable more costs some 550 in the C library's start-up, for
@@ -274,11 +276,17 @@ def hardening():
         in zip([*HARDENING, "what ships"], files, quiet, thrown)])
 
 
+def companions():
+    built_static("marlin-status")
+    from lab.bench.companions import rows
+    print_table("Device, Milliseconds, MB, Exit status", list(rows()))
+
+
 def main():
     parser = Options(__doc__)
     parser.add_argument("--rounds", default="11")
     jobs = parser.add_mutually_exclusive_group()
-    for job in (check, record, growth, hardening, parsers):
+    for job in (check, record, growth, hardening, parsers, companions):
         jobs.add_argument(f"--{job.__name__}", dest="job", action="store_const",
                           const=job, default=table)
     options = parser.parse_args()

@@ -39,7 +39,8 @@ TEST(MountsBelow, ComeParentsFirstAndOnce) {
 TEST(MountsBelow, AreDecoded) {
   EXPECT_THAT(mounts_below(mount_at("/a/x\\040y\\134z\\012"), "/a"),
               ElementsAre("/a/x y\\z\n"));
-  EXPECT_THAT(mounts_below(mount_at("/a/x\\04"), "/a"), ElementsAre("/a/x\\04"));
+  EXPECT_THAT(mounts_below(mount_at("/a/x\\04"), "/a"),
+              ElementsAre("/a/x\\04"));
   EXPECT_THAT(mounts_below(mount_at("/a/x\\189"), "/a"),
               ElementsAre("/a/x\\189"));
 }
@@ -79,7 +80,8 @@ TEST(Json, HoldsAnyBytes) {
   const auto object = nlohmann::json::parse(text);
   EXPECT_THAT(object["now"]["zoneinfo"]["target"].get<std::string>(),
               HasSubstr("\\x0a"));
-  for (const char byte : text) EXPECT_TRUE(byte == '\n' || (byte >= ' ' && byte <= '~'));
+  for (const char byte : text)
+    EXPECT_TRUE(byte == '\n' || (byte >= ' ' && byte <= '~'));
 }
 
 TEST(Json, HasNullForWhatThereIsNot) {
@@ -131,7 +133,8 @@ TEST(Zone, IsWhatFollowsTheTree) {
 
 TEST(Downloads, AreNeededByWhatLeadsIntoThem) {
   link_facts links;
-  links.zoneinfo = {entry::kind::link, "/var/db/timezone/tz/2024a.1.0/zoneinfo"};
+  links.zoneinfo = {entry::kind::link,
+                    "/var/db/timezone/tz/2024a.1.0/zoneinfo"};
   links.tz_latest = {entry::kind::link, "/var/db/timezone/tz/2024a.1.0"};
   EXPECT_EQ(needed_by(links, "2024a.1.0"), "zoneinfo, tz_latest");
   EXPECT_EQ(needed_by(links, "2024a.1"), "");

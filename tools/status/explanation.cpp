@@ -88,8 +88,7 @@ constexpr row table[] = {
     {"update", "not_reached", "earlier_failure", wrong, "not looked at"},
     {"update", "nothing", "none", sound, "none is announced"},
     {"update", "refused", "same_set", sound, "%1 is in use already"},
-    {"update", "refused", "other_schema", wrong,
-     "%1 is refused: it has %2"},
+    {"update", "refused", "other_schema", wrong, "%1 is refused: it has %2"},
     {"update", "refused", "same_version", wrong,
      "%1 is refused: %2 is of the same version"},
     {"update", "refused", "no_version", wrong,
@@ -179,9 +178,9 @@ class account {
     told_.reasons.push_back(reason);
   }
 
-  void add(std::string_view name, std::string_view does, std::string_view reason,
-           const std::string& first = {}, const std::string& second = {},
-           int error = 0) {
+  void add(std::string_view name, std::string_view does,
+           std::string_view reason, const std::string& first = {},
+           const std::string& second = {}, int error = 0) {
     const row* const found =
         std::find_if(std::begin(table), std::end(table), [&](const row& known) {
           return known.name == name && known.does == does &&
@@ -344,7 +343,8 @@ class account {
       return add("update", "refused", "same_set", set.version_text);
     if (!set.has_version())
       return add("update", "refused", "no_version", set.version_text);
-    add("update", "refused", set.version == in_use.version ? "same_version" : "older",
+    add("update", "refused",
+        set.version == in_use.version ? "same_version" : "older",
         set.version_text, in_use.version_text);
   }
 
@@ -414,7 +414,7 @@ explanation explain(const device_facts& device, const rehearsal& boot,
 std::vector<std::string> all_reasons() {
   std::vector<std::string> all;
   for (const auto& known : table)
-    all.push_back(std::string(known.name) + ' ' + std::string(known.does) + ' ' +
-                  std::string(known.reason));
+    all.push_back(std::string(known.name) + ' ' + std::string(known.does) +
+                  ' ' + std::string(known.reason));
   return all;
 }

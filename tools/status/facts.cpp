@@ -113,7 +113,8 @@ void note_unreadable(dataset_facts& facts) {
   std::vector<std::string> schemas;
   for (const auto& name : names) {
     const std::string schema(icu_schema_in(name));
-    if (!schema.empty() && is_regular(icu + "/" + name)) schemas.push_back(schema);
+    if (!schema.empty() && is_regular(icu + "/" + name))
+      schemas.push_back(schema);
   }
   facts.has_several_schemas =
       !schemas.empty() && !std::all_of(schemas.begin(), schemas.end(),
@@ -133,7 +134,8 @@ dataset_facts facts_of(const std::string& path, const mln_dataset* system) {
     facts.version = built.version;
     facts.schema = dynamic_cast<const mln_icu&>(*built.components.back())
                        .schema.substr(0, longest_text);
-    facts.fits_system = path.empty() || (system != nullptr && built.compatible_with(*system));
+    facts.fits_system =
+        path.empty() || (system != nullptr && built.compatible_with(*system));
   } catch (const std::invalid_argument&) {
     facts.ends = dataset_facts::state::bad_path;
   } catch (const std::out_of_range&) {

@@ -23,7 +23,13 @@ struct entry {
 struct dataset_facts {
   // How building it ends: a path that is refused, a number in the name that
   // does not fit, a walk that cannot be started, no memory.
-  enum class state { built, bad_path, number_too_large, walk_failed, no_memory };
+  enum class state {
+    built,
+    bad_path,
+    number_too_large,
+    walk_failed,
+    no_memory
+  };
   state ends = state::built;
   std::string path{};  // empty: the system partition's
   std::string version_text{};
@@ -43,9 +49,9 @@ enum class link_pair {
   update,              // both of one update
   update_without_icu,  // an update's tree, no ICU link
   update_with_other_icu,
-  system_with_icu,   // the system's tree, an ICU link
-  not_the_tree,      // "zoneinfo" leads into a data set, but not to its tree
-  no_dataset,        // "zoneinfo" names no data set
+  system_with_icu,  // the system's tree, an ICU link
+  not_the_tree,     // "zoneinfo" leads into a data set, but not to its tree
+  no_dataset,       // "zoneinfo" names no data set
 };
 
 struct link_facts {

@@ -26,7 +26,8 @@ extern "C" void warn(const char* format, ...) {
     va_start(arguments, format);
     std::vsnprintf(message, sizeof message, format, arguments);
     va_end(arguments);
-    sink({format, std::string("marlin: ") + message + ": " + std::strerror(error),
+    sink({format,
+          std::string("marlin: ") + message + ": " + std::strerror(error),
           error});
   }
   errno = error;

@@ -22,16 +22,16 @@ namespace {
 constexpr int bad_use = 64;
 constexpr int not_here = 77;
 
-// What a hostile device may cost before the answer is that it cannot be told.
-constexpr unsigned long most_memory = 48ul << 20;
-constexpr unsigned most_seconds = 1;
-constexpr unsigned longest_wait = 30;  // seconds, for storage that never answers
+constexpr unsigned longest_wait =
+    30;  // seconds, for storage that never answers
 
 constexpr char help[] =
     "usage: marlin-status [--root DIR] [--json | --check]\n"
     "\n"
-    "Tells which time-zone data a device uses, and what its next boot will do.\n"
-    "Nothing is changed: the boot is run in a throw-away layer over the device.\n"
+    "Tells which time-zone data a device uses, and what its next boot will "
+    "do.\n"
+    "Nothing is changed: the boot is run in a throw-away layer over the "
+    "device.\n"
     "\n"
     "  --root DIR   the device unpacked or mounted in DIR, not this system\n"
     "  --json       one JSON object\n"
@@ -89,8 +89,8 @@ options parse(int count, char** words) {
         print_and_exit("marlin-status " MARLIN_VERSION "\n");
         break;
       default:
-        refuse(bad_use, escaped(words[optind - 1]) +
-                            " is not understood; see --help");
+        refuse(bad_use,
+               escaped(words[optind - 1]) + " is not understood; see --help");
     }
   }
   if (optind != count)
@@ -102,7 +102,8 @@ look of_terminal() {
   winsize size{};
   look wanted;
   if (::isatty(STDOUT_FILENO) == 0) return wanted;
-  if (::ioctl(STDOUT_FILENO, TIOCGWINSZ, &size) == 0) wanted.width = size.ws_col;
+  if (::ioctl(STDOUT_FILENO, TIOCGWINSZ, &size) == 0)
+    wanted.width = size.ws_col;
   const char* const colourless = std::getenv("NO_COLOR");
   wanted.has_colour = colourless == nullptr || *colourless == '\0';
   return wanted;
@@ -113,8 +114,8 @@ std::vector<std::string> unknown(const report& told, bool is_running_system) {
   const auto has_several = [](const std::optional<dataset_facts>& set) {
     return set && set->has_several_schemas;
   };
-  if (!is_running_system && (has_several(told.device.current) ||
-                             has_several(told.device.update)))
+  if (!is_running_system &&
+      (has_several(told.device.current) || has_several(told.device.update)))
     texts.push_back(
         "which ICU data file comes first on the device's own file system");
   if (!(told.after.zoneinfo == told.device.links.zoneinfo) ||
@@ -133,7 +134,9 @@ bool is_like_before(const report& told) {
 
 report examine(const options& chosen) {
   const bool is_ours = enter_throwaway_device(chosen.root);
-  become_the_boot(most_memory, most_seconds);
+  become_the_boot();
+  limit_memory();
+  limit_time();
   report told;
   told.device = read_device();
   told.boot = rehearse_boot();
@@ -148,11 +151,13 @@ report examine(const options& chosen) {
                       std::to_string(most_memory >> 20) + " MB of memory");
   for (const auto& said : told.boot.lines)
     if (said.error == EOVERFLOW)
-      throw cannot_tell("a change to an owner's files cannot be tried by this "
-                        "user");
+      throw cannot_tell(
+          "a change to an owner's files cannot be tried by this "
+          "user");
   if (!is_ours && !is_like_before(told))
     throw cannot_tell(
-        "what the next boot changes: the device belongs to another user; run this "
+        "what the next boot changes: the device belongs to another user; run "
+        "this "
         "as its root");
   told.why = explain(told.device, told.boot, told.after);
   told.cannot_know = unknown(told, chosen.root == "/");
@@ -192,7 +197,8 @@ int main(int count, char** words) {
 
   // The default action of the alarm would be silent.
   ::signal(SIGALRM, [](int) {
-    constexpr char text[] = "marlin-status: cannot tell: the device does not answer\n";
+    constexpr char text[] =
+        "marlin-status: cannot tell: the device does not answer\n";
     static_cast<void>(!::write(STDERR_FILENO, text, sizeof text - 1));
     std::_Exit(not_here);
   });
@@ -200,6 +206,5 @@ int main(int count, char** words) {
   int status = 0;
   ::waitpid(child, &status, 0);
   if (WIFEXITED(status)) return WEXITSTATUS(status);
-  refuse(not_here, std::string("cannot tell: ended here by ") +
-                       ::strsignal(WTERMSIG(status)));
+  refuse(not_here, "cannot tell: " + why_ended(status));
 }

@@ -50,6 +50,7 @@ void tell(kind what, const line& said = {}) {
 
 [[noreturn]] void run_and_tell(int pipe) {
   channel = pipe;
+  limit_time();
   take_lines([](const line& said) { tell(kind::line, said); });
   std::set_new_handler([] {
     tell(kind::refusal);
@@ -127,7 +128,8 @@ rehearsal rehearse_boot() {
   if (::pipe2(ends, O_CLOEXEC) != 0)
     throw cannot_tell(std::string("pipe: ") + std::strerror(errno));
   const pid_t child = ::fork();
-  if (child < 0) throw cannot_tell(std::string("fork: ") + std::strerror(errno));
+  if (child < 0)
+    throw cannot_tell(std::string("fork: ") + std::strerror(errno));
   if (child == 0) {
     ::close(ends[0]);
     run_and_tell(ends[1]);
@@ -138,10 +140,6 @@ rehearsal rehearse_boot() {
   ::close(ends[0]);
   int status = 0;
   ::waitpid(child, &status, 0);
-  if (!is_whole)
-    throw cannot_tell("the next boot was ended here by " +
-                      std::string(WIFSIGNALED(status)
-                                      ? ::strsignal(WTERMSIG(status))
-                                      : "an unknown failure"));
+  if (!is_whole) throw cannot_tell("the next boot: " + why_ended(status));
   return boot;
 }

@@ -11,7 +11,7 @@
 struct rehearsal {
   std::vector<line> lines;
   bool ends_normally = false;
-  std::string thrown{};  // otherwise: what was thrown, in words
+  std::string thrown{};   // otherwise: what was thrown, in words
   unsigned refusals = 0;  // how often memory was refused to it
 };
 

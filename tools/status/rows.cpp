@@ -69,10 +69,10 @@ class rows {
 
   void add(std::string label, const std::string& text) {
     label.resize(label_width, ' ');
-    const std::size_t width =
-        look_.width == 0 ? 0
-        : look_.width > 2 * label_width ? look_.width - label_width
-                                        : label_width;
+    const std::size_t width = look_.width == 0 ? 0
+                              : look_.width > 2 * label_width
+                                  ? look_.width - label_width
+                                  : label_width;
     text_ += bold(label) + wrapped(text, width) + "\n";
   }
   std::string text() const { return text_; }
@@ -93,7 +93,8 @@ void add_data(rows& shown, const report& told) {
   else if (links.current_path->empty())
     shown.add("in use", "the system partition's");
   else
-    shown.add("in use", "the update " + version_and_schema(*told.device.current));
+    shown.add("in use",
+              "the update " + version_and_schema(*told.device.current));
   if (told.device.current && !links.current_path->empty())
     shown.add("", escaped(links.zoneinfo.text));
   shown.add("system", version_and_schema(told.device.system));
@@ -111,8 +112,9 @@ void add_links(rows& shown, const report& told) {
     shown.add("", "zoneinfo " + plain(links.zoneinfo));
     shown.add("", "icutz " + plain(links.icutz));
     if (links.pair != link_pair::no_dataset)
-      shown.add("", "Remove /var/db/timezone/zoneinfo: the next boot then makes "
-                    "both anew.");
+      shown.add("",
+                "Remove /var/db/timezone/zoneinfo: the next boot then makes "
+                "both anew.");
   }
   if (!told.device.update)
     shown.add("announced", plain(links.tz_latest));
@@ -138,9 +140,9 @@ void add_downloads(rows& shown, const report& told) {
   const auto& names = told.device.downloads;
   for (std::size_t i = 0; i < names.size() && i < most_downloads; ++i) {
     const std::string needed = needed_by(told.device.links, names[i]);
-    shown.add(label, escaped(names[i]) +
-                         (needed.empty() ? ", which no link needs"
-                                         : ", for " + needed));
+    shown.add(label,
+              escaped(names[i]) + (needed.empty() ? ", which no link needs"
+                                                  : ", for " + needed));
     label = "";
   }
   if (names.size() > most_downloads)

@@ -12,9 +12,12 @@
 #include <sys/stat.h>
 #include <sys/statvfs.h>
 #include <sys/syscall.h>
+#include <sys/time.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
 #include <cerrno>
+#include <csignal>
 #include <cstdint>
 #include <cstring>
 #include <utility>
@@ -142,7 +145,6 @@ descriptor make_layer(const std::string& layer) {
   return mounted;
 }
 
-
 // Inside `root`, whatever links say.
 descriptor open_inside(int root, const std::string& path, std::uint64_t flags) {
   open_how how{};
@@ -168,8 +170,8 @@ class process {
   }
 
   std::string mounts() const {
-    const descriptor file(::openat(directory_.get(), "self/mountinfo",
-                                   O_RDONLY | O_CLOEXEC));
+    const descriptor file(
+        ::openat(directory_.get(), "self/mountinfo", O_RDONLY | O_CLOEXEC));
     must(file.get(), "/proc/self/mountinfo");
     std::string text;
     char buffer[4096];
@@ -185,8 +187,9 @@ class process {
 };
 
 descriptor clone_tree(int directory, unsigned flags) {
-  descriptor tree(::open_tree(
-      directory, "", AT_EMPTY_PATH | OPEN_TREE_CLONE | OPEN_TREE_CLOEXEC | flags));
+  descriptor tree(
+      ::open_tree(directory, "",
+                  AT_EMPTY_PATH | OPEN_TREE_CLONE | OPEN_TREE_CLOEXEC | flags));
   must(tree.get(), "open_tree");
   return tree;
 }
@@ -308,22 +311,35 @@ bool enter_throwaway_device(const std::string& root) {
   return is_ours;
 }
 
-void become_the_boot(unsigned long memory, unsigned seconds) {
+void become_the_boot() {
   ::umask(022);
   // Not allowed where this user is not really root, and needless there.
   ::setgroups(0, nullptr);
-  const auto limit = [](auto resource, rlim_t value) {
-    const rlimit both{value, value};
-    must(::setrlimit(resource, &both), "setrlimit");
-  };
-  limit(RLIMIT_CORE, 0);
-  limit(RLIMIT_CPU, seconds);
-#if !defined(__SANITIZE_ADDRESS__)
-  // Sanitizers reserve terabytes of addresses.
-  limit(RLIMIT_AS, memory);
-#endif
+  const rlimit none{0, 0};
+  must(::setrlimit(RLIMIT_CORE, &none), "setrlimit");
   must(::prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0), "no_new_privs");
   __user_cap_header_struct header{_LINUX_CAPABILITY_VERSION_3, 0};
-  const __user_cap_data_struct none[2] = {};
-  must(::syscall(SYS_capset, &header, none), "capset");
+  const __user_cap_data_struct no_capability[2] = {};
+  must(::syscall(SYS_capset, &header, no_capability), "capset");
+}
+
+void limit_memory() {
+#if !defined(__SANITIZE_ADDRESS__)
+  // Sanitizers reserve terabytes of addresses.
+  const rlimit limit{most_memory, most_memory};
+  must(::setrlimit(RLIMIT_AS, &limit), "setrlimit");
+#endif
+}
+
+void limit_time() {
+  const itimerval timer{{}, {0, most_milliseconds * 1000}};
+  must(::setitimer(ITIMER_PROF, &timer, nullptr), "setitimer");
+}
+
+std::string why_ended(int status) {
+  if (!WIFSIGNALED(status)) return "ended without a reason";
+  if (WTERMSIG(status) == SIGPROF)
+    return "it takes more than " + std::to_string(most_milliseconds) +
+           " ms of processor time";
+  return std::string("ended by ") + ::strsignal(WTERMSIG(status));
 }
