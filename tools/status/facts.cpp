@@ -21,7 +21,8 @@
 
 namespace {
 
-constexpr std::size_t longest_text = 4096;
+constexpr std::size_t longest_text = 4096;   // of a link or a record
+constexpr std::size_t longest_word = 65536;  // of a version or a schema
 constexpr std::size_t most_names = 10000;
 
 unsigned refusals = 0;
@@ -130,10 +131,10 @@ dataset_facts facts_of(const std::string& path, const mln_dataset* system) {
   const unsigned before = refusals;
   try {
     const mln_dataset built(path);
-    facts.version_text = built.version_string.substr(0, longest_text);
+    facts.version_text = built.version_string.substr(0, longest_word);
     facts.version = built.version;
     facts.schema = dynamic_cast<const mln_icu&>(*built.components.back())
-                       .schema.substr(0, longest_text);
+                       .schema.substr(0, longest_word);
     facts.fits_system =
         path.empty() || (system != nullptr && built.compatible_with(*system));
   } catch (const std::invalid_argument&) {

@@ -116,13 +116,13 @@ std::vector<std::string> unknown(const report& told, bool is_running_system) {
   };
   if (!is_running_system &&
       (has_several(told.device.current) || has_several(told.device.update)))
-    texts.push_back(
+    texts.emplace_back(
         "which ICU data file comes first on the device's own file system");
   if (!(told.after.zoneinfo == told.device.links.zoneinfo) ||
       !(told.after.localtime == told.device.links.localtime))
-    texts.push_back("whether there is space for the links");
+    texts.emplace_back("whether there is space for the links");
   if (!is_running_system)
-    texts.push_back("what the device mounts over this tree");
+    texts.emplace_back("what the device mounts over this tree");
   return texts;
 }
 
