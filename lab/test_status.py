@@ -374,7 +374,8 @@ CASES = {
     "a huge number in use": case(2, lambda t: t.use("2147483648a")),
     "the system's number": case(
         2, lambda t: t.file(SYSTEM_ZONEINFO + "/+VERSION", "2147483648a"),
-        next_boot__ends="abnormally", system__version=None),
+        lambda t: t.use("2024a.1.0"), next_boot__ends="abnormally",
+        system__version=None, current__fits_system=False),
     "no version": case(2, lambda t: t.drop(SYSTEM_ZONEINFO + "/+VERSION"),
                        system__version=None),
     "no system tree": case(2, lambda t: t.drop(SYSTEM_ZONEINFO), system__version=None),

@@ -29,7 +29,6 @@
 namespace {
 
 constexpr char writable[] = "/var/db";
-constexpr char downloads[] = "/var/db/timezone/tz";
 
 [[noreturn]] void fail(const std::string& what) {
   const int error = errno;
@@ -206,11 +205,6 @@ bool belongs_to_us(int root, const char* path) {
   return ::fstat(directory.get(), &status) != 0 || status.st_uid == ::geteuid();
 }
 
-bool is_below(const std::string& path, const std::string& directory) {
-  return path.starts_with(directory) &&
-         (path.size() == directory.size() || path[directory.size()] == '/');
-}
-
 // The layers over "/var/db" and what is mounted below. All paths here are seen
 // from the base, in which the device is "/root". `original` is the device as it
 // was, if what is read only there is to stay so, otherwise -1.
@@ -224,8 +218,6 @@ class layers {
     // Without the directory there is nothing that a boot could write to.
     if (base.get() < 0) return;
     const std::string top = self_.path_of(base);
-    const descriptor tz = open_inside(root_, downloads, O_DIRECTORY);
-    const std::string read_only = tz.get() < 0 ? "//" : self_.path_of(tz);
 
     std::vector<std::pair<std::string, descriptor>> mounted;
     for (const auto& place : mounts_below(self_.mounts(), top))
@@ -234,12 +226,11 @@ class layers {
     for (const auto& [place, lower] : mounted) {
       const descriptor target = open_inside(root_, inside(place), 0);
       if (lower.get() < 0 || target.get() < 0) continue;
-      if (!is_directory(lower) || is_below(place, read_only))
+      if (!is_directory(lower))
         attach(clone_tree(lower.get(), 0), target.get());
       else
         over(lower, target.get(), inside(place));
     }
-    protect_downloads();
   }
 
  private:
@@ -262,18 +253,11 @@ class layers {
 
   void over(const descriptor& lower, int target, const std::string& place) {
     must(::fchdir(lower.get()), "chdir");
-    const descriptor layer = make_layer("/" + std::to_string(count_++));
+    const descriptor layer =
+        make_layer(std::string("/").append(std::to_string(count_++)));
     must(::chdir("/"), "chdir");
     if (is_read_only(place)) set_attributes(layer.get(), 0, MOUNT_ATTR_RDONLY);
     attach(layer, target);
-  }
-
-  void protect_downloads() const {
-    const descriptor tz = open_inside(root_, downloads, O_DIRECTORY);
-    if (tz.get() < 0) return;
-    const descriptor copy = clone_tree(tz.get(), AT_RECURSIVE);
-    set_attributes(copy.get(), AT_RECURSIVE, MOUNT_ATTR_RDONLY);
-    attach(copy, tz.get());
   }
 
   int root_;
@@ -312,7 +296,6 @@ bool enter_throwaway_device(const std::string& root) {
 }
 
 void become_the_boot() {
-  ::umask(022);
   // Not allowed where this user is not really root, and needless there.
   ::setgroups(0, nullptr);
   const rlimit none{0, 0};

@@ -24,7 +24,7 @@ struct cannot_tell : std::runtime_error {
 bool enter_throwaway_device(const std::string& root);
 
 // Gives this process what the boot unit gives marlin: no capability, no new
-// privileges, the umask 022, no core file. Throws cannot_tell.
+// privileges, no core file. Throws cannot_tell.
 void become_the_boot();
 
 // Bounds for a hostile device: what this process may have of addresses, its
