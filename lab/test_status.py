@@ -590,3 +590,27 @@ def test_rows_fit_a_terminal():
         assert (b"\033[" in text) == colours
         plain = re.sub(rb"\033\[\d*m", b"", text)
         assert max(map(len, plain.replace(b"\r", b"").split(b"\n"))) <= 60
+
+
+@pytest.mark.parametrize("place", ["/var/db/timezone", "/var/db/timezone/tz", "/var/db",
+                                   "/var", "/usr/share/icu"])
+def test_a_file_system_of_its_own(place):
+    """What is mounted inside the device is seen, covered and left alone."""
+    tree = Tree()
+    tree.announce("2024a.1.0")
+    at = os.fsdecode(tree.at(place))
+    done = subprocess.run(
+        ["/usr/bin/unshare", "--user", "--map-root-user", "--mount", "/bin/sh", "-euc",
+         f"""mkdir /tmp/aside && cp -a {at}/. /tmp/aside
+             mount -t tmpfs -o mode=755 own {at} && cp -a /tmp/aside/. {at}
+             find {TREE} -printf '%p %i %T@ %C@ %l\\n' >/tmp/before
+             {STATUS} --root {TREE} --json || [ $? = 1 ]
+             find {TREE} -printf '%p %i %T@ %C@ %l\\n' | cmp /tmp/before -
+             rm -r /tmp/aside"""],
+        capture_output=True, text=True)
+    assert done.stderr == ""
+    said = json.loads(done.stdout)
+    assert fact(said, does("update").replace("__", ".")) == "newer"
+    assert unescaped(said["next_boot"]["after"]["zoneinfo"]["target"]) == (
+        f"{update_path('2024a.1.0')}/zoneinfo")
+    shutil.rmtree("/tmp/aside", ignore_errors=True)
