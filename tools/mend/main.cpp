@@ -15,9 +15,9 @@
 
 namespace {
 
-class link {
+class link_read {
  public:
-  explicit link(const char* path)
+  explicit link_read(const char* path)
       : length_(::readlink(path, text_, sizeof text_)),
         missing_(length_ < 0 && errno == ENOENT) {}
   bool missing() const { return missing_; }
@@ -39,24 +39,24 @@ bool same_update(std::string_view tree, std::string_view icu_data) {
   return icu_data.starts_with(set) && icu_data.substr(set.size()) == "/icutz";
 }
 
-bool mixed(const link& tree, const link& icu_data) {
+bool mixed(const link_read& tree, const link_read& icu_data) {
   if (icu_data.unclear()) return false;
   if (tree.text() == paths::system_zoneinfo) return !icu_data.missing();
   return tree.text().starts_with(paths::download_root) &&
          !same_update(tree.text(), icu_data.text());
 }
 
-bool mixed(const link& tree) {
-  const link icu_data(paths::icu_link);
+bool mixed(const link_read& tree) {
+  const link_read icu_data(paths::icu_link);
   if (!icu_data.missing()) return mixed(tree, icu_data);
   // marlin is about to move a link from where older systems had it.
-  return mixed(tree, link(paths::legacy_icu_link));
+  return mixed(tree, link_read(paths::legacy_icu_link));
 }
 
 }  // namespace
 
 int main() {
-  if (!mixed(link(paths::zoneinfo_link))) return 0;
+  if (!mixed(link_read(paths::zoneinfo_link))) return 0;
   if (::unlink(paths::zoneinfo_link) != 0)
     ::err(1, "cannot remove %s, which does not fit %s", paths::zoneinfo_link,
           paths::icu_link);
