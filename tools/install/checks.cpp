@@ -13,7 +13,7 @@ void check_newer(const mln_version& version, const std::string& other,
                  const char* what_it_is) {
   const auto than = version_in(other);
   if (!than || version > *than) return;
-  throw failure{status::not_newer, "is not newer than " + escaped(other) +
+  throw failure{status::not_newer, "it is not newer than " + escaped(other) +
                                        ", which is " + what_it_is};
 }
 

@@ -97,6 +97,7 @@ class walk {
     for (const auto& [path, target] : links_)
       found_.zones.insert(path.substr(tree.size()));
     if (found_.zones.empty()) refuse("zoneinfo holds no zone");
+    to_.end();
     return std::move(found_);
   }
 

@@ -34,6 +34,7 @@ class receiver {
   // Another name of a file that was received before.
   virtual void name(const std::string& /*path*/, const std::string& /*of*/) {}
   virtual void link(const std::string& /*path*/, const std::string& /*text*/) {}
+  virtual void end() {}
 };
 
 struct contents {

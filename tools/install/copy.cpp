@@ -71,3 +71,5 @@ void copy::link(const std::string& path, const std::string& text) {
   if (::symlinkat(text.c_str(), here(), last_name(path).c_str()) != 0)
     fail("make the link", shown(path));
 }
+
+void copy::end() { finish(top_, 0755, path_); }

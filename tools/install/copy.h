@@ -20,6 +20,7 @@ class copy final : public receiver {
   void file(const std::string& path, std::string_view content) override;
   void name(const std::string& path, const std::string& of) override;
   void link(const std::string& path, const std::string& text) override;
+  void end() override;
 
  private:
   int here() const;

@@ -10,7 +10,6 @@
 #include <vector>
 
 #include "support/paths.h"
-#include "tools/escaped.h"
 #include "tools/install/device_facts.h"
 #include "tools/install/failure.h"
 
@@ -64,11 +63,14 @@ descriptor downloads::make_incoming() {
   return open_directory(sets_.number(), incoming, path_of(incoming));
 }
 
-void downloads::put_in_place(const std::string& name) {
+void downloads::insist_on_room_for(const std::string& name) const {
   if (needed_sets().contains(name))
-    refuse(escaped(name) +
-           " is in use or announced; give other data "
-           "another version");
+    refuse(
+        "a set of this version is in use or announced; give other data "
+        "another");
+}
+
+void downloads::put_in_place(const std::string& name) {
   if (status_of(sets_.number(), name, path_of(name)).st_mode != 0)
     rename_entry(sets_.number(), name, outgoing, path_of(name));
   rename_entry(sets_.number(), incoming, name, path_of(incoming));

@@ -18,12 +18,15 @@ class downloads {
   // an earlier one left that was stopped, and syncs what it may have announced.
   downloads();
 
+  // Throws `failure` if something needs a set of this name: no set ever
+  // changes.
+  void insist_on_room_for(const std::string& name) const;
+
   // Makes the hidden directory that a new set is written into, and opens it.
   descriptor make_incoming();
   std::string incoming_path() const;
 
-  // Gives the hidden directory its name. A set of that name that nothing needs
-  // is replaced; one that something needs is refused.
+  // Gives the hidden directory its name. A set of that name is replaced.
   void put_in_place(const std::string& name);
 
   // Makes "tz_latest" name a set. Until sync_announcement() has returned, a

@@ -78,6 +78,7 @@ class told_copy final : public receiver {
     copy_.link(path, text);
     progress_.step();
   }
+  void end() override { copy_.end(); }
 
  private:
   copy copy_;
@@ -86,18 +87,17 @@ class told_copy final : public receiver {
 
 // Checks again what it copies: the update may have changed since it was
 // checked.
-contents copy_into(downloads& to, const update& given, std::size_t entries) {
+void copy_into(downloads& to, const update& given, std::size_t entries) {
   const descriptor incoming = to.make_incoming();
   told_copy copier(incoming.number(), to.incoming_path(), entries);
-  const contents copied = examine(given.directory.number(), copier);
-  check_contents(given.name, copied);
-  return copied;
+  check_contents(given.name, examine(given.directory.number(), copier));
 }
 
 void install(const update& given, bool force) {
   downloads place;
   const contents found = check(given, force);
   about(escaped(given.name) + ": ", "; nothing was changed", [&] {
+    place.insist_on_room_for(given.name);
     try {
       copy_into(place, given, found.entries);
       place.put_in_place(given.name);
