@@ -118,8 +118,17 @@ void downloads::take_back() noexcept {
   try {
     if (!placed_.empty())
       rename_entry(sets_.number(), placed_, incoming, path_of(placed_));
+  } catch (...) {
+    // The reason for taking it back is what has to be told. A whole set stays,
+    // which nothing names.
+  }
+  tidy();
+}
+
+void downloads::tidy() noexcept {
+  try {
     delete_hidden();
   } catch (...) {
-    // The reason for taking it back is what has to be told.
+    // The next one tries again.
   }
 }

@@ -45,6 +45,9 @@ class downloads {
   // done; the next one deletes what is left.
   void take_back() noexcept;
 
+  // Deletes what is hidden, in both directories, as far as that can be done.
+  void tidy() noexcept;
+
  private:
   void delete_hidden();
 

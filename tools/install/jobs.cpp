@@ -110,6 +110,7 @@ void install(const update& given, bool force) {
   about(escaped(given.name) + ": ",
         "; it is announced, but a loss of power may undo that: run this again",
         [&] { place.sync_announcement(); });
+  place.tidy();
   std::printf("%s is announced; the next boot decides\n", given.name.c_str());
 }
 
