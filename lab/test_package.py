@@ -30,6 +30,8 @@ CONTENT = dict(reversed(line.split(maxsplit=1)) for line in """
     777 /usr/lib/systemd/system/sysinit.target.wants/marlin.service -> ../marlin.service
     644 /usr/lib/tmpfiles.d/marlin.conf
     755 /usr/libexec/marlin
+    755 /usr/libexec/marlin-mend
+    755 /usr/sbin/marlin-install
     644 /usr/share/doc/marlin/README.md
     644 /usr/share/doc/marlin/SECURITY.md
     644 /usr/share/doc/marlin/changelog.gz
@@ -42,8 +44,10 @@ CONTENT = dict(reversed(line.split(maxsplit=1)) for line in """
     644 /usr/share/doc/marlin/docs/proofs.md
     755 /usr/share/doc/marlin/examples/init-script
     644 /usr/share/doc/marlin/examples/inittab
+    644 /usr/share/doc/marlin/examples/marlin.service.d/mend.conf
     644 /usr/share/lintian/overrides/marlin
     644 /usr/share/man/man5/marlin-layout.5.gz
+    644 /usr/share/man/man8/marlin-install.8.gz
     644 /usr/share/man/man8/marlin.8.gz
 """.strip().splitlines())
 
@@ -183,7 +187,7 @@ def test_it_has_one_version_everywhere(package):
     changelog.write_bytes(gzip.decompress(
         (share / "doc/marlin/changelog.gz").read_bytes()))
     pages = sorted(share.glob("man/*/*.gz"))
-    assert len(pages) == 2
+    assert len(pages) == 3
     versions = [
         found(r"^## (\S+) - ", (PROJECT / "CHANGELOG.md").read_text()),
         found(r"^project\([^)]*VERSION ([\d.]+)",

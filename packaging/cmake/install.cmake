@@ -5,8 +5,9 @@
 # of anybody's PATH it is not run by accident while the links have readers.
 include(GNUInstallDirs)
 
-install(TARGETS marlin RUNTIME DESTINATION ${CMAKE_INSTALL_LIBEXECDIR})
-install(FILES docs/marlin.8 DESTINATION ${CMAKE_INSTALL_MANDIR}/man8)
+install(TARGETS marlin marlin-mend RUNTIME DESTINATION ${CMAKE_INSTALL_LIBEXECDIR})
+install(TARGETS marlin-install RUNTIME DESTINATION ${CMAKE_INSTALL_SBINDIR})
+install(FILES docs/marlin.8 docs/marlin-install.8 DESTINATION ${CMAKE_INSTALL_MANDIR}/man8)
 install(FILES docs/marlin-layout.5 DESTINATION ${CMAKE_INSTALL_MANDIR}/man5)
 
 if(MARLIN_UNIT_DIR)

@@ -4,6 +4,7 @@
 #include <fcntl.h>
 #include <unistd.h>
 
+#include <cerrno>
 #include <cstdlib>
 #include <memory>
 #include <stdexcept>
@@ -11,9 +12,9 @@
 
 #include "dataset/icu.h"
 #include "dataset/zoneinfo.h"
-#include "support/fsutil.h"
 #include "support/paths.h"
 #include "support/version_grammar.h"
+#include "tools/install/failure.h"
 #include "tools/install/files.h"
 #include "tools/install/path_text.h"
 
@@ -30,14 +31,19 @@ std::string first_step_below(std::string_view root, std::string_view path) {
 }
 
 std::string existing(const std::string& set) {
-  return fsutil::exists(paths::download_root + set) ? set : std::string();
+  const std::string path = paths::download_root + set;
+  return status_of(AT_FDCWD, path, path).st_mode != 0 ? set : std::string();
 }
 
 // The path without any link in it; empty if there is nothing at its end.
 std::string resolved(const char* path) {
   const std::unique_ptr<char, decltype(&std::free)> found(
       ::realpath(path, nullptr), &std::free);
-  return found ? found.get() : std::string();
+  if (found) return found.get();
+  // Otherwise a set might be deleted that something needs.
+  if (errno != ENOENT && errno != ENOTDIR && errno != ELOOP)
+    fail("follow the link", path);
+  return {};
 }
 
 }  // namespace

@@ -69,7 +69,8 @@ class removal {
     // Moving it takes the right to write into it.
     static_cast<void>(open_owned(parent, name));
     for (;;) {
-      const std::string free = "." + std::to_string(moved_++);
+      std::string free = ".";
+      free += std::to_string(moved_++);
       if (::renameat(parent, name.c_str(), top_.number(), free.c_str()) == 0)
         return;
       if (errno != ENOTEMPTY && errno != EEXIST && errno != ENOTDIR)
