@@ -11,6 +11,7 @@ takes samples, in eight minutes.
   states     many thousand devices composed at random
   load       too much of everything
   log        a log that is lost, or fails in the middle
+  install    the installer of updates: calls that fail, kills, several at once
   lab        the lab's own carriers
   fuzz       hostile texts
   sanitize   the tests under sanitizers and (not with --quick) valgrind
@@ -38,6 +39,8 @@ TRIALS = {
     "states": ["test_states.py"],
     "load": ["test_load.py"],
     "log": ["test_log.py"],
+    "install": ["test_install_faults.py", "test_install_kills.py",
+                "test_install_races.py"],
     "lab": ["test_archive.py"],
 }
 OTHERS = {  # the whole, and with --quick

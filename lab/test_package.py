@@ -199,10 +199,12 @@ def test_it_has_one_version_everywhere(package):
     assert len(set(versions)) == 1, versions
 
 
-def test_its_program_is_static_and_hardened(package):
+@pytest.mark.parametrize("name", ["libexec/marlin", "libexec/marlin-mend",
+                                  "sbin/marlin-install"])
+def test_its_programs_are_static_and_hardened(package, name):
     """Nothing that can be written to is executed, or the other way around; what has
     been relocated cannot be written to any more."""
-    program = package.content / "usr/libexec/marlin"
+    program = package.content / "usr" / name
     headers = run("readelf", "-lW", program)
     assert "INTERP" not in headers and "GNU_RELRO" in headers
     assert re.search(r"GNU_STACK .* RW +0x", headers) and " RWE " not in headers
@@ -322,6 +324,20 @@ def test_systemd_accepts_the_unit(units):
     assert run("systemd-analyze", "verify", "--man=no", units, "marlin.service") == ""
 
 
+def test_systemd_accepts_the_mend(package, units):
+    """The drop-in, where an integrator puts it; one that cannot be run is noticed."""
+    place = Path(units.removeprefix("--root=")) / "etc/systemd/system/marlin.service.d"
+    example = package.content / "usr/share/doc/marlin/examples/marlin.service.d"
+    shutil.copytree(example, place)
+    verify = "systemd-analyze", "verify", "--man=no", units, "marlin.service"
+    assert run(*verify) == ""
+    drop_in = place / "mend.conf"
+    drop_in.write_text(drop_in.read_text().replace("/marlin-mend", "/marlin-mends"))
+    assert "marlin-mends" in subprocess.run(verify, text=True, stderr=subprocess.STDOUT,
+                                            stdout=subprocess.PIPE).stdout
+    shutil.rmtree(place)
+
+
 def test_systemd_rates_its_exposure_at_most_1(units, count):
     rating = run("systemd-analyze", "security", "--offline=true", units, "--no-pager",
                  "marlin.service")
@@ -371,6 +387,18 @@ def test_the_confinement_confines(confined):
 def test_devices_boot_confined(package, confined):
     shutil.copy(package.content / "usr/libexec/marlin", confined.with_suffix(".real"))
     boot("test_a_chosen_device_boots", confined)
+
+
+def test_the_mend_works_confined(package, confined):
+    mend = fresh(package.work / "mend") / "marlin-mend"
+    shutil.copy(confined, mend)
+    for place in (mend, confined):
+        shutil.copy(package.content / "usr/libexec" / place.name,
+                    place.with_suffix(".real"))
+    both = mend.with_name("both")
+    both.write_text(f"#!/bin/sh\n{mend}\nexec {confined}\n")
+    both.chmod(0o755)
+    boot("test_mixed_links_are_mended", both)
 
 
 def test_the_boot_tests_pass_confined(package, confined):
