@@ -21,11 +21,14 @@ NOT_ITS_OWN = (ZONEINFO, ICUTZ, LOCALTIME, RECORD)
 DONE, FAILED, BAD_USE, BUSY, NOT_NEWER = (f"exit {status}" for status in range(5))
 
 
-def zone(offset: int) -> str:
-    """A zone file, version 2, with one type of local time."""
-    block = (b"TZif2" + bytes(15) + struct.pack(">6I", 0, 0, 0, 0, 1, 4) +
-             struct.pack(">iBB", offset, 0, 0) + b"LMT\0")
-    return (2 * block + b"\nLMT0\n").decode("latin-1")
+def zone(offset: int, times=0) -> str:
+    """A zone file, version 2, with one type of local time, and so many times."""
+    def block(count, start):
+        return (b"TZif2" + bytes(15) + struct.pack(">6I", 0, 0, 0, count, 1, 4) + start
+                + bytes(count) + struct.pack(">iBB", offset, 0, 0) + b"LMT\0")
+
+    second = block(times, struct.pack(f">{times}q", *range(times)))
+    return (block(0, b"") + second + b"\nLMT0\n").decode("latin-1")
 
 
 def icu_data(text: str) -> str:

@@ -16,7 +16,7 @@ import re
 from lab.carriers import image
 from lab.device import Device, sound_device
 from lab.emulator import power_log
-from lab.emulator.machine import Console, zones
+from lab.emulator.machine import Console, Machine, zones
 from lab.emulator.power_cuts import Victim, check_recovery, insist
 from lab.paths import DOWNLOADS, TIMEZONE, TZ_LATEST
 from lab.seen import Entries, as_device
@@ -65,22 +65,33 @@ def icu_data() -> str:
     return header.decode("latin-1") + "ICU data\n" * 20_000
 
 
+def installing_device() -> Device:
+    """With an update on its system partition, and a place for the account's own."""
+    device = sound_device()
+    for zone in ZONES:
+        device.file(f"{TEMPLATE}/zoneinfo/{zone}", zones("U24A")["Europe/Paris"])
+    device.file(f"{TEMPLATE}/zoneinfo/+VERSION", "2024a\n")
+    device.file(f"{TEMPLATE}/icutz/icutz44l.dat", icu_data())
+    device.directory(DOWNLOADS)
+    device.directory(TIMEZONE, 0o1775)
+    return device
+
+
+def give_to_account(machine: Machine):
+    """What it needs, and nothing more."""
+    image.debugfs(machine.var, f"sif /db/timezone gid {ACCOUNT}",
+                  f"sif /db/timezone/tz uid {ACCOUNT}", write=True)
+
+
 class Installer(Victim):
     name = "install-cuts"
     loop = LOOP
     longest = 6
 
     def make_disk(self):
-        device = sound_device()
-        for zone in ZONES:
-            device.file(f"{TEMPLATE}/zoneinfo/{zone}", zones("U24A")["Europe/Paris"])
-        device.file(f"{TEMPLATE}/zoneinfo/+VERSION", "2024a\n")
-        device.file(f"{TEMPLATE}/icutz/icutz44l.dat", icu_data())
-        device.directory(DOWNLOADS)
-        device.directory(TIMEZONE, 0o1775)
+        device = installing_device()
         self.machine.build(device, "-J", "size=4", megabytes=32)
-        image.debugfs(self.machine.var, f'sif /db/timezone gid {ACCOUNT}',
-                      f'sif /db/timezone/tz uid {ACCOUNT}', write=True)
+        give_to_account(self.machine)
         self.template = {
             path.removeprefix(TEMPLATE): (node.kind, node.mode, node.text)
             for path, node in device.everything() if path.startswith(TEMPLATE + "/")}
