@@ -48,6 +48,7 @@ CONTENT = dict(reversed(line.split(maxsplit=1)) for line in """
     644 /usr/share/lintian/overrides/marlin
     644 /usr/share/man/man5/marlin-layout.5.gz
     644 /usr/share/man/man8/marlin-install.8.gz
+    644 /usr/share/man/man8/marlin-mend.8.gz
     644 /usr/share/man/man8/marlin.8.gz
 """.strip().splitlines())
 
@@ -187,7 +188,7 @@ def test_it_has_one_version_everywhere(package):
     changelog.write_bytes(gzip.decompress(
         (share / "doc/marlin/changelog.gz").read_bytes()))
     pages = sorted(share.glob("man/*/*.gz"))
-    assert len(pages) == 3
+    assert len(pages) == 4
     versions = [
         found(r"^## (\S+) - ", (PROJECT / "CHANGELOG.md").read_text()),
         found(r"^project\([^)]*VERSION ([\d.]+)",
@@ -325,16 +326,19 @@ def test_systemd_accepts_the_unit(units):
 
 
 def test_systemd_accepts_the_mend(package, units):
-    """The drop-in, where an integrator puts it; one that cannot be run is noticed."""
+    """The drop-in, where an integrator puts it. It may fail, so systemd does not look
+    for its program."""
     place = Path(units.removeprefix("--root=")) / "etc/systemd/system/marlin.service.d"
     example = package.content / "usr/share/doc/marlin/examples/marlin.service.d"
     shutil.copytree(example, place)
     verify = "systemd-analyze", "verify", "--man=no", units, "marlin.service"
     assert run(*verify) == ""
     drop_in = place / "mend.conf"
-    drop_in.write_text(drop_in.read_text().replace("/marlin-mend", "/marlin-mends"))
-    assert "marlin-mends" in subprocess.run(verify, text=True, stderr=subprocess.STDOUT,
-                                            stdout=subprocess.PIPE).stdout
+    text = drop_in.read_text()
+    program = found(r"^ExecStartPre=-/(.*)$", text)
+    assert os.access(package.content / program, os.X_OK)
+    drop_in.write_text(text.replace("ExecStartPre", "ExecBefore"))  # is it read?
+    assert "ExecBefore" in run(*verify)
     shutil.rmtree(place)
 
 

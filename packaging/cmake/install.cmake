@@ -7,7 +7,7 @@ include(GNUInstallDirs)
 
 install(TARGETS marlin marlin-mend RUNTIME DESTINATION ${CMAKE_INSTALL_LIBEXECDIR})
 install(TARGETS marlin-install RUNTIME DESTINATION ${CMAKE_INSTALL_SBINDIR})
-install(FILES docs/marlin.8 docs/marlin-install.8 DESTINATION ${CMAKE_INSTALL_MANDIR}/man8)
+install(FILES docs/marlin.8 docs/marlin-install.8 docs/marlin-mend.8 DESTINATION ${CMAKE_INSTALL_MANDIR}/man8)
 install(FILES docs/marlin-layout.5 DESTINATION ${CMAKE_INSTALL_MANDIR}/man5)
 
 if(MARLIN_UNIT_DIR)
