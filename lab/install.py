@@ -108,7 +108,7 @@ def announced(entries: Entries) -> str | None:
     return entries[TZ_LATEST].text if TZ_LATEST in entries else None
 
 
-def violations(before: Entries, after: Entries) -> list[str]:
+def violations(words: list[str], before: Entries, after: Entries) -> list[str]:
     """What must not be, whatever happened to the installer."""
     found = [f"{path} was changed" for path in NOT_ITS_OWN
              if (before.get(path) and before[path].identity) !=
@@ -122,7 +122,9 @@ def violations(before: Entries, after: Entries) -> list[str]:
         if not name.startswith(HIDDEN) and here != was and not is_update:
             found.append(f"{name} is neither what it was nor the update")
     target = announced(after)
-    if target not in (announced(before), update_path(NEW), None):
+    other = {"--prune": announced(before), "--withdraw": None}.get(
+        words[0], update_path(NEW))
+    if target not in (announced(before), other):
         found.append(f"{target} is announced")
     if target == update_path(NEW) and below(after, target) != source:
         found.append(f"{NEW} is announced and not whole")
@@ -140,7 +142,8 @@ def runs_again(words: list[str], before: Entries):
     """Undisturbed: brings it to its end, and nothing is left behind."""
     again = run(words)
     after = namespace.look()
-    found = violations(before, after) + [f"{name} is left" for name in hidden(after)]
+    found = violations(words, before, after)
+    found += [f"{name} is left" for name in hidden(after)]
     if again.ending not in (DONE, NOT_NEWER):
         found.append(f"the next run ends with {again.ending}: {again.log}")
     wanted = {"--prune": announced(before), "--withdraw": None}.get(

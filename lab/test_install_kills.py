@@ -34,7 +34,7 @@ def test_a_kill_of_the_installer(scene, call, boots_first, count):
     told = traced(words, "-e", f"trace={call.call}",
                   "-e", f"inject={call.call}:signal=KILL:when={call.number}")
     after = namespace.look()
-    found = violations(before, after)
+    found = violations(words, before, after)
     if told.ending != "killed" or told.log:
         found.append(f"ended with {told.ending}, printed {told.log!r}")
     if found:

@@ -43,6 +43,7 @@ struct contents {
   std::set<std::string> zones;  // such as Europe/Paris; links are zones, too
   std::size_t entries = 0;
   std::uint64_t bytes = 0;
+  friend bool operator==(const contents&, const contents&) = default;
 };
 
 // Walks through an update, `directory`, and throws `failure` at the first thing

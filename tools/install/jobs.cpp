@@ -87,10 +87,12 @@ class told_copy final : public receiver {
 
 // Checks again what it copies: the update may have changed since it was
 // checked.
-void copy_into(downloads& to, const update& given, std::size_t entries) {
+void copy_into(downloads& to, const update& given, const contents& checked) {
   const descriptor incoming = to.make_incoming();
-  told_copy copier(incoming.number(), to.incoming_path(), entries);
-  check_contents(given.name, examine(given.directory.number(), copier));
+  told_copy copier(incoming.number(), to.incoming_path(), checked.entries);
+  const contents copied = examine(given.directory.number(), copier);
+  check_contents(given.name, copied);
+  if (copied != checked) refuse("it was changed meanwhile");
 }
 
 void install(const update& given, bool force) {
@@ -99,7 +101,7 @@ void install(const update& given, bool force) {
   about(escaped(given.name) + ": ", "; nothing was changed", [&] {
     place.insist_on_room_for(given.name);
     try {
-      copy_into(place, given, found.entries);
+      copy_into(place, given, found);
       place.put_in_place(given.name);
       place.announce(given.name);
     } catch (...) {
