@@ -266,7 +266,7 @@ TEST_F(Installer, TakesBackASetThatCannotBeAnnounced) {
   EXPECT_EQ(link_at(timezone_root + "/.marlin-install.tz_latest"), nothing);
 }
 
-TEST_F(Installer, TakesBackACopyThatDoesNotFitOnTheDisk) {
+TEST_F(Installer, TakesBackACopyThatCannotBeWrittenWhole) {
   make_file(source + "/icutz/large.res", std::string(1u << 20, 'x'));
   const snapshot before = look_at_everything();
   const outcome failed = run({MARLIN_INSTALL, source}, [] {
