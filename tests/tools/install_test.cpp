@@ -8,6 +8,8 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <cstdlib>
+
 #include "tests/device/device.h"
 #include "tests/tools/tzif_text.h"
 
@@ -78,8 +80,7 @@ class Installer : public DeviceTest {
   }
 };
 
-// --- What it takes
-// -----------------------------------------------------------------
+// --- What it takes ----------------------------------------------------------
 
 TEST_F(Installer, InstallsAnUpdateThatTheNextBootTakes) {
   const outcome installed = install();
@@ -182,8 +183,26 @@ TEST_F(Installer, ChecksWithoutAChange) {
   EXPECT_EQ(look_at_everything(), before);
 }
 
-// --- What is not newer
-// ---------------------------------------------------------------
+TEST_F(Installer, ShowsOnATerminalHowFarItIs) {
+  for (int i = 0; i < 100; ++i)
+    make_file(source + "/zoneinfo/Etc/" + std::to_string(i), tzif::file());
+  const int terminal = ::posix_openpt(O_RDWR | O_NOCTTY | O_CLOEXEC);
+  ASSERT_EQ(::grantpt(terminal) + ::unlockpt(terminal), 0);
+  const std::string other_end = ::ptsname(terminal);
+  const outcome shown = run({MARLIN_INSTALL, source}, [&] {
+    ::dup2(::open(other_end.c_str(), O_RDWR | O_NOCTTY), STDOUT_FILENO);
+  });
+  EXPECT_EQ(shown.exit_status, 0);
+  char text[4096];
+  const ssize_t length = ::read(terminal, text, sizeof text);
+  ASSERT_GT(length, 0);
+  EXPECT_EQ(std::string(text, static_cast<std::size_t>(length)),
+            "\rinstalling: 29 %\rinstalling: 59 %\rinstalling: 89 %\r\033[K"
+            "2024b.1.0 is announced; the next boot decides\r\n");
+  ::close(terminal);
+}
+
+// --- What is not newer ------------------------------------------------------
 
 TEST_F(Installer, RefusesWhatIsNotNewerThanTheSystem) {
   install_system("2024b", "44l");
@@ -228,8 +247,7 @@ TEST_F(Installer, TakesAnUpdateBesideASystemWithoutAVersion) {
   EXPECT_EQ(install().log, "");
 }
 
-// --- What does not fit the device
-// ------------------------------------------------------
+// --- What does not fit the device -------------------------------------------
 
 TEST_F(Installer, RefusesAnotherSchemaThanTheSystems) {
   make_file(system_icu + "/icutzformat.txt", "45l\n");
@@ -283,8 +301,7 @@ TEST_F(Installer, TakesBackACopyThatCannotBeWrittenWhole) {
   EXPECT_EQ(link_at(tz_latest), nothing);
 }
 
-// --- Hostile updates
-// ------------------------------------------------------------------
+// --- Hostile updates --------------------------------------------------------
 
 struct hostile {
   const char* name;
@@ -512,8 +529,7 @@ TEST_F(Installer, RefusesWhatIsNoDirectory) {
   }
 }
 
-// --- Its other jobs
-// --------------------------------------------------------------------
+// --- Its other jobs ---------------------------------------------------------
 
 TEST_F(Installer, WithdrawsAnAnnouncement) {
   EXPECT_EQ(install().exit_status, 0);
