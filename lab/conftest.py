@@ -80,6 +80,9 @@ def never_seen() -> list[str]:
     wanted = []
     if TALLY.get("test_a_kill", 0) >= 200:
         wanted += [f"kills leave {window.name}" for window in test_kills.WINDOWS]
+    if TALLY.get("test_a_kill_of_the_installer", 0) >= 200:
+        wanted += ["kills that leave the new update announced",
+                   "kills that leave the old announcement"]
     if TALLY.get("states", 0) >= 2000:
         wanted += [f"of them: {outcome}" for outcome in properties.OUTCOMES]
     if TALLY.get("test_memory_is_refused", 0) == len(devices.CHOSEN):

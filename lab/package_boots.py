@@ -8,8 +8,8 @@ from lab import boot
 from lab.carriers import namespace
 from lab.conditions import Condition
 from lab.device import Device, sound_device
-from lab.devices import CHOSEN
-from lab.paths import DOWNLOADS
+from lab.devices import CHOSEN, activation
+from lab.paths import DOWNLOADS, ICUTZ, SYSTEM_ZONEINFO, ZONEINFO, update_path
 from lab.seen import Seen
 from lab.trial import entry_differences, expected, fail, log_differences, trial
 
@@ -54,3 +54,29 @@ def test_the_probe_is_refused():
 @pytest.mark.parametrize("name", CHOSEN)
 def test_a_chosen_device_boots(name):
     trial(CHOSEN[name]())
+
+
+@pytest.mark.parametrize("zoneinfo, icutz", [
+    (f"{update_path('2024a.1.0')}/zoneinfo", f"{update_path('2023d.1.0')}/icutz"),
+    (f"{update_path('2024a.1.0')}/zoneinfo", None),
+    (SYSTEM_ZONEINFO, f"{update_path('2023d.1.0')}/icutz"),
+    (SYSTEM_ZONEINFO, f"{update_path('gone')}/icutz")])
+def test_mixed_links_are_mended(zoneinfo, icutz):
+    """The mend runs first; then marlin finds a device without the link."""
+    device = activation("2023d.1.0")
+    device.link(ZONEINFO, zoneinfo)
+    device.drop(ICUTZ)
+    if icutz:
+        device.link(ICUTZ, icutz)
+    namespace.build(device)
+    before = namespace.look()
+    device.drop(ZONEINFO)
+    outcome = expected(device, Condition())
+    booted = boot.boot()
+    line, _, log = booted.log.partition("\n")
+    seen = Seen(before, namespace.look(), booted.ending, log)
+    found = log_differences(outcome, seen) + entry_differences(device, seen.after)
+    if line != f"marlin-mend: {ZONEINFO} did not fit {ICUTZ}; marlin makes both anew":
+        found.append(f"the mend printed {line!r}")
+    if found:
+        fail("the boot after the mend", found, before)

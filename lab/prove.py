@@ -12,6 +12,7 @@ takes samples, in eight minutes.
   load       too much of everything
   log        a log that is lost, or fails in the middle
   status     what marlin-status says, against what then happens
+  install    the installer of updates: calls that fail, kills, several at once
   fuzz       hostile texts
   sanitize   the tests under sanitizers and (not with --quick) valgrind
   coverage   lines and branches that the tests run through
@@ -39,6 +40,8 @@ TRIALS = {
     "load": ["test_load.py"],
     "log": ["test_log.py"],
     "status": ["test_status.py"],
+    "install": ["test_install_faults.py", "test_install_kills.py",
+                "test_install_races.py"],
 }
 OTHERS = {  # the whole, and with --quick
     "fuzz": (["lab.fuzz", "--seconds", "600"], ["lab.fuzz", "--seconds", "60"]),

@@ -31,6 +31,8 @@ CONTENT = dict(reversed(line.split(maxsplit=1)) for line in """
     777 /usr/lib/systemd/system/sysinit.target.wants/marlin.service -> ../marlin.service
     644 /usr/lib/tmpfiles.d/marlin.conf
     755 /usr/libexec/marlin
+    755 /usr/libexec/marlin-mend
+    755 /usr/sbin/marlin-install
     644 /usr/share/doc/marlin/README.md
     644 /usr/share/doc/marlin/SECURITY.md
     644 /usr/share/doc/marlin/changelog.gz
@@ -43,9 +45,12 @@ CONTENT = dict(reversed(line.split(maxsplit=1)) for line in """
     644 /usr/share/doc/marlin/docs/proofs.md
     755 /usr/share/doc/marlin/examples/init-script
     644 /usr/share/doc/marlin/examples/inittab
+    644 /usr/share/doc/marlin/examples/marlin.service.d/mend.conf
     644 /usr/share/lintian/overrides/marlin
     644 /usr/share/man/man5/marlin-layout.5.gz
     644 /usr/share/man/man8/marlin-status.8.gz
+    644 /usr/share/man/man8/marlin-install.8.gz
+    644 /usr/share/man/man8/marlin-mend.8.gz
     644 /usr/share/man/man8/marlin.8.gz
 """.strip().splitlines())
 
@@ -185,7 +190,7 @@ def test_it_has_one_version_everywhere(package):
     changelog.write_bytes(gzip.decompress(
         (share / "doc/marlin/changelog.gz").read_bytes()))
     pages = sorted(share.glob("man/*/*.gz"))
-    assert len(pages) == 2
+    assert len(pages) == 4
     versions = [
         found(r"^## (\S+) - ", (PROJECT / "CHANGELOG.md").read_text()),
         found(r"^project\([^)]*VERSION ([\d.]+)",
@@ -197,10 +202,12 @@ def test_it_has_one_version_everywhere(package):
     assert len(set(versions)) == 1, versions
 
 
-def test_its_program_is_static_and_hardened(package):
+@pytest.mark.parametrize("name", ["libexec/marlin", "libexec/marlin-mend",
+                                  "sbin/marlin-install"])
+def test_its_programs_are_static_and_hardened(package, name):
     """Nothing that can be written to is executed, or the other way around; what has
     been relocated cannot be written to any more."""
-    program = package.content / "usr/libexec/marlin"
+    program = package.content / "usr" / name
     headers = run("readelf", "-lW", program)
     assert "INTERP" not in headers and "GNU_RELRO" in headers
     assert re.search(r"GNU_STACK .* RW +0x", headers) and " RWE " not in headers
@@ -320,6 +327,23 @@ def test_systemd_accepts_the_unit(units):
     assert run("systemd-analyze", "verify", "--man=no", units, "marlin.service") == ""
 
 
+def test_systemd_accepts_the_mend(package, units):
+    """The drop-in, where an integrator puts it. It may fail, so systemd does not look
+    for its program."""
+    place = Path(units.removeprefix("--root=")) / "etc/systemd/system/marlin.service.d"
+    example = package.content / "usr/share/doc/marlin/examples/marlin.service.d"
+    shutil.copytree(example, place)
+    verify = "systemd-analyze", "verify", "--man=no", units, "marlin.service"
+    assert run(*verify) == ""
+    drop_in = place / "mend.conf"
+    text = drop_in.read_text()
+    program = found(r"^ExecStartPre=-/(.*)$", text)
+    assert os.access(package.content / program, os.X_OK)
+    drop_in.write_text(text.replace("ExecStartPre", "ExecBefore"))  # is it read?
+    assert "ExecBefore" in run(*verify)
+    shutil.rmtree(place)
+
+
 def test_systemd_rates_its_exposure_at_most_1(units, count):
     rating = run("systemd-analyze", "security", "--offline=true", units, "--no-pager",
                  "marlin.service")
@@ -369,6 +393,18 @@ def test_the_confinement_confines(confined):
 def test_devices_boot_confined(package, confined):
     shutil.copy(package.content / "usr/libexec/marlin", confined.with_suffix(".real"))
     boot("test_a_chosen_device_boots", confined)
+
+
+def test_the_mend_works_confined(package, confined):
+    mend = fresh(package.work / "mend") / "marlin-mend"
+    shutil.copy(confined, mend)
+    for place in (mend, confined):
+        shutil.copy(package.content / "usr/libexec" / place.name,
+                    place.with_suffix(".real"))
+    both = mend.with_name("both")
+    both.write_text(f"#!/bin/sh\n{mend}\nexec {confined}\n")
+    both.chmod(0o755)
+    boot("test_mixed_links_are_mended", both)
 
 
 def test_the_boot_tests_pass_confined(package, confined):

@@ -1,7 +1,7 @@
 # SPDX-License-Identifier: BSD-2-Clause
 """usage: scripts/bench [--rounds N]
        scripts/bench --check | --record | --growth | --hardening | --parsers |
-                     --companions
+                     --companions | --status
 
 Measures marlin, as it ships, inside a private device. Without an option: beside the
 least that its system calls can cost ("the floor", lab/bench/floor.c), its own dynamic
@@ -17,7 +17,9 @@ user-space instructions to the size of the file.
                 grow in step; writes the plot docs/growth.svg
   --hardening   what each hardening option costs
   --parsers     the two parsers, against std::regex
-  --companions  marlin-status, on a large device and on hostile ones
+  --companions  marlin-install with an update of 1 MB, which may take 100 ms beside
+                fsync(2) and 16 MB; marlin-mend, which has to cost less than marlin
+  --status      marlin-status, on a large device and on hostile ones; takes minutes
 
 Installs the Debian packages that it needs. Instructions are those of an environment
 that holds only PATH: each variable more costs some 550 in the C library's start-up, for
@@ -34,6 +36,7 @@ from collections.abc import Iterator
 from pathlib import Path
 
 from lab.bench.measure import SCENES
+from lab.bench.status import rows as status_rows
 from lab.doors import Options, need
 from lab.places import BUILD
 
@@ -276,17 +279,39 @@ def hardening():
         in zip([*HARDENING, "what ships"], files, quiet, thrown)])
 
 
+# --- Companions -------------------------------------------------------------------
+
+
 def companions():
+    marlin = built_static("marlin-install", "marlin-mend")
+    tools = [f"{BUILDS}/static/tools/{name}" for name in ("marlin-install",
+                                                          "marlin-mend")]
+    for tool in tools:
+        run("strip", tool)
+    figures = measured("companions", marlin, *tools)
+    (milliseconds, kilobytes), (boot, mend) = figures["install"], figures["quiet"]
+    print(f"marlin-install, an update of {figures['bytes']:,} bytes: "
+          f"{milliseconds:.0f} ms, {kilobytes:,} kB")
+    print_table("Quiet boot, Instructions, Calls, Peak kB, Bytes", [
+        ("marlin", *boot, size_of(marlin)),
+        ("marlin-mend", *mend, size_of(tools[1]))])
+    if milliseconds > 100 or kilobytes > 16_000:
+        sys.exit("marlin-install takes too much")
+    if any(here >= there for here, there in zip(mend, boot)):
+        sys.exit("marlin-mend costs as much as marlin")
+
+
+def status():
     built_static("marlin-status")
-    from lab.bench.companions import rows
-    print_table("Device, Milliseconds, MB, Exit status", list(rows()))
+    print_table("Device, Milliseconds, MB, Exit status", list(status_rows()))
 
 
 def main():
     parser = Options(__doc__)
     parser.add_argument("--rounds", default="11")
     jobs = parser.add_mutually_exclusive_group()
-    for job in (check, record, growth, hardening, parsers, companions):
+    for job in (check, record, growth, hardening, parsers, companions,
+                status):
         jobs.add_argument(f"--{job.__name__}", dest="job", action="store_const",
                           const=job, default=table)
     options = parser.parse_args()

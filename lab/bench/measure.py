@@ -1,6 +1,7 @@
 # SPDX-License-Identifier: BSD-2-Clause
 """The part of scripts/bench that runs inside the private device; prints JSON:
-measure counts PROGRAM..., measure wall ROUNDS PROGRAM..., measure growth PROGRAM.
+measure counts PROGRAM..., measure wall ROUNDS PROGRAM..., measure growth PROGRAM,
+measure companions MARLIN INSTALL MEND.
 
 A PROGRAM is a file, in whose path "SCENE" stands for the scene's name; the first one
 is the floor.
@@ -17,14 +18,16 @@ import statistics
 import subprocess
 import sys
 import tempfile
+import time
 from collections.abc import Callable, Iterator
 from pathlib import Path
 
 from lab.carriers import namespace
 from lab.device import Device, sound_device
 from lab.devices import activation
-from lab.paths import (ICUTZ, LOCALTIME, RECORD, SYSTEM_ZONEINFO, TZ_LATEST, ZONEINFO,
-                       update_path)
+from lab.install import SOURCE, icu_data, put_update, zone
+from lab.paths import (DOWNLOADS, ICUTZ, LOCALTIME, RECORD, SYSTEM_ZONEINFO, TZ_LATEST,
+                       ZONEINFO, update_path)
 from lab.seen import as_device
 
 ICU = f"{update_path('2024a.1.0')}/icutz"
@@ -181,6 +184,32 @@ def larger_devices() -> Iterator[tuple[str, int, Device]]:
         yield "version", size, device
 
 
+def companions(marlin: str, install: str, mend: str) -> dict:
+    """What the installer takes for an update of 1 MB on a disk where fsync(2) costs
+    nothing, in ms and kB, the fastest of some runs; and what marlin and the mend take
+    on the same quiet boot: instructions, calls, kB."""
+    device = sound_device()
+    device.directory(DOWNLOADS)
+    put_update(device, SOURCE, "2024b", 3600)
+    for number in range(600):
+        device.file(f"{SOURCE}/zoneinfo/Area{number % 20}/Zone{number}", zone(0, 125))
+    device.file(f"{SOURCE}/icutz/icutz44l.dat", icu_data("x" * 200_000))
+    restore = functools.partial(namespace.build, device)
+    times = []
+    for _ in range(11):
+        restore()
+        started = time.monotonic()
+        run(install, SOURCE)
+        times.append((time.monotonic() - started) * 1000)
+    restore()
+    return {"bytes": sum(len(text) for path, text in device.contents().items()
+                         if path.startswith(SOURCE)),
+            "install": [min(times), int(run(PEAK, install, SOURCE, stderr=None))],
+            "quiet": [measured(command, functools.partial(
+                namespace.build, in_use("2024a.1.0")))
+                for command in placed("quiet", [marlin, mend])]}
+
+
 def fill_icu_directory(others: int, match: str):
     """Not by way of a description: a million nodes are too many."""
     for number in range(others):
@@ -196,5 +225,6 @@ def fill_icu_directory(others: int, match: str):
 if __name__ == "__main__":
     namespace.insist_on_private_device()
     os.umask(0o022)
-    job = {"counts": counts, "wall": wall, "growth": growth}[sys.argv[1]]
+    job = {"counts": counts, "wall": wall, "growth": growth,
+           "companions": companions}[sys.argv[1]]
     print(json.dumps(job(*sys.argv[2:])))

@@ -35,13 +35,17 @@ def main() -> int:
                       "power at N random instants, and checks what is left")
     mode.add_argument("--boot-cost", action="store_true",
                       help="measures the part of a boot that the pass takes")
+    mode.add_argument("--install-cuts", type=number_of_cuts, metavar="N", help="the "
+                      "same while updates are installed")
+    parser.add_argument("--mend", action="store_true", help="of --power-cuts: each "
+                        "boot first removes links that are of two sets")
     parser.add_argument("--seed", type=int, help="of what chance decides in cuts")
     options = parser.parse_args()
     if subprocess.call([PROJECT / "scripts/packages", "pytest"]):
         return 77
     # After the options are understood: these take pytest.
     import pytest
-    from lab.emulator import boot_cost, parts, power_cuts, show
+    from lab.emulator import boot_cost, install_cuts, parts, power_cuts, show
     try:
         parts.prepare()
         if options.tests is not None:
@@ -52,7 +56,9 @@ def main() -> int:
         if options.shell:
             return show.shell()
         if options.power_cuts:
-            power_cuts.run(options.power_cuts, options.seed)
+            power_cuts.run(options.power_cuts, options.seed, options.mend)
+        elif options.install_cuts:
+            install_cuts.run(options.install_cuts, options.seed)
         elif options.boot_cost:
             boot_cost.measure()
         else:

@@ -19,7 +19,7 @@ from lab import lines
 from lab.boot import Booted, ending_of
 from lab.carriers import image
 from lab.device import Device, Node, decoded
-from lab.emulator.parts import PROGRAM, WORK, part
+from lab.emulator.parts import COMPANIONS, PROGRAM, WORK, part
 from lab.paths import ICUTZ, LOCALTIME, SYSTEM_ZONEINFO, TZ_LATEST, ZONEINFO
 from lab.seen import Entries
 
@@ -63,7 +63,8 @@ def system_partition(device: Device) -> Node:
     for path in ("/dev", "/proc", "/run", "/sys", "/tmp"):
         system.directory(path)
     system.file("/bin/busybox", decoded(part("bin/busybox").read_bytes()), 0o755)
-    system.file("/sbin/marlin", decoded(PROGRAM.read_bytes()), 0o755)
+    for program in (PROGRAM, *COMPANIONS):
+        system.file(f"/sbin/{program.name}", decoded(program.read_bytes()), 0o755)
     system.file("/sbin/boot", decoded((GUEST / "boot").read_bytes()), 0o755)
     system.file("/etc/passwd", "owner:x:1:1::/:/run/bin/sh\n")
     system.put("/usr/share", device.find("/usr/share"))

@@ -18,6 +18,8 @@ from lab.places import BUILD, PROJECT
 WORK = BUILD / "emulator"
 PARTS = WORK / "packages"
 PROGRAM = BUILD / "arm64-release" / "marlin"
+COMPANIONS = [PROGRAM.parent / "tools" / name
+              for name in ("marlin-install", "marlin-mend")]
 
 
 class Unavailable(Exception):

@@ -5,7 +5,8 @@ The device runs the pass over and over, with changing announcements, while other
 the disk; then the emulator is killed. What had not been flushed is kept or lost at
 random, the disk is checked after its journal has been replayed, and the device boots
 again: that boot's pass is to do what the model does with the state found on the disk,
-and it is where the next cut happens.
+and it is where the next cut happens. With the mend switched on no boot may leave
+links of two sets; each that a cut left is booted without the mend as well, on a copy.
 """
 
 import collections
@@ -104,15 +105,26 @@ def kind_of_record(device: Device) -> str:
     return "whole"
 
 
-def check_recovery(console: Console, entries: Entries):
+def mended(device: Device) -> Device:
+    """Without the link "zoneinfo", if it and "icutz" are of two sets."""
+    if "MIXED" in described(device):
+        device.drop(ZONEINFO)
+    return device
+
+
+def check_recovery(console: Console, entries: Entries, mend=False):
     """The first pass of a boot that found this is to do what the model does."""
     device = as_device(entries)
+    if mend:
+        mended(device)
     insist(log_differences(model.boot(device), Seen({}, {}, *console.booted())))
     insist([f"after the pass not: {text}" for text in shown_links(device)
             if text not in console.said])
     _, zone = console.find("reader sees zone ")
     if zone not in ("S23CP", "S23CL", "U24AP", "U24AL"):
         raise RuntimeError(f"a reader sees zone {zone}")
+    if mend and "MIXED" in described(device):
+        raise RuntimeError(f"after the mend: {described(device)}")
 
 
 def within_pass(console: Console) -> bool:
@@ -128,9 +140,13 @@ class Victim:
     """A device whose power is cut again and again; `found` is what the next boot
     finds."""
 
-    def __init__(self, seed: int):
-        self.random = random.Random(seed)
-        self.machine = Machine("power-cuts")
+    name = "power-cuts"
+    loop = LOOP
+    longest = 1.5  # seconds until the cut
+
+    def __init__(self, seed: int, mend=False):
+        self.random, self.mend = random.Random(seed), mend
+        self.machine = Machine(self.name + "-mended" * mend)
         self.make_disk()
 
     def make_disk(self):
@@ -150,14 +166,15 @@ class Victim:
         log.write_bytes(b"")
         mounted, syncs = self.random.choice(OTHERS)
         emulator = machine.start(
-            f"{syncs}n={first}{LOOP}", options="var=" + mounted,
+            f"{syncs}n={first}{self.loop}",
+            options="var=" + mounted + " mend" * self.mend,
             more=("-smp", "2"),  # processors: others sync in the middle of a pass
             disk="driver=blklogwrites,node-name=var,"
                  f"file.driver=file,file.filename={scratch},"
                  f"log.driver=file,log.filename={log}")
         try:
             machine.wait_for(emulator, "loop begins")
-            time.sleep(self.random.uniform(0, 1.5))
+            time.sleep(self.random.uniform(0, self.longest))
         finally:
             emulator.kill()
             emulator.wait()
@@ -176,8 +193,19 @@ class Victim:
         lost = power_log.cut_power(self.machine.var, log.read_bytes(),
                                    self.random.choice((0, 0.5, 1)), self.random)
         before, self.found = self.found, self.look_after_cut()
-        check_recovery(console, before)
+        check_recovery(console, before, self.mend)
         return within_pass(console), lost
+
+    def stays_mixed_without_mend(self) -> bool:
+        """What the next boot would make of the links that the last cut left."""
+        copy = self.machine.directory / "unmended.img"
+        shutil.copyfile(self.machine.var, copy)
+        console = self.machine.boot(disk="driver=raw,node-name=var,file.driver=file,"
+                                         f"file.filename={copy}")
+        check_recovery(console, self.found)
+        device = as_device(self.found)
+        model.boot(device)
+        return "MIXED" in described(device)
 
     def look_after_cut(self) -> Entries:
         """The disk as a boot would find it, after all checks that need no boot."""
@@ -201,7 +229,10 @@ def run_cuts(count: int, victim: Victim, table, totals):
         inside, lost = victim.cut()
         device = as_device(victim.found)
         state, record = described(device), kind_of_record(device)
-        model.boot(device)
+        totals["mixed"] += "MIXED" in state
+        if victim.mend and "MIXED" in state:
+            totals["stay mixed"] += victim.stays_mixed_without_mend()
+        model.boot(mended(device) if victim.mend else device)
         table[state, described(device), inside] += 1
         totals.update(["cuts", "record " + record] + ["inside"] * inside +
                       ["with losses"] * (lost > 0))
@@ -209,13 +240,18 @@ def run_cuts(count: int, victim: Victim, table, totals):
               f"{'inside the pass' if inside else 'between passes'}, "
               f"{lost} blocks lost; {state}; record {record}", flush=True)
     # The state that the last cut left is booted as well, and shut down.
-    check_recovery(victim.machine.boot(), victim.found)
+    options = "mend" if victim.mend else ""
+    check_recovery(victim.machine.boot(options=options), victim.found, victim.mend)
     image.check(victim.machine.var)
 
 
 def print_table(table, totals):
     print(f"\n{totals['cuts']} power cuts, {totals['inside']} of them inside the "
-          f"pass; {totals['with losses']} lost blocks that had been written.")
+          f"pass; {totals['with losses']} lost blocks that had been written; "
+          f"{totals['mixed']} left links of two sets.")
+    if totals["stay mixed"]:
+        print(f"Without the mend {totals['stay mixed']} of these stay so; with it, see "
+              "below.")
     print("The record afterwards: " + ", ".join(
         f"{totals['record ' + kind]} times {kind}"
         for kind in ("whole", "none", "empty", "of NUL bytes")))
@@ -226,12 +262,12 @@ def print_table(table, totals):
               f"  {healed}")
 
 
-def run(count: int, seed: int | None = None):
+def run(count: int, seed: int | None = None, mend=False):
     """Raises RuntimeError when a device is not as it has to be after a power cut."""
     seed = random.randrange(10**6) if seed is None else seed
     print(f"seed {seed}", flush=True)
     table, totals = collections.Counter(), collections.Counter()
-    victim = Victim(seed)
+    victim = Victim(seed, mend)
     try:
         run_cuts(count, victim, table, totals)
     except RuntimeError as reason:

@@ -7,6 +7,12 @@ include(GNUInstallDirs)
 
 install(TARGETS marlin RUNTIME DESTINATION ${CMAKE_INSTALL_LIBEXECDIR})
 install(FILES docs/marlin.8 DESTINATION ${CMAKE_INSTALL_MANDIR}/man8)
+if(TARGET marlin-install)
+  install(TARGETS marlin-mend RUNTIME DESTINATION ${CMAKE_INSTALL_LIBEXECDIR})
+  install(TARGETS marlin-install RUNTIME DESTINATION ${CMAKE_INSTALL_SBINDIR})
+  install(FILES docs/marlin-install.8 docs/marlin-mend.8
+          DESTINATION ${CMAKE_INSTALL_MANDIR}/man8)
+endif()
 if(TARGET marlin-status)
   install(TARGETS marlin-status RUNTIME DESTINATION ${CMAKE_INSTALL_BINDIR})
   install(FILES docs/marlin-status.8 DESTINATION ${CMAKE_INSTALL_MANDIR}/man8)

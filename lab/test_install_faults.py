@@ -1,0 +1,96 @@
+# SPDX-License-Identifier: BSD-2-Clause
+"""Every system call of an installation fails, in turn, with every error number that
+such a call can return, once and for good; so do those of pruning and withdrawing.
+Afterwards the old or the new update is announced, and whole; one line tells the reason;
+the next boot takes what is announced, or stays; and the next run is undisturbed."""
+
+from errno import (EAGAIN, EDQUOT, EEXIST, EINTR, EIO, EMLINK, ENOLCK, ENOSPC,
+                   ENOTDIR, ENOTEMPTY, EPERM, EROFS, EXDEV, errorcode)
+
+from lab import boot
+from lab.carriers import namespace
+from lab.install import (BUSY, DONE, FAILED, NEW, NOT_NEWER, SCENES, announced, hidden,
+                         names, next_boot, runs_again, traced, violations)
+from lab.paths import update_path
+from lab.test_faults import CHANGE, ERRORS, LASTING, OPEN
+from lab.trial import fail
+
+MORE = {
+    "create": OPEN + [EDQUOT, EEXIST, ENOSPC, EROFS],
+    "mkdir": CHANGE + [EEXIST, EMLINK],
+    "link": CHANGE + [EEXIST, EMLINK, EXDEV],
+    "rename": CHANGE + [EEXIST, ENOTEMPTY, EXDEV],
+    "chmod": [EIO, EPERM, EROFS],
+    "fsync": [EDQUOT, EIO, ENOSPC, EROFS],
+    "flock": [EAGAIN, EIO, ENOLCK],
+}
+EXPECTED = {**ERRORS, **MORE}
+# No run that met such a failure may say that it is done.
+# One that means that a name is taken may lead to another name.
+TAKEN = {EEXIST, ENOTDIR, ENOTEMPTY}
+TELLING = {"create", "mkdir", "link", "rename", "symlink", "chmod", "fsync", "write"}
+
+
+def disturbances(quick):
+    for scene, (make, words) in SCENES.items():
+        namespace.build(make())
+        traced(words)
+        calls = list(boot.calls())
+        # After that only what nobody needs is deleted, as far as that can be done.
+        done = max(number for number, call in enumerate(calls) if call.name == "fsync")
+        for number, call in enumerate(calls):
+            if number < boot.beginning(calls):
+                continue
+            errors = EXPECTED.get(call.name, [])
+            if quick and errors:
+                errors = [errors[number % len(errors)]]
+            for error in sorted(errors):
+                yield scene, call, error, str(call.number), number <= done
+                if error in LASTING and not (quick and number % 4):
+                    yield scene, call, error, f"{call.number}+", number <= done
+
+
+def pytest_generate_tests(metafunc):
+    table = list(disturbances(metafunc.config.getoption("quick")))
+    metafunc.parametrize("scene, call, error, when, telling", table, ids=[
+        f"{scene}: {call.call} {when}, {call.name} {call.path or ''} {errorcode[error]}"
+        for scene, call, error, when, _ in table])
+
+
+def test_a_call_that_fails(scene, call, error, when, telling, count):
+    make, words = SCENES[scene]
+    namespace.build(make())
+    before = namespace.look()
+    told = traced(words, *boot.failing(call.call, error, when))
+    after = namespace.look()
+    found = violations(words, before, after)
+    lines = told.log.splitlines()
+    retried = error == EINTR or call.name == "rename" and error in TAKEN
+    telling = telling and call.name in TELLING and not retried
+    if telling and told.ending == DONE:
+        found.append("it says that it is done")
+    if told.ending not in (DONE, FAILED, BUSY, NOT_NEWER):
+        found.append(f"it ends with {told.ending}")
+    # A line that tells it cannot be written either.
+    mute = call.name == "write" and when.endswith("+")
+    if len(lines) != (told.ending != DONE and not mute):
+        found.append(f"it ends with {told.ending} and prints {told.log!r}")
+    if words[0][0] != "-":
+        is_new = announced(after) == update_path(NEW)
+        said = told.ending == DONE or any("; it is announced, but" in line
+                                          for line in lines)
+        if is_new != said and not mute:
+            found.append(f"announced is {announced(after)}, it says {told.log!r}")
+    if any("nothing was changed" in line for line in lines):
+        if announced(after) != announced(before):
+            found.append("something was changed")
+    if scene == "a first update" and not when.endswith("+"):
+        # One failing call cannot keep it from deleting what it has made.
+        found += [f"{name} is left" for name in hidden(after)]
+        if (NEW in names(after)) != (announced(after) is not None):
+            found.append("what is there is not what is announced")
+    if found:
+        fail(f"{told}", found, before)
+    count(f"that end with {told.ending}")
+    runs_again(words, before)
+    next_boot(namespace.look())

@@ -1,0 +1,49 @@
+# SPDX-License-Identifier: BSD-2-Clause
+"""The installer is killed at every system call, before the call takes effect, and
+therefore also after the one before it. What is announced then is the old update or the
+new one, and whole; the next boot takes it or stays; and the next run does the rest."""
+
+import pytest
+
+from lab import boot
+from lab.carriers import namespace
+from lab.install import (NEW, SCENES, announced, next_boot, runs_again, traced,
+                         violations)
+from lab.paths import update_path
+from lab.trial import fail
+
+
+def pytest_generate_tests(metafunc):
+    table = []
+    for scene, (make, words) in SCENES.items():
+        namespace.build(make())
+        traced(words)
+        table += [(scene, call) for call in list(boot.calls())[1:]]
+    if metafunc.config.getoption("quick"):
+        table = table[::4]
+    metafunc.parametrize("scene, call", table, ids=[
+        f"{scene}: {call.call} {call.number}, {call.name} {call.path or ''}"
+        for scene, call in table])
+
+
+@pytest.mark.parametrize("boots_first", [True, False])
+def test_a_kill_of_the_installer(scene, call, boots_first, count):
+    make, words = SCENES[scene]
+    namespace.build(make())
+    before = namespace.look()
+    told = traced(words, "-e", f"trace={call.call}",
+                  "-e", f"inject={call.call}:signal=KILL:when={call.number}")
+    after = namespace.look()
+    found = violations(words, before, after)
+    if told.ending != "killed" or told.log:
+        found.append(f"ended with {told.ending}, printed {told.log!r}")
+    if found:
+        fail("the kill", found, before)
+    is_new = announced(after) == update_path(NEW)
+    count("kills that leave the new update announced" if is_new else
+          "kills that leave the old announcement")
+    if boots_first:
+        next_boot(after)
+    else:
+        runs_again(words, before)
+        next_boot(namespace.look())

@@ -1,0 +1,140 @@
+// SPDX-License-Identifier: BSD-2-Clause
+#include <fcntl.h>
+#include <sys/stat.h>
+
+#include "tests/device/device.h"
+#include "tools/install/device_facts.h"
+#include "tools/install/failure.h"
+#include "tools/install/path_text.h"
+#include "tools/install/removal.h"
+
+using namespace device;
+
+namespace {
+
+TEST(JoinedPath, IsTheWayByTheTextAlone) {
+  EXPECT_EQ(joined("a/b", "../c//./d"), "a/c/d");
+  EXPECT_EQ(joined("zoneinfo/US", "../America/New_York"),
+            "zoneinfo/America/New_York");
+  EXPECT_EQ(joined("", "/Europe//Paris"), "Europe/Paris");
+  EXPECT_EQ(joined("a", ".."), "");
+  EXPECT_EQ(joined("a", "../.."), "");
+  EXPECT_EQ(joined("a", "../../a/b"), "");
+}
+
+class Removal : public DeviceTest {
+ protected:
+  static removed remove() { return remove_entry(AT_FDCWD, place, place); }
+  inline static const std::string place = "/var/db/place";
+};
+
+TEST_F(Removal, OfNothingIsQuiet) { EXPECT_EQ(remove().files, 0u); }
+
+TEST_F(Removal, TellsHowMuchItWas) {
+  make_file(place + "/a/b/one", std::string(5000, 'x'));
+  make_file(place + "/two", "x");
+  make_link(place + "/link", "/usr/share");
+  const removed gone = remove();
+  EXPECT_EQ(gone.files, 3u);
+  EXPECT_EQ(gone.bytes, 8192u + 4096u);
+  EXPECT_EQ(file_at(place), nothing);
+}
+
+TEST_F(Removal, FollowsNoLink) {
+  make_file("/var/db/kept/file", "kept");
+  make_link(place, "/var/db/kept");
+  remove();
+  make_directory(place);
+  make_link(place + "/link", "/var/db/kept");
+  remove();
+  EXPECT_EQ(link_at(place), nothing);
+  EXPECT_EQ(file_at("/var/db/kept/file"), "kept");
+}
+
+TEST_F(Removal, TakesDirectoriesThatAreClosed) {
+  make_file(place + "/a/b/file");
+  set_mode(place + "/a/b", 0555);
+  set_mode(place + "/a", 0500);
+  remove();
+  EXPECT_EQ(file_at(place), nothing);
+}
+
+TEST_F(Removal, GoesDeeperThanAnyPath) {
+  make_directory(place);
+  ASSERT_EQ(
+      run({"/usr/bin/sh", "-c",
+           "cd " + place +
+               " && n=$(printf %0200d 0); for i in $(seq 500); do mkdir .$i "
+               "$n && touch f && cd -P $n || exit 1; done"})
+          .exit_status,
+      0);
+  EXPECT_EQ(remove().files, 500u);
+  EXPECT_EQ(file_at(place), nothing);
+}
+
+TEST_F(Removal, TellsWhatCannotBeRemoved) {
+  make_file("/var/db/closed/file");
+  set_mode("/var/db/closed", 0555);
+  try {
+    remove_entry(AT_FDCWD, "/var/db/closed/file", "a\nname");
+    FAIL() << "nothing was thrown";
+  } catch (const ::failure& told) {
+    EXPECT_EQ(told.line, "cannot remove a\\x0aname: Permission denied");
+    EXPECT_EQ(told.exit_status, 1);
+  }
+}
+
+class DeviceFacts : public DeviceTest {};
+
+TEST_F(DeviceFacts, ASetIsNeededByAnyLinkIntoIt) {
+  install_update("2024a.1.0", "44l");
+  make_directory("/var/db/elsewhere");
+  make_link(update("2024b.1.0"), "/var/db/elsewhere");
+  point_zoneinfo_at(update("2024a.1.0") + "/zoneinfo");
+  make_link(icutz, update("2023d.1.0") + "/icutz");
+  make_link(tz_latest, "tz/../tz/2024a.1.0");
+  make_link(legacy_icutz, update("2022a") + "/icutz");
+  EXPECT_EQ(needed_sets(),
+            (std::set<std::string>{"2022a", "2023d.1.0", "2024a.1.0"}));
+  wipe(zoneinfo);
+  EXPECT_TRUE(needed_sets().contains("2024a.1.0")) << "by the way of tz_latest";
+}
+
+TEST_F(DeviceFacts, TheUsersZoneIsReadFromTheText) {
+  for (const auto& [text, zone] :
+       std::vector<std::pair<std::string, std::string>>{
+           {zoneinfo + "/Europe/Paris", "Europe/Paris"},
+           {zoneinfo + "//Europe/./Paris", "Europe/Paris"},
+           {"/usr/share/zoneinfo/Asia/Tokyo", "Asia/Tokyo"},
+           {zoneinfo, ""},
+           {zoneinfo + "x/Europe", ""},
+           {zoneinfo + "/../../x", ""},
+           {"/elsewhere/Europe/Paris", ""}}) {
+    point_localtime_at(text);
+    EXPECT_EQ(zone_of_the_user(), zone) << text;
+  }
+  wipe(local_time);
+  EXPECT_EQ(zone_of_the_user(), "");
+}
+
+TEST_F(DeviceFacts, OnlyASetThatIsThereIsAnnouncedOrInUse) {
+  announce("2024a.1.0");
+  point_links_at_update("2024a.1.0");
+  EXPECT_EQ(announced_set() + set_in_use(), "");
+  install_update("2024a.1.0", "44l");
+  EXPECT_EQ(announced_set(), "2024a.1.0");
+  EXPECT_EQ(set_in_use(), "2024a.1.0");
+}
+
+TEST_F(DeviceFacts, NoTextPrintsALine) {
+  EXPECT_THAT(printed_by([] {
+                for (const char* text : {"", "x", "2024", "2024a.99999999999",
+                                         "99999999999999a", "2024a\n"})
+                  EXPECT_FALSE(version_in(text)) << text;
+                EXPECT_TRUE(version_in("2024a.1.0"));
+                EXPECT_EQ(system_version() + system_schema(), ".1.0");
+              }),
+              no_lines());
+}
+
+}  // namespace

@@ -1,0 +1,136 @@
+// SPDX-License-Identifier: BSD-2-Clause
+#include "tests/device/device.h"
+
+using namespace device;
+
+namespace {
+
+class Mend : public DeviceTest {
+ protected:
+  void SetUp() override {
+    DeviceTest::SetUp();
+    install_system("2023c", "44l");
+    install_update("2023d.1.0", "44l");
+    install_update("2024a.1.0", "44l");
+  }
+
+  static void expect_left_alone() {
+    const snapshot before = look_at_everything();
+    const outcome mended = run({MARLIN_MEND});
+    EXPECT_EQ(mended.exit_status, 0);
+    EXPECT_EQ(mended.log, "");
+    EXPECT_EQ(look_at_everything(), before);
+  }
+
+  static void expect_mended() {
+    snapshot before = look_at_everything();
+    const outcome mended = run({MARLIN_MEND});
+    EXPECT_EQ(mended.exit_status, 0);
+    EXPECT_EQ(mended.log,
+              "marlin-mend: /var/db/timezone/zoneinfo did not fit "
+              "/var/db/timezone/icutz; marlin makes both anew\n");
+    before.erase(zoneinfo);
+    snapshot after = look_at_everything();
+    before.erase(timezone_root);
+    after.erase(timezone_root);
+    EXPECT_EQ(after, before);
+  }
+};
+
+TEST_F(Mend, LeavesLinksOfOneSetAlone) {
+  point_links_at_system();
+  expect_left_alone();
+  point_links_at_update("2024a.1.0");
+  expect_left_alone();
+}
+
+TEST_F(Mend, LeavesToMarlinWhatItResetsAnyway) {
+  expect_left_alone();
+  make_link(icutz, update("2024a.1.0") + "/icutz");
+  expect_left_alone();
+  for (const char* target : {"/elsewhere", "/usr/share/zoneinfo.default/", "",
+                             "/var/db/timezone/tz", "tz/2024a.1.0/zoneinfo"}) {
+    if (*target == '\0') {
+      wipe(zoneinfo);
+      make_directory(zoneinfo);
+    } else {
+      wipe(zoneinfo);
+      point_zoneinfo_at(target);
+    }
+    expect_left_alone();
+  }
+}
+
+TEST_F(Mend, LeavesADirectoryInPlaceOfTheIcuLinkAlone) {
+  point_links_at_update("2024a.1.0");
+  wipe(icutz);
+  make_directory(icutz);
+  expect_left_alone();
+  point_links_at_system();
+  make_directory(icutz);
+  expect_left_alone();
+}
+
+TEST_F(Mend, MendsAnActivationThatWasCutShort) {
+  for (const char* older : {"", "2023d.1.0"}) {
+    point_links_at_update("2024a.1.0");
+    wipe(icutz);
+    wipe(record);
+    if (*older != '\0') make_link(icutz, update(older) + "/icutz");
+    announce("2024a.1.0");
+    expect_mended();
+    EXPECT_EQ(boot().exit_status, 0);
+    EXPECT_EQ(link_at(zoneinfo), update("2024a.1.0") + "/zoneinfo");
+    EXPECT_EQ(link_at(icutz), update("2024a.1.0") + "/icutz");
+    EXPECT_EQ(file_at(record), "2023c.1.0_2024a.1.0");
+    expect_left_alone();
+  }
+}
+
+TEST_F(Mend, MendsAResetThatWasCutShort) {
+  point_links_at_system();
+  make_link(icutz, update("2024a.1.0") + "/icutz");
+  expect_mended();
+  EXPECT_EQ(boot().exit_status, 0);
+  EXPECT_EQ(link_at(zoneinfo), system_tree);
+  EXPECT_EQ(link_at(icutz), nothing);
+  expect_left_alone();
+}
+
+TEST_F(Mend, ComparesWholeNames) {
+  point_links_at_update("2024a.1.0");
+  for (const char* name : {"2024a.1.0/icutz/", "2024a.1.0/icutzx",
+                           "2024a.1.00/icutz", "2024a.1/icutz", "2024a.1.0"}) {
+    point_zoneinfo_at(update("2024a.1.0") + "/zoneinfo");
+    make_link(icutz, update(name));
+    expect_mended();
+  }
+}
+
+TEST_F(Mend, ReckonsWithALinkInItsFormerPlace) {
+  point_links_at_update("2024a.1.0");
+  wipe(icutz);
+  make_link(legacy_icutz, update("2024a.1.0") + "/icutz");
+  expect_left_alone();
+  EXPECT_EQ(boot().log, "");
+  EXPECT_EQ(link_at(icutz), update("2024a.1.0") + "/icutz");
+  wipe(icutz);
+  make_link(legacy_icutz, update("2023d.1.0") + "/icutz");
+  expect_mended();
+}
+
+TEST_F(Mend, TellsThatItCannotRemoveTheLink) {
+  point_links_at_system();
+  make_link(icutz, update("2024a.1.0") + "/icutz");
+  set_mode(timezone_root, 0555);
+  const outcome failed = run({MARLIN_MEND});
+  EXPECT_EQ(failed.exit_status, 1);
+  EXPECT_EQ(
+      failed.log,
+      "marlin-mend: cannot remove /var/db/timezone/zoneinfo, which does not "
+      "fit /var/db/timezone/icutz: Permission denied\n");
+  set_mode(timezone_root, 0755);
+  EXPECT_EQ(boot().exit_status, 0);
+}
+
+}  // namespace

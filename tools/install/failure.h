@@ -1,0 +1,31 @@
+// SPDX-License-Identifier: BSD-2-Clause
+//
+// How marlin-install ends when it cannot do what it was asked: one line, and an
+// exit status. Thrown as a value, shown by main().
+#pragma once
+
+#include <string>
+#include <string_view>
+
+namespace status {
+
+inline constexpr int done = 0;
+inline constexpr int failed = 1;   // the update is refused, or a call failed
+inline constexpr int bad_use = 2;  // of the command line
+inline constexpr int busy = 3;     // another one is at work
+inline constexpr int not_newer =
+    4;  // the device has this update or a newer one
+
+}  // namespace status
+
+struct failure {
+  int exit_status;
+  std::string line;  // safe to show, without the program's name
+};
+
+// Throws `failure` with status::failed. `what` must be safe to show.
+[[noreturn]] void refuse(const std::string& what);
+
+// The same for a call that has just failed: "cannot WHAT: " and the text of
+// errno. `name`, if any, is the path that the call was about, shown escaped.
+[[noreturn]] void fail(const char* what, std::string_view name);

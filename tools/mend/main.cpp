@@ -1,0 +1,66 @@
+// SPDX-License-Identifier: BSD-2-Clause
+//
+// Run before marlin, on devices that switch it on: if "zoneinfo" and "icutz" do
+// not name the same data, as after a loss of power between the two links,
+// removes "zoneinfo". marlin then makes both anew, by its own rules. Two calls
+// on a quiet boot; it may fail, and the boot goes on without it.
+#include <err.h>
+#include <limits.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <string_view>
+
+#include "support/paths.h"
+
+namespace {
+
+class link_read {
+ public:
+  explicit link_read(const char* path)
+      : length_(::readlink(path, text_, sizeof text_)),
+        missing_(length_ < 0 && errno == ENOENT) {}
+  bool missing() const { return missing_; }
+  // Something that is no link, or cannot be read, is left to marlin.
+  bool unclear() const { return length_ < 0 && !missing_; }
+  std::string_view text() const {
+    return {text_, length_ < 0 ? 0 : static_cast<std::size_t>(length_)};
+  }
+
+ private:
+  char text_[PATH_MAX];
+  ssize_t length_;
+  bool missing_;
+};
+
+// As marlin understands it, the data set is what is before the last "/".
+bool same_update(std::string_view tree, std::string_view icu_data) {
+  const std::string_view set = tree.substr(0, tree.rfind('/'));
+  return icu_data.starts_with(set) && icu_data.substr(set.size()) == "/icutz";
+}
+
+bool mixed(const link_read& tree, const link_read& icu_data) {
+  if (icu_data.unclear()) return false;
+  if (tree.text() == paths::system_zoneinfo) return !icu_data.missing();
+  return tree.text().starts_with(paths::download_root) &&
+         !same_update(tree.text(), icu_data.text());
+}
+
+bool mixed(const link_read& tree) {
+  const link_read icu_data(paths::icu_link);
+  if (!icu_data.missing()) return mixed(tree, icu_data);
+  // marlin is about to move a link from where older systems had it.
+  return mixed(tree, link_read(paths::legacy_icu_link));
+}
+
+}  // namespace
+
+int main() {
+  if (!mixed(link_read(paths::zoneinfo_link))) return 0;
+  if (::unlink(paths::zoneinfo_link) != 0)
+    ::err(1, "cannot remove %s, which does not fit %s", paths::zoneinfo_link,
+          paths::icu_link);
+  ::warnx("%s did not fit %s; marlin makes both anew", paths::zoneinfo_link,
+          paths::icu_link);
+  return 0;
+}
