@@ -318,7 +318,7 @@ def case(status: int, *changes: Callable[[Tree], object], **facts) -> Case:
 
 def does(step: str) -> str:
     """The place of a step in the list of them."""
-    steps = "legacy_icu_link old_icu current usable update last_resort localtime"
+    steps = "legacy_icu_link old_icu current usable update record last_resort localtime"
     return f"next_boot__steps__{steps.split().index(step)}__reason"
 
 
@@ -417,10 +417,10 @@ CASES = {
         2, lambda t: t.link(LOCALTIME, ZONEINFO + OUTSIDE + "/passwd"),
         now__zone_is_file=False),
     "a record that is a link to the host": case(
-        1, lambda t: t.announce("2024a.1.0"), lambda t: t.link(RECORD, "/etc/passwd"),
+        2, lambda t: t.announce("2024a.1.0"), lambda t: t.link(RECORD, "/etc/passwd"),
         next_boot__after__record={"kind": "link", "target": "/etc/passwd"}),
     "a record that is a directory": case(
-        1, lambda t: t.announce("2024a.1.0"), lambda t: t.directory(RECORD)),
+        2, lambda t: t.announce("2024a.1.0"), lambda t: t.directory(RECORD)),
     "var is a link inside": case(0, lambda t: t.move("/var", "/data"),
                                  lambda t: t.link("/var", "data")),
     "var is an absolute link inside": case(0, lambda t: t.move("/var", "/data"),
@@ -446,6 +446,38 @@ CASES = {
         2, lambda t: t.directory("/var/db/timezone", 0o000)),
     "downloads that nobody may read": case(
         0, lambda t: t.directory("/var/db/timezone/tz", 0o000)),
+    "data behind what the boot removes": case(
+        2, lambda t: t.use("2024a.1.0"), lambda t: t.announce("2024b.1.0"),
+        lambda t: t.move(update_path("2024b.1.0/icutz"), "/var/db/real"),
+        lambda t: t.link(OLD_ICU, "/var/db/real"),
+        lambda t: t.link(update_path("2024b.1.0/icutz"), OLD_ICU),
+        **{does("update"): "changed_by_the_boot"}),
+    "current data behind what the boot removes": case(
+        2, lambda t: t.use("2024b.1.0"),
+        lambda t: t.move(update_path("2024b.1.0/icutz"), "/var/db/real"),
+        lambda t: t.link(OLD_ICU, "/var/db/real"),
+        lambda t: t.link(update_path("2024b.1.0/icutz"), OLD_ICU),
+        **{does("usable"): "changed_by_the_boot"}),
+    "links behind what the boot removes": case(
+        2, lambda t: t.move("/var/db/timezone", "/var/db/zones"),
+        lambda t: t.link("/var/db/timezone", "icu"),
+        lambda t: t.link(OLD_ICU, "zones"),
+        **{does("current"): "changed_by_the_boot"}),
+    "a directory that is its own downloads": case(
+        2, lambda t: t.drop(ZONEINFO), lambda t: t.drop("/var/db/timezone/tz"),
+        lambda t: t.link("/var/db/timezone/tz", "."), next_boot__ends="abnormally"),
+    "a download that is a link": case(
+        0, lambda t: t.use("2024a.1.0"),
+        lambda t: t.move(update_path("2024a.1.0"), update_path("real")),
+        lambda t: t.link(update_path("2024a.1.0"), "real"),
+        downloads__1={"name": "real", "needed_by": ["zoneinfo", "icutz"]}),
+    "downloads that are a file": case(
+        0, lambda t: t.drop("/var/db/timezone/tz"),
+        lambda t: t.file("/var/db/timezone/tz"), downloads=[],
+        downloads_error="Not a directory"),
+    "var db is a file": case(2, lambda t: t.drop("/var/db"),
+                             lambda t: t.file("/var/db"),
+                             **{does("old_icu"): "unreachable"}),
     "no var": case(2, lambda t: t.drop("/var")),
     "no timezone directory": case(2, lambda t: t.drop("/var/db/timezone"),
                                   next_boot__ends="abnormally"),
@@ -550,7 +582,11 @@ def test_a_tree_that_disappears():
 
 @pytest.mark.parametrize("words, status, line", [
     (["--rot"], 64, "--rot is not understood; see --help"),
-    (["--root"], 64, "--root is not understood; see --help"),
+    (["--rock"], 64, "--rock is not understood; see --help"),
+    (["-xh"], 64, "-x is not understood; see --help"),
+    (["--root"], 64, "--root needs a directory; see --help"),
+    (["--root="], 64, "--root needs a directory; see --help"),
+    (["--json", "--check"], 64, "one of --json and --check is enough; see --help"),
     (["x\033[2J"], 64, r"x\x1b[2J is not expected; see --help"),
     (["--", "--json"], 64, "--json is not expected; see --help"),
     (["--root", "/nowhere"], 77, "cannot tell: /nowhere: No such file or directory"),

@@ -69,7 +69,7 @@ report hostile() {
   told.device.system.unreadable = {all_bytes()};
   told.device.update = told.device.system;
   told.device.update->path = all_bytes();
-  told.device.downloads = {all_bytes()};
+  told.device.downloads = {{all_bytes(), {"zoneinfo"}}};
   told.boot.lines = {{"%s", all_bytes(), 0}};
   told.after = told.device.links;
   return told;
@@ -131,14 +131,14 @@ TEST(Zone, IsWhatFollowsTheTree) {
   EXPECT_EQ(zone_in("/var/db/timezone/zoneinfo"), "");
 }
 
-TEST(Downloads, AreNeededByWhatLeadsIntoThem) {
-  link_facts links;
-  links.zoneinfo = {entry::kind::link,
-                    "/var/db/timezone/tz/2024a.1.0/zoneinfo"};
-  links.tz_latest = {entry::kind::link, "/var/db/timezone/tz/2024a.1.0"};
-  EXPECT_EQ(needed_by(links, "2024a.1.0"), "zoneinfo, tz_latest");
-  EXPECT_EQ(needed_by(links, "2024a.1"), "");
-  EXPECT_EQ(needed_by(links, "2024a.1.0.1"), "");
+TEST(Rows, TellANameFromWhatIsSaidOfIt) {
+  report told;
+  told.device.downloads = {{"x\", for \"y", {}}};
+  told.device.links.record = {entry::kind::file, "none"};
+  EXPECT_THAT(in_rows(told, {}),
+              HasSubstr("downloads   \"x\\x22, for \\x22y\", which no link "
+                        "needs\n"));
+  EXPECT_THAT(in_rows(told, {}), HasSubstr("record      \"none\"\n"));
 }
 
 TEST(Reasons, HaveDifferentNames) {

@@ -61,29 +61,37 @@ constexpr row table[] = {
 
     {"old_icu", "nothing", "none", sound, "none"},
     {"old_icu", "removed", "obsolete", changes, "/var/db/icu is removed"},
+    {"old_icu", "nothing", "unreachable", sound, "it cannot be looked at"},
     {"old_icu", "kept", "not_removed", wrong, "/var/db/icu cannot be removed"},
 
     {"current", "not_reached", "earlier_failure", wrong, "not looked at"},
     {"current", "read", "system", sound, "zoneinfo names the system partition"},
     {"current", "read", "update", sound, "zoneinfo names the update %1"},
     {"current", "reset", "no_link", changes,
-     "there is no link zoneinfo: links are reset to the system partition"},
+     "there is no link zoneinfo: a reset to the system partition"},
     {"current", "reset", "bad_target", wrong,
-     "zoneinfo names no data set: links are reset to the system partition"},
+     "zoneinfo names no data set: a reset to the system partition"},
+    {"current", "reset", "changed_by_the_boot", wrong,
+     "zoneinfo is reached through a link that the boot has just changed: a "
+     "reset "
+     "to the system partition"},
     {"current", "reset", "not_a_link", wrong,
-     "zoneinfo is not a link: links are reset to the system partition"},
+     "zoneinfo is not a link: a reset to the system partition"},
     {"current", "reset", "unreadable", wrong,
-     "zoneinfo cannot be read: links are reset to the system partition"},
+     "zoneinfo cannot be read: a reset to the system partition"},
 
     {"usable", "not_reached", "earlier_failure", wrong, "not looked at"},
     {"usable", "kept", "fits", sound, "it fits the system"},
     {"usable", "reset", "other_schema", wrong,
-     "it has %1, the system has %2: links are reset to the system partition"},
+     "it has %1, the system has %2: a reset to the system partition"},
     {"usable", "reset", "older_than_system", wrong,
-     "it is %1, older than the system's %2: links are reset to the system "
-     "partition"},
+     "it is %1, older than the system's %2: a reset to the system partition"},
+    {"usable", "reset", "changed_by_the_boot", wrong,
+     "its data is reached through a link that the boot has just changed: a "
+     "reset "
+     "to the system partition"},
     {"usable", "reset", "no_version", wrong,
-     "its name %1 is no version: links are reset to the system partition"},
+     "its name %1 is no version: a reset to the system partition"},
 
     {"update", "not_reached", "earlier_failure", wrong, "not looked at"},
     {"update", "nothing", "none", sound, "none is announced"},
@@ -94,8 +102,16 @@ constexpr row table[] = {
     {"update", "refused", "no_version", wrong,
      "%1 is refused: the name is no version"},
     {"update", "refused", "older", wrong, "%1 is refused: %2 is newer"},
+    {"update", "refused", "changed_by_the_boot", wrong,
+     "%1 is refused: its data is reached through a link that the boot has just "
+     "changed"},
     {"update", "failed", "last_resort", wrong, "%1 cannot be used"},
     {"update", "activated", "newer", changes, "%1 is activated: newer than %2"},
+
+    {"record", "nothing", "no_activation", sound, "no activation"},
+    {"record", "written", "activation", changes, "the change is recorded: %1"},
+    {"record", "not_written", "not_opened", wrong,
+     "the change cannot be recorded"},
 
     {"last_resort", "nothing", "no_failure", sound, "not needed"},
     {"last_resort", "reset", "links_not_made", wrong,
@@ -221,6 +237,8 @@ class account {
   void old_icu() {
     if (device_.links.old_icu.what == entry::kind::none)
       add("old_icu", "nothing", "none");
+    else if (device_.links.old_icu.what == entry::kind::unknown)
+      add("old_icu", "nothing", "unreachable");
     else if (after_.old_icu.what == entry::kind::none)
       add("old_icu", "removed", "obsolete");
     else
@@ -238,6 +256,7 @@ class account {
     const bool no_check = no_current || (failed && failed_at_current());
     usable(no_check);
     update(no_check || (failed && failed_in_a_reset()), failed);
+    record();
     last_resort(failed);
   }
 
@@ -297,7 +316,9 @@ class account {
       case entry::kind::none:
         return add("current", "reset", "no_link");
       case entry::kind::link:
-        return add("current", "reset", "bad_target");
+        return add(
+            "current", "reset",
+            device_.links.current_path ? "changed_by_the_boot" : "bad_target");
       case entry::kind::unknown:
         return add("current", "reset", "unreadable");
       default:
@@ -320,6 +341,8 @@ class account {
                  schema_of(device_.system));
     if (!set.has_version())
       return add("usable", "reset", "no_version", set.version_text);
+    if (!(device_.system.version > set.version))
+      return add("usable", "reset", "changed_by_the_boot");
     add("usable", "reset", "older_than_system", set.version_text,
         device_.system.version_text);
   }
@@ -343,9 +366,23 @@ class account {
       return add("update", "refused", "same_set", set.version_text);
     if (!set.has_version())
       return add("update", "refused", "no_version", set.version_text);
+    if (set.version > in_use.version)
+      return add("update", "refused", "changed_by_the_boot", set.version_text);
     add("update", "refused",
         set.version == in_use.version ? "same_version" : "older",
         set.version_text, in_use.version_text);
+  }
+
+  void record() {
+    if (told_.steps.back().does != "activated")
+      return add("record", "nothing", "no_activation");
+    const dataset_facts& active =
+        has(lines::incompatible) ? device_.system : compared();
+    const std::string change =
+        active.version_text + "_" + device_.update->version_text;
+    if (!after_.recorded.empty() && change.starts_with(after_.recorded))
+      return add("record", "written", "activation", change);
+    add("record", "not_written", "not_opened");
   }
 
   void last_resort(bool failed) {
@@ -384,6 +421,7 @@ class account {
 
   // What no later boot mends either.
   void state_afterwards() {
+    if (device_.system.ends == dataset_facts::state::number_too_large) return;
     if (!device_.system.has_version())
       is_wrong("the system partition's data has no version");
     if (device_.system.schema.empty())

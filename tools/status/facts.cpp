@@ -12,6 +12,7 @@
 #include <memory>
 #include <new>
 #include <stdexcept>
+#include <utility>
 
 #include "dataset/dataset.h"
 #include "dataset/icu_file_name.h"
@@ -52,17 +53,23 @@ entry entry_at(const char* path) {
   return {entry::kind::link, {target, static_cast<std::size_t>(length)}};
 }
 
-// The text of a record, for which links are followed, as the boot does.
-entry record_at(const char* path) {
-  entry record = entry_at(path);
-  if (!is_regular(path)) return record;
+// Follows links, as the boot does when it writes there.
+std::string content_of(const char* path) {
+  if (!is_regular(path)) return {};
   const int file = ::open(path, O_RDONLY | O_CLOEXEC);
-  if (file < 0) return record;
+  if (file < 0) return {};
   char text[longest_text];
   const ssize_t length = ::read(file, text, sizeof text);
   ::close(file);
-  if (length > 0 && record.what == entry::kind::file)
-    record.text.assign(text, static_cast<std::size_t>(length));
+  return length <= 0 ? std::string()
+                     : std::string(text, static_cast<std::size_t>(length));
+}
+
+entry record_at(const char* path) {
+  entry record = entry_at(path);
+  if (record.what != entry::kind::file) return record;
+  if (::access(path, R_OK) != 0) record.error = errno;
+  record.text = content_of(path);
   return record;
 }
 
@@ -89,6 +96,71 @@ int list(const std::string& path, std::vector<std::string>& names) {
   }
   ::closedir(directory);
   return 0;
+}
+
+bool is_same_directory(const std::string& left, const std::string& right) {
+  struct stat one {
+  }, other{};
+  return ::stat(left.c_str(), &one) == 0 &&
+         ::stat(right.c_str(), &other) == 0 && S_ISDIR(one.st_mode) &&
+         one.st_dev == other.st_dev && one.st_ino == other.st_ino;
+}
+
+// By its text or by where it leads; what is in a directory needs that.
+bool needs(const char* link, const std::string& set) {
+  const entry here = entry_at(link);
+  if (here.what != entry::kind::link) return false;
+  if (here.text == set || here.text.starts_with(set + "/")) return true;
+  return is_same_directory(link, set) ||
+         is_same_directory(std::string(link) + "/..", set);
+}
+
+void list_downloads(device_facts& device) {
+  std::vector<std::string> names;
+  device.downloads_error = list(paths::download_root, names);
+  device.has_more_downloads = names.size() == most_names;
+  for (const auto& name : names) {
+    const std::string set = paths::download_root + name;
+    if (!is_same_directory(set, set)) continue;
+    download found{name, {}};
+    for (const auto& [label, link] :
+         {std::pair{"zoneinfo", paths::zoneinfo_link},
+          std::pair{"icutz", paths::icu_link},
+          std::pair{"tz_latest", paths::latest_update_link},
+          std::pair{"/var/db/icutz", paths::legacy_icu_link}})
+      if (needs(link, set)) found.needed_by.emplace_back(label);
+    device.downloads.push_back(found);
+  }
+  std::sort(device.downloads.begin(), device.downloads.end(),
+            [](const download& left, const download& right) {
+              if (left.needed_by.empty() != right.needed_by.empty())
+                return right.needed_by.empty();
+              return left.name < right.name;
+            });
+}
+
+// Whether another user owns a part that a boot reads or changes.
+bool is_foreign(const device_facts& device) {
+  std::vector<std::string> parts = {
+      "/usr",
+      "/usr/share",
+      "/var",
+      "/var/db",
+      "/var/db/timezone",
+      paths::download_root,
+      paths::system_zoneinfo,
+      std::string(paths::system_zoneinfo) + "/+VERSION",
+      paths::system_icu,
+      std::string(paths::system_icu) + "/icutzformat.txt",
+      paths::version_record};
+  for (const auto* set : {&device.current, &device.update})
+    if (*set && !(*set)->path.empty())
+      for (const char* part : {"", "/zoneinfo", "/zoneinfo/+VERSION", "/icutz"})
+        parts.push_back((*set)->path + part);
+  return std::any_of(parts.begin(), parts.end(), [](const std::string& part) {
+    struct stat status {};
+    return ::stat(part.c_str(), &status) == 0 && status.st_uid != ::geteuid();
+  });
 }
 
 void expect_file(dataset_facts& facts, const std::string& path) {
@@ -162,6 +234,7 @@ link_facts read_links() {
   links.record = record_at(paths::version_record);
   links.legacy_icutz = entry_at(paths::legacy_icu_link);
   links.old_icu = entry_at(paths::obsolete_icu);
+  links.recorded = content_of(paths::version_record);
   links.zone_is_file = is_regular(paths::localtime_link);
   try {
     links.current_path = current_dataset_path();
@@ -185,7 +258,7 @@ device_facts read_device() {
     device.current = facts_of(*device.links.current_path, system.get());
   if (device.links.tz_latest.what == entry::kind::link)
     device.update = facts_of(latest_update_path(), system.get());
-  device.downloads_error = list(paths::download_root, device.downloads);
-  std::sort(device.downloads.begin(), device.downloads.end());
+  list_downloads(device);
+  device.is_foreign = is_foreign(device);
   return device;
 }

@@ -65,6 +65,13 @@ struct link_facts {
   std::optional<std::string> current_path{};  // if "zoneinfo" is accepted
   link_pair pair = link_pair::no_dataset;
   bool zone_is_file = false;  // "localtime" leads to a regular file
+  std::string recorded{};     // what the record holds, through links
+};
+
+// A directory among the downloads, and the links that need it.
+struct download {
+  std::string name{};
+  std::vector<std::string> needed_by{};
 };
 
 struct device_facts {
@@ -74,8 +81,10 @@ struct device_facts {
   dataset_facts system{};
   std::optional<dataset_facts> current{};
   std::optional<dataset_facts> update{};
-  std::vector<std::string> downloads{};
+  std::vector<download> downloads{};  // those that are needed first
   int downloads_error = 0;
+  bool has_more_downloads = false;  // than are listed
+  bool is_foreign = false;          // a part of it is another user's
 };
 
 // The links as they are, also after a boot. Neither throws anything but

@@ -54,14 +54,18 @@ json object_of(const dataset_facts& set) {
               {"schema", text_or_null(set.schema)},
               {"state", name_of(set.ends)},
               {"unreadable", list_of(set.unreadable)}};
-  if (!set.path.empty()) object["fits_system"] = set.fits_system;
+  if (!set.path.empty()) {
+    object["fits_system"] = set.fits_system;
+    object["has_several_schemas"] = set.has_several_schemas;
+  }
   return object;
 }
 
 json object_of(const link_facts& links) {
   json record = object_of(links.record);
   if (links.record.what == entry::kind::file)
-    record["text"] = escaped(links.record.text);
+    record["text"] =
+        links.record.error == 0 ? json(escaped(links.record.text)) : json();
   return {{"in_use", data_in_use(links)},
           {"pair", name_of(links.pair)},
           {"zoneinfo", object_of(links.zoneinfo)},
@@ -97,10 +101,15 @@ std::string in_json(const report& told) {
   object["announced"] =
       told.device.update ? object_of(*told.device.update) : json();
   json downloads = json::array();
-  for (const auto& name : told.device.downloads)
-    downloads.push_back({{"name", escaped(name)},
-                         {"needed_by", needed_by(told.device.links, name)}});
+  for (const auto& found : told.device.downloads)
+    downloads.push_back(
+        {{"name", escaped(found.name)}, {"needed_by", found.needed_by}});
   object["downloads"] = downloads;
+  object["downloads_error"] =
+      told.device.downloads_error == 0
+          ? json()
+          : json(std::strerror(told.device.downloads_error));
+  object["has_more_downloads"] = told.device.has_more_downloads;
 
   json boot = object_of(told.boot);
   json steps = json::array();

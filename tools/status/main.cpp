@@ -55,10 +55,10 @@ struct options {
 
 // Ends the program, after --help and --version too.
 void print_and_exit(const std::string& text) {
-  const bool is_written =
-      std::fwrite(text.data(), 1, text.size(), stdout) == text.size() &&
-      std::fflush(stdout) == 0;
-  std::exit(is_written ? 0 : not_here);
+  if (std::fwrite(text.data(), 1, text.size(), stdout) != text.size() ||
+      std::fflush(stdout) != 0)
+    refuse(not_here, std::string("standard output: ") + std::strerror(errno));
+  std::exit(0);
 }
 
 options parse(int count, char** words) {
@@ -71,16 +71,16 @@ options parse(int count, char** words) {
   options chosen;
   int letter = 0;
   opterr = 0;
-  while ((letter = getopt_long(count, words, "+h", known, nullptr)) != -1) {
+  while ((letter = getopt_long(count, words, "+:h", known, nullptr)) != -1) {
     switch (letter) {
       case 'r':
         chosen.root = optarg;
         break;
       case 'j':
-        chosen.wanted = form::json;
-        break;
       case 'c':
-        chosen.wanted = form::reasons;
+        if (chosen.wanted != form::rows)
+          refuse(bad_use, "one of --json and --check is enough; see --help");
+        chosen.wanted = letter == 'j' ? form::json : form::reasons;
         break;
       case 'h':
         print_and_exit(help);
@@ -88,11 +88,18 @@ options parse(int count, char** words) {
       case 'v':
         print_and_exit("marlin-status " MARLIN_VERSION "\n");
         break;
+      case ':':
+        refuse(bad_use, "--root needs a directory; see --help");
       default:
-        refuse(bad_use,
-               escaped(words[optind - 1]) + " is not understood; see --help");
+        refuse(bad_use, (optopt != 0 ? std::string("-") +
+                                           escaped(std::string(
+                                               1, static_cast<char>(optopt)))
+                                     : escaped(words[optind - 1])) +
+                            " is not understood; see --help");
     }
   }
+  if (chosen.root.empty())
+    refuse(bad_use, "--root needs a directory; see --help");
   if (optind != count)
     refuse(bad_use, escaped(words[optind]) + " is not expected; see --help");
   return chosen;
@@ -119,6 +126,7 @@ std::vector<std::string> unknown(const report& told, bool is_running_system) {
     texts.emplace_back(
         "which ICU data file comes first on the device's own file system");
   if (!(told.after.zoneinfo == told.device.links.zoneinfo) ||
+      !(told.after.icutz == told.device.links.icutz) ||
       !(told.after.localtime == told.device.links.localtime))
     texts.emplace_back("whether there is space for the links");
   if (!is_running_system)
@@ -126,14 +134,28 @@ std::vector<std::string> unknown(const report& told, bool is_running_system) {
   return texts;
 }
 
-bool is_like_before(const report& told) {
-  return told.boot.lines.empty() && told.boot.ends_normally &&
-         told.after.zoneinfo == told.device.links.zoneinfo &&
-         told.after.icutz == told.device.links.icutz;
+// A word that is cut costs one refusal, and an update's decides nothing.
+void insist_on_enough_memory(const report& told) {
+  unsigned expected = 0;
+  for (const auto* set : {&told.device.current, &told.device.update})
+    if (*set && !(*set)->path.empty() && (*set)->word_is_cut) ++expected;
+  if (told.device.system.word_is_cut || told.boot.refusals > expected)
+    throw cannot_tell("the next boot takes more than " +
+                      std::to_string(most_memory >> 20) + " MB of memory");
+}
+
+// In a user namespace this user is the device's root only as far as the device
+// is this user's. What is sound for somebody with less rights is sound.
+void insist_on_rights(const report& told, const place& here) {
+  if (here.is_user_namespace && told.device.is_foreign &&
+      told.why.is != verdict::sound)
+    throw cannot_tell(
+        "a part of the device belongs to another user, whose rights this user "
+        "has not; run this as root");
 }
 
 report examine(const options& chosen) {
-  const bool is_ours = enter_throwaway_device(chosen.root);
+  const place here = enter_throwaway_device(chosen.root);
   become_the_boot();
   limit_memory();
   limit_time();
@@ -141,26 +163,10 @@ report examine(const options& chosen) {
   told.device = read_device();
   told.boot = rehearse_boot();
   told.after = read_links();
-
-  // A word that is cut costs one refusal, and an update's decides nothing.
-  unsigned expected = 0;
-  for (const auto* set : {&told.device.current, &told.device.update})
-    if (*set && !(*set)->path.empty() && (*set)->word_is_cut) ++expected;
-  if (told.device.system.word_is_cut || told.boot.refusals > expected)
-    throw cannot_tell("the next boot takes more than " +
-                      std::to_string(most_memory >> 20) + " MB of memory");
-  for (const auto& said : told.boot.lines)
-    if (said.error == EOVERFLOW)
-      throw cannot_tell(
-          "a change to an owner's files cannot be tried by this "
-          "user");
-  if (!is_ours && !is_like_before(told))
-    throw cannot_tell(
-        "what the next boot changes: the device belongs to another user; run "
-        "this "
-        "as its root");
+  insist_on_enough_memory(told);
   told.why = explain(told.device, told.boot, told.after);
-  told.cannot_know = unknown(told, chosen.root == "/");
+  insist_on_rights(told, here);
+  told.cannot_know = unknown(told, here.is_running_system);
   return told;
 }
 
@@ -193,7 +199,10 @@ int main(int count, char** words) {
   const options chosen = parse(count, words);
   const pid_t child = ::fork();
   if (child < 0) refuse(not_here, std::string("fork: ") + std::strerror(errno));
-  if (child == 0) std::_Exit(tell_or_say_why_not(chosen));
+  if (child == 0) {
+    end_with_parent();
+    std::_Exit(tell_or_say_why_not(chosen));
+  }
 
   // The default action of the alarm would be silent.
   ::signal(SIGALRM, [](int) {

@@ -10,6 +10,7 @@
 #include <cstring>
 #include <exception>
 #include <new>
+#include <stdexcept>
 
 #include "driver/startup.h"
 #include "tools/status/throwaway.h"
@@ -49,6 +50,7 @@ void tell(kind what, const line& said = {}) {
 }
 
 [[noreturn]] void run_and_tell(int pipe) {
+  end_with_parent();
   channel = pipe;
   limit_time();
   take_lines([](const line& said) { tell(kind::line, said); });
@@ -63,6 +65,8 @@ void tell(kind what, const line& said = {}) {
     tell(kind::returned);
   } catch (int error) {
     tell(kind::threw, {{}, std::strerror(error), error});
+  } catch (const std::out_of_range&) {
+    tell(kind::threw, {{}, "a number in a version is too large", 0});
   } catch (const std::exception& failure) {
     tell(kind::threw, {{}, failure.what(), 0});
   }

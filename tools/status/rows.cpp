@@ -19,6 +19,12 @@ std::string plain(const entry& here) {
       return std::string("(").append(std::strerror(here.error)).append(")");
     case entry::kind::none:
       return "none";
+    case entry::kind::file:
+      if (here.error != 0)
+        return std::string("(a file: ")
+            .append(std::strerror(here.error))
+            .append(")");
+      return "(a file)";
     case entry::kind::special:
       return "(a FIFO, a socket or a device)";
     default:
@@ -26,10 +32,25 @@ std::string plain(const entry& here) {
   }
 }
 
+// What is between quotes is a text of the device, and only that.
+std::string quoted(const std::string& text) {
+  std::string shown = "\"";
+  for (const char letter : escaped(text)) {
+    if (letter == '"')
+      shown += "\\x22";
+    else
+      shown += letter;
+  }
+  return shown + "\"";
+}
+
 std::string version_and_schema(const dataset_facts& set) {
-  return (set.has_version() ? escaped(set.version_text) : "no version") + ", " +
-         (set.schema.empty() ? "no ICU schema"
-                             : "ICU schema " + escaped(set.schema));
+  if (set.ends == dataset_facts::state::number_too_large)
+    return "a number in its version is too large";
+  return (set.has_version() ? escaped(set.version_text)
+                            : std::string("no version")) +
+         (set.schema.empty() ? std::string(", no ICU schema")
+                             : ", ICU schema " + escaped(set.schema));
 }
 
 const char* sentence_of(link_pair pair) {
@@ -49,6 +70,15 @@ const char* sentence_of(link_pair pair) {
       break;
   }
   return "zoneinfo names no data set";
+}
+
+// Not if something else than a link is in the way.
+bool is_mended_by_a_reset(const link_facts& links) {
+  const bool is_mixed = links.pair == link_pair::update_without_icu ||
+                        links.pair == link_pair::update_with_other_icu ||
+                        links.pair == link_pair::system_with_icu;
+  return is_mixed && (links.icutz.what == entry::kind::none ||
+                      links.icutz.what == entry::kind::link);
 }
 
 // Breaks at blanks where it can.
@@ -95,14 +125,14 @@ void add_data(rows& shown, const report& told) {
   else
     shown.add("in use",
               "the update " + version_and_schema(*told.device.current));
-  if (told.device.current && !links.current_path->empty())
-    shown.add("", escaped(links.zoneinfo.text));
+  if (told.device.current && !told.device.current->path.empty()) {
+    shown.add("", plain(links.zoneinfo));
+    for (const auto& file : told.device.current->unreadable)
+      shown.add("", escaped(file));
+  }
   shown.add("system", version_and_schema(told.device.system));
   for (const auto& file : told.device.system.unreadable)
     shown.add("", escaped(file));
-  if (told.device.current && !told.device.current->path.empty())
-    for (const auto& file : told.device.current->unreadable)
-      shown.add("", escaped(file));
 }
 
 void add_links(rows& shown, const report& told) {
@@ -111,47 +141,53 @@ void add_links(rows& shown, const report& told) {
   if (links.pair != link_pair::system && links.pair != link_pair::update) {
     shown.add("", "zoneinfo " + plain(links.zoneinfo));
     shown.add("", "icutz " + plain(links.icutz));
-    if (links.pair != link_pair::no_dataset)
-      shown.add("",
-                "Remove /var/db/timezone/zoneinfo: the next boot then makes "
-                "both anew.");
   }
-  if (!told.device.update)
-    shown.add("announced", plain(links.tz_latest));
-  else if (told.device.update->ends == dataset_facts::state::built)
-    shown.add("announced", version_and_schema(*told.device.update));
-  else
-    shown.add("announced", plain(links.tz_latest));
-  if (told.device.update)
+  if (told.after.pair == links.pair && is_mended_by_a_reset(links))
+    shown.add(
+        "",
+        "To mend it remove /var/db/timezone/zoneinfo: the next boot then "
+        "links the system partition, or the announced update if it fits.");
+
+  shown.add("announced", plain(links.tz_latest));
+  if (told.device.update &&
+      told.device.update->ends != dataset_facts::state::bad_path) {
+    shown.add("", version_and_schema(*told.device.update));
     for (const auto& file : told.device.update->unreadable)
       shown.add("", escaped(file));
+  }
 
   const std::string zone = zone_of(links);
   shown.add("local zone",
-            (zone.empty() ? plain(links.localtime) : escaped(zone)) +
-                (links.zone_is_file ? "" : ", which cannot be reached"));
-  shown.add("record", links.record.what == entry::kind::file
-                          ? escaped(links.record.text)
-                          : plain(links.record));
+            (zone.empty() ? plain(links.localtime) : quoted(zone)) +
+                (links.zone_is_file ? "" : ", which leads to no file"));
+  const bool is_read =
+      links.record.what == entry::kind::file && links.record.error == 0;
+  shown.add("record",
+            is_read ? quoted(links.record.text) : plain(links.record));
 }
 
 void add_downloads(rows& shown, const report& told) {
   const char* label = "downloads";
-  const auto& names = told.device.downloads;
-  for (std::size_t i = 0; i < names.size() && i < most_downloads; ++i) {
-    const std::string needed = needed_by(told.device.links, names[i]);
-    shown.add(label,
-              escaped(names[i]) + (needed.empty() ? ", which no link needs"
-                                                  : ", for " + needed));
+  const auto& found = told.device.downloads;
+  for (std::size_t i = 0; i < found.size() && i < most_downloads; ++i) {
+    std::string links;
+    for (const auto& link : found[i].needed_by)
+      links += (links.empty() ? ", for " : ", ") + link;
+    shown.add(label, quoted(found[i].name) +
+                         (links.empty() ? ", which no link needs" : links));
     label = "";
   }
-  if (names.size() > most_downloads)
-    shown.add("", std::to_string(names.size() - most_downloads) + " more");
-  if (names.empty())
-    shown.add(label, told.device.downloads_error == 0
-                         ? "none"
-                         : std::string("none: ") +
-                               std::strerror(told.device.downloads_error));
+  if (found.size() > most_downloads)
+    shown.add("",
+              std::string(told.device.has_more_downloads ? "more than " : "")
+                  .append(std::to_string(found.size() - most_downloads))
+                  .append(" more"));
+  if (told.device.downloads_error != 0)
+    shown.add(label, std::string("(")
+                         .append(std::strerror(told.device.downloads_error))
+                         .append(")"));
+  else if (found.empty())
+    shown.add(label, "none");
 }
 
 void add_boot(rows& shown, const report& told) {

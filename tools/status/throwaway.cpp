@@ -16,6 +16,7 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <csignal>
 #include <cstdint>
@@ -29,6 +30,7 @@
 namespace {
 
 constexpr char writable[] = "/var/db";
+constexpr char downloads[] = "/var/db/timezone/tz";
 
 [[noreturn]] void fail(const std::string& what) {
   const int error = errno;
@@ -72,16 +74,18 @@ void map_to_root(const char* file, unsigned id) {
   write_file(file, "0 " + std::to_string(id) + " 1\n");
 }
 
-void enter_namespaces() {
+// Returns whether it took a user namespace.
+bool enter_namespaces() {
   const unsigned user = ::geteuid();
   const unsigned group = ::getegid();
-  if (::unshare(CLONE_NEWNS) == 0) return;
+  if (::unshare(CLONE_NEWNS) == 0) return false;
   if (errno != EPERM) fail("unshare");
   must(::unshare(CLONE_NEWUSER | CLONE_NEWNS),
        "this user may not have namespaces");
   write_file("/proc/self/setgroups", "deny");
   map_to_root("/proc/self/uid_map", user);
   map_to_root("/proc/self/gid_map", group);
+  return true;
 }
 
 void set_attributes(int tree, unsigned flags, unsigned long attributes) {
@@ -118,7 +122,8 @@ descriptor make_layer(const std::string& layer) {
   // The layer's own root gives the merged directory its owner and mode.
   struct stat status {};
   must(::stat(".", &status), "stat");
-  // Owners that this user cannot stand in for are noticed by belongs_to_us().
+  // Owners that this user cannot stand in for are noticed when the facts are
+  // read.
   if (::chown(upper.c_str(), status.st_uid, status.st_gid) != 0 &&
       errno != EINVAL && errno != EPERM)
     fail("chown");
@@ -199,12 +204,6 @@ void attach(const descriptor& tree, int target) {
        "move_mount");
 }
 
-bool belongs_to_us(int root, const char* path) {
-  const descriptor directory = open_inside(root, path, O_DIRECTORY);
-  struct stat status {};
-  return ::fstat(directory.get(), &status) != 0 || status.st_uid == ::geteuid();
-}
-
 // The layers over "/var/db" and what is mounted below. All paths here are seen
 // from the base, in which the device is "/root". `original` is the device as it
 // was, if what is read only there is to stay so, otherwise -1.
@@ -231,6 +230,7 @@ class layers {
       else
         over(lower, target.get(), inside(place));
     }
+    protect_downloads();
   }
 
  private:
@@ -260,6 +260,14 @@ class layers {
     attach(layer, target);
   }
 
+  void protect_downloads() const {
+    const descriptor tz = open_inside(root_, downloads, O_DIRECTORY);
+    if (tz.get() < 0) return;
+    const descriptor copy = clone_tree(tz.get(), AT_RECURSIVE);
+    set_attributes(copy.get(), AT_RECURSIVE, MOUNT_ATTR_RDONLY);
+    attach(copy, tz.get());
+  }
+
   int root_;
   const process& self_;
   int original_;
@@ -268,12 +276,13 @@ class layers {
 
 }  // namespace
 
-bool enter_throwaway_device(const std::string& root) {
-  enter_namespaces();
+place enter_throwaway_device(const std::string& root) {
+  place here;
+  here.is_user_namespace = enter_namespaces();
   must(::mount(nullptr, "/", nullptr, MS_REC | MS_PRIVATE, nullptr), "mount");
   const descriptor device = open_directory(root);
   const process self;
-  const bool is_running_system = self.path_of(device) == "/";
+  here.is_running_system = self.path_of(device) == "/";
 
   // Taken before anything is covered.
   const descriptor tree = clone_tree(device.get(), AT_RECURSIVE);
@@ -286,14 +295,14 @@ bool enter_throwaway_device(const std::string& root) {
   must(::mkdir("/root", 0700), "mkdir");
   attach(tree, open_directory("/root").get());
   const descriptor inside = open_directory("/root");
-  const bool is_ours = belongs_to_us(inside.get(), "/var/db") &&
-                       belongs_to_us(inside.get(), "/var/db/timezone");
-  layers(inside.get(), self, is_running_system ? device.get() : -1).lay();
-  must(::fchdir(inside.get()), "chdir");
+  layers(inside.get(), self, here.is_running_system ? device.get() : -1).lay();
+  must(::fchdir(inside.get()), escaped(root));
   must(::chroot("."), "chroot");
   must(::chdir("/"), "chdir");
-  return is_ours;
+  return here;
 }
+
+void end_with_parent() { ::prctl(PR_SET_PDEATHSIG, SIGKILL); }
 
 void become_the_boot() {
   // Not allowed where this user is not really root, and needless there.
@@ -309,7 +318,10 @@ void become_the_boot() {
 void limit_memory() {
 #if !defined(__SANITIZE_ADDRESS__)
   // Sanitizers reserve terabytes of addresses.
-  const rlimit limit{most_memory, most_memory};
+  rlimit limit{};
+  must(::getrlimit(RLIMIT_AS, &limit), "getrlimit");
+  limit.rlim_max = std::min<rlim_t>(limit.rlim_max, most_memory);
+  limit.rlim_cur = std::min(limit.rlim_cur, limit.rlim_max);
   must(::setrlimit(RLIMIT_AS, &limit), "setrlimit");
 #endif
 }

@@ -14,14 +14,19 @@ struct cannot_tell : std::runtime_error {
 // Moves this process, for good, into mount namespaces of its own in which
 // `root` is "/": nothing outside can be reached by any path, every file system
 // is read only, and a layer in memory lies over "/var/db" and every file system
-// mounted below it. Only "/var/db/timezone/tz" stays read only, as under the
-// boot unit. Without the privileges of root it first enters a user namespace in
-// which this user is root. Returns whether "/var/db" and "/var/db/timezone"
-// belong to this user then: if not, what a boot may change there cannot be
-// tried. Throws cannot_tell with the call that failed. unshare(2),
+// mounted below it, except "/var/db/timezone/tz", as under the boot unit.
+// Without the privileges of root it first enters a user namespace in which this
+// user is root. Throws cannot_tell with the call that failed. unshare(2),
 // open_tree(2), move_mount(2), mount_setattr(2), fsopen(2) for overlayfs,
 // chroot(2).
-bool enter_throwaway_device(const std::string& root);
+struct place {
+  bool is_running_system = false;  // `root` is this system's
+  bool is_user_namespace = false;
+};
+place enter_throwaway_device(const std::string& root);
+
+// This process, a child, ends when its parent does. prctl(2).
+void end_with_parent();
 
 // Gives this process what the boot unit gives marlin: no capability, no new
 // privileges, no core file. Throws cannot_tell.

@@ -51,17 +51,3 @@ std::string zone_of(const link_facts& links) {
   if (!links.localtime.text.starts_with(tree)) return {};
   return links.localtime.text.substr(tree.size());
 }
-
-std::string needed_by(const link_facts& links, const std::string& download) {
-  const std::string path = paths::download_root + download;
-  std::string names;
-  const auto look_at = [&](const entry& link, const char* name) {
-    if (link.what != entry::kind::link || !link.text.starts_with(path)) return;
-    if (link.text.size() > path.size() && link.text[path.size()] != '/') return;
-    names += (names.empty() ? "" : ", ") + std::string(name);
-  };
-  look_at(links.zoneinfo, "zoneinfo");
-  look_at(links.icutz, "icutz");
-  look_at(links.tz_latest, "tz_latest");
-  return names;
-}

@@ -19,6 +19,3 @@ std::string name_of(link_pair pair);
 
 // The zone that "localtime" names, below the active tree; empty: none.
 std::string zone_of(const link_facts& links);
-
-// Which links need a download: "zoneinfo, tz_latest"; empty: none.
-std::string needed_by(const link_facts& links, const std::string& download);
