@@ -80,7 +80,7 @@ def never_seen() -> list[str]:
     wanted = []
     if TALLY.get("test_a_kill", 0) >= 200:
         wanted += [f"kills leave {window.name}" for window in test_kills.WINDOWS]
-    if TALLY.get("test_a_kill_of_the_installer", 0) >= 200:
+    if TALLY.get("test_a_kill_of_the_installer", 0) >= 600:
         wanted += ["kills that leave the new update announced",
                    "kills that leave the old announcement"]
     if TALLY.get("states", 0) >= 2000:
