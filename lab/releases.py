@@ -7,13 +7,18 @@ from __future__ import annotations
 
 import calendar
 import datetime
+import json
+import os
 import re
+import shutil
 import subprocess
 import tempfile
 from pathlib import Path
+from typing import NamedTuple
 
-from lab.places import PROJECT
+from lab.places import BUILD, PROJECT
 
+TARGET = BUILD / "releases"
 RULES = Path("/usr/share/zoneinfo/tzdata.zi")
 # Lisbon's last line.
 LISBON = r"^(Z Europe/Lisbon .*\n(?:[^RLZ].*\n)*?0 (\S+) WE%sT)$"
@@ -42,6 +47,25 @@ def tool(name: str, **options: str | Path) -> list[str]:
     return ["/usr/bin/python3", "-B", str(PROJECT / "tools" / name), *words]
 
 
+def once(target: Path, inputs: list, make):
+    """Has a directory made, except where it is there already, made from the same."""
+    # Data without read permission for all does not count on a device.
+    os.umask(0o022)
+    inputs = repr([(str(path), os.stat(path).st_size, os.stat(path).st_mtime_ns)
+                   for path in inputs])
+    made_from = target / "inputs"
+    if made_from.exists() and made_from.read_text() == inputs:
+        return
+    if target.exists():
+        if not made_from.exists():
+            raise NotOfTheForm(f"{target} is there, and not made by this; remove it")
+        shutil.rmtree(target)
+    target.mkdir(parents=True)
+    made_from.touch()  # from here on it is
+    make()
+    made_from.write_text(inputs)
+
+
 # --- Names ------------------------------------------------------------------------
 
 
@@ -67,6 +91,45 @@ def icu_schema() -> str:
     """As 72l: the version of the ICU library and the letter of its byte order."""
     return find("ICU data", r"^icudt(\d+[lbe])_dat\.o$",
                 output("ar", "t", icu_library()).decode())[1]
+
+
+class Names(NamedTuple):
+    """Releases, as 2025b, and ICU's schemas, as 72l."""
+    system: str
+    update: str  # Lisbon changes in the year after the system's
+    refused: str  # and here a year later; its ICU data gets another schema
+    upgrade: str  # the same, of a later system
+    icu: str
+    other_icu: str
+
+    @property
+    def year(self) -> int:
+        """In which Lisbon changes."""
+        return int(self.system[:4]) + 1
+
+
+def names() -> Names:
+    return Names(**json.loads((TARGET / "names").read_text()))
+
+
+def prepare():
+    """Makes four releases, each in a directory with its name."""
+    # zic and icupkg are here, and this is not on everybody's path.
+    os.environ["PATH"] += ":/usr/sbin"
+    once(TARGET, [RULES, icu_library(), __file__], make_all)
+
+
+def make_all():
+    system, icu = own(), icu_schema()
+    update = after(system)
+    refused = after(update)
+    made = Names(system, update, refused, after(refused), icu,
+                 f"{int(icu[:-1]) + 1}{icu[-1]}")
+    for release, lisbon_from in ((system, None), (update, made.year),
+                                 (refused, made.year + 1),
+                                 (made.upgrade, made.year + 1)):
+        make(TARGET / release, release, lisbon_from)
+    (TARGET / "names").write_text(json.dumps(made._asdict()))
 
 
 # --- Contents ---------------------------------------------------------------------
@@ -156,8 +219,19 @@ def central(entry: str, year: int) -> str:
         f"{kind:02x}" for _, kind in added), entry)
 
 
-def run_tool(name: str, **options: str | Path):
-    """Has make-update or make-system make something; it must not fail."""
-    command = tool(name, **options)
+def make_system(release: str, schema: str, out: Path):
+    run(tool("make-system", **given(release), schema=schema, out=out))
+
+
+def make_update(release: str, system: Path, out: Path):
+    run(tool("make-update", **given(release), system=system, out=out))
+
+
+def given(release: str) -> dict[str, Path]:
+    """The options that name a release."""
+    return {"rules": TARGET / release / "tzdata.zi", "icu": TARGET / release / "icu"}
+
+
+def run(command: list[str]):
     if subprocess.run(command, stdout=subprocess.DEVNULL).returncode:
         raise NotOfTheForm(f"failed: {' '.join(command)}")

@@ -6,6 +6,7 @@ from __future__ import annotations
 
 import argparse
 import contextlib
+import io
 import json
 import os
 import re
@@ -198,31 +199,24 @@ def rules_from(path: Path) -> Rules:
 def unpacked(path: Path, wanted: tuple[str, ...]) -> dict[str, bytes]:
     """Files of an archive, by name, whether or not they stand in a directory. Nothing
     else in it is looked at, and nothing is written."""
-    read_size = os.stat(read_only(path)).st_size
-    if read_size > LARGEST:
-        raise Refused(f"{path} has {read_size} bytes, more than {LARGEST}; "
-                      "name another")
-    files = {}
+    files, packed = {}, io.BytesIO(read(path))
     try:
-        with tarfile.open(path) as archive:
+        with tarfile.open(fileobj=packed) as archive:
             for member in archive:
-                name = member.name.removeprefix("./").rpartition("/")[2]
+                name = member.name.rpartition("/")[2]
+                if member.size > LARGEST or archive.offset > 16 * LARGEST:
+                    raise Refused(f"{path} is far too large when it is unpacked; "
+                                  "name an archive of a release")
                 if name not in wanted or not member.isreg():
                     continue
-                if name in files or member.size > LARGEST:
-                    raise Refused(f"{path} holds {name} twice, or far too large; "
+                if name in files:
+                    raise Refused(f"{path} holds {name} twice; "
                                   "name an archive of a release")
                 files[name] = archive.extractfile(member).read()
     except (tarfile.TarError, EOFError, OSError, ValueError) as failed:
         raise Refused(f"{path} cannot be read as an archive: {failed}; "
                       "fetch it again") from None
     return files
-
-
-def read_only(path: Path) -> Path:
-    if not path.is_file():
-        raise Refused(f"{path} is not a regular file; name another")
-    return path
 
 
 class Icu(NamedTuple):

@@ -19,7 +19,7 @@ import time
 from collections.abc import Iterable
 from pathlib import Path
 
-from lab import boot, lines
+from lab import boot, lines, releases
 from lab.carriers import namespace
 from lab.demo import data, screen
 from lab.device import Device, decoded
@@ -130,8 +130,10 @@ class Story:
 
     def __init__(self):
         self.device = Device()  # as it is to be at the next boot
-        self.names = data.names()
-        self.year = int(self.names.system[:4]) + 1
+        self.names = releases.names()
+        self.names = self.names._replace(update=f"{self.names.update}.1.0",
+                                         refused=f"{self.names.refused}.1.0")
+        self.year = self.names.year
         self.endings = []  # of scenes, in the words of the summary
         self.facts = []  # as they were found
         self.wrong = []  # where that is not as claimed
