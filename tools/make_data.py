@@ -107,7 +107,7 @@ def output(*command, folder: Path, remedy: str, **environment: str) -> str:
         done = subprocess.run(
             command, cwd=folder, capture_output=True, text=True, errors="replace",
             timeout=SECONDS, stdin=subprocess.DEVNULL,
-            env={"PATH": os.environ["PATH"], "LC_ALL": "C", "TZ": "UTC0", **environment})
+            env={"PATH": os.environ["PATH"], "LC_ALL": "C", "TZ": "UTC0"} | environment)
     except subprocess.TimeoutExpired:
         raise Refused(f"{command[0]} takes too long; {remedy}") from None
     if done.returncode:
@@ -295,7 +295,8 @@ def new(place: Path) -> Iterator[Path]:
     if os.path.lexists(place):
         raise Refused(f"{place} is there already; remove it, or choose another")
     # Tools are run elsewhere and therefore get absolute paths.
-    begun = Path(tempfile.mkdtemp(prefix=f".{place.name}.", dir=place.parent)).absolute()
+    begun = Path(tempfile.mkdtemp(prefix=f".{place.name}.",
+                                  dir=place.parent.absolute()))
     try:
         yield begun
         settle(begun)
