@@ -17,6 +17,8 @@ from lab.carriers import namespace  # noqa: E402
 from lab.places import BUILD  # noqa: E402
 
 TALLY = {}
+DOORS = {"lab/emulator/": "device --tests", "lab/readers/": "readers",
+         "lab/test_recipe": "readers"}  # of tests that scripts/prove cannot run
 os.environ["PYTEST_CACHE"] = str(BUILD / "prove" / "pytest")  # for pytest.ini
 
 
@@ -62,7 +64,8 @@ def count(request):
 def pytest_runtest_makereport(item, call):
     report = (yield).get_result()
     if report.failed:
-        door = "device --tests" if "lab/emulator/" in report.nodeid else "prove"
+        door = next((door for part, door in DOORS.items() if part in report.nodeid),
+                    "prove")
         report.sections.append(
             ("Alone", f"scripts/{door} {shlex.quote(report.nodeid)}"))
 

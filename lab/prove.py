@@ -11,6 +11,7 @@ takes samples, in eight minutes.
   states     many thousand devices composed at random
   load       too much of everything
   log        a log that is lost, or fails in the middle
+  make       what makes updates and a system's data, and what it refuses
   lab        the lab's own carriers
   fuzz       hostile texts
   sanitize   the tests under sanitizers and (not with --quick) valgrind
@@ -28,6 +29,7 @@ import os
 import subprocess
 import time
 
+from lab import releases
 from lab.doors import Options, build_program, need
 from lab.places import BUILD, PROJECT
 
@@ -38,6 +40,7 @@ TRIALS = {
     "states": ["test_states.py"],
     "load": ["test_load.py"],
     "log": ["test_log.py"],
+    "make": ["test_make.py"],
     "lab": ["test_archive.py"],
 }
 OTHERS = {  # the whole, and with --quick
@@ -86,9 +89,10 @@ def main() -> int:
     for name in chosen.proofs:
         if not alone and name not in TRIALS and name not in OTHERS:
             options.error(f"'{name}' is not a proof")
-    need("build", "private-device", "pytest", "prove")
+    need("build", "private-device", "pytest", "prove", "demo")
     (BUILD / "prove").mkdir(exist_ok=True)
     build_program()
+    releases.prepare()
     if alone:
         return subprocess.call(trials("alone", "-rs", *alone), cwd=PROJECT)
     results = [

@@ -116,7 +116,7 @@ def test_an_update(place, names):
     facts = made(update(place, "--json"))
     assert facts == {
         "version": f"{names.update}.1.0", "schema": names.icu,
-        "system": f"{names.system}.1.0", "years": 20, "since": SINCE,
+        "system": f"{names.system}.1.0", "years": 10, "since": SINCE,
         "directory": f"{place}/out/{names.update}.1.0",
         "changed": LISBON, "added": [], "removed": []}
     assert os.listdir(place / "out") == [f"{names.update}.1.0"]

@@ -50,7 +50,8 @@ PYTHON = f"""
 import datetime, sys, zoneinfo
 zone = zoneinfo.ZoneInfo("{ZONE}")
 for line in sys.stdin:
-    print(datetime.datetime.fromtimestamp(int(line), zone).strftime("%H:%M"), flush=True)
+    moment = datetime.datetime.fromtimestamp(int(line), zone)
+    print(moment.strftime("%H:%M"), flush=True)
 """
 NODE = """
 require("readline").createInterface({input: process.stdin}).on("line", (line) => {

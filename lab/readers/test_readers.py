@@ -20,11 +20,11 @@ from lab import boot, releases
 from lab.carriers import namespace
 from lab.demo import data
 from lab.device import Device, decoded
-from lab.paths import (ICUTZ, LOCALTIME, SYSTEM_ICU, SYSTEM_ZONEINFO, TZ_LATEST, ZONEINFO,
-                       update_path)
+from lab.paths import (ICUTZ, LOCALTIME, SYSTEM_ICU, SYSTEM_ZONEINFO, TZ_LATEST,
+                       ZONEINFO, update_path)
 from lab.places import PROJECT
-from lab.readers.programs import (FILES, LINKS, PSQL, READERS, READY, UNPACKED, ZONE, Reader,
-                                  debian, server)
+from lab.readers.programs import (FILES, LINKS, PSQL, READERS, READY, UNPACKED, ZONE,
+                                  Reader, debian, server)
 from lab.seen import as_device
 
 DOCUMENT = PROJECT / "docs/readers.md"
@@ -263,8 +263,12 @@ def test_the_pack_alone_is_not_read(cluster):
     assert asked(reader) == "own"
 
 
-@pytest.mark.parametrize("number", range(len(READERS)), ids=lambda number: "-".join(
-    re.findall("[a-z]+", f"{READERS[number].name} {READERS[number].setting()}".lower())))
+def named(number: int) -> str:
+    words = f"{READERS[number].name} {READERS[number].setting()}"
+    return "-".join(re.findall("[a-z]+", words.lower()))
+
+
+@pytest.mark.parametrize("number", range(len(READERS)), ids=named)
 def test_a_reader(number, cluster):
     reader = READERS[number]
     cells = [cell.replace(NAMES.update, "RELEASE") for cell in
