@@ -673,14 +673,16 @@ def test_an_interrupted_program_leaves_nothing(place, fake, number):
     hung = subprocess.Popen(
         releases.tool("make-update", rules=place / "rules", icu=place / "icu",
                       system=place / "system", out=place / "out"),
-        env={**os.environ, **fake(zdump="exec sleep 60")}, stderr=subprocess.PIPE)
-    for _ in range(200):
-        if any(path.name == "icutz" and any(path.iterdir())
-               for path in (place / "out").glob(".*/*")):
+        env={**os.environ, **fake(zdump=f"touch {place}/begun; exec sleep 60")},
+        stderr=subprocess.PIPE)
+    for _ in range(400):
+        if (place / "begun").exists():
             break
         time.sleep(0.05)
     else:
         pytest.fail("never began")
+    assert any((place / "out").iterdir())
     hung.send_signal(number)
-    assert hung.wait(timeout=20) == 128 + number
+    assert hung.communicate(timeout=30) == (None, b"")
+    assert hung.returncode == 128 + number
     assert os.listdir(place / "out") == []

@@ -18,7 +18,6 @@ import sys
 import tarfile
 import tempfile
 from collections.abc import Iterator
-from concurrent.futures import ThreadPoolExecutor
 from pathlib import Path
 from typing import NamedTuple
 
@@ -392,9 +391,7 @@ def differing(old: Path, new: Path, since: int, years: int) -> dict[str, list[st
     changed = []
     if chosen:
         until = since + years * 31556952
-        with ThreadPoolExecutor() as both:
-            was, now = both.map(lambda tree: clocks(tree, chosen, since, until),
-                                (old, new))
+        was, now = (clocks(tree, chosen, since, until) for tree in (old, new))
         changed = [name for names, *clock in zip(pairs.values(), was, now)
                    if clock[0] != clock[1] for name in names]
     return {"changed": sorted(changed), "added": sorted(after.keys() - before.keys()),
