@@ -4,7 +4,8 @@ the names of the releases and what `lab/releases.py` invents: in the later ones 
 changes its zone.
 
 Made are a system partition's data, a download, a later one whose ICU data has another
-schema, and what a still later system brings; and a program that reads ICU's data.
+schema, and what a still later system brings, each a `zoneinfo` tree beside an `icu` or
+`icutz` directory; and a program that reads ICU's data.
 """
 
 import shutil
@@ -31,14 +32,26 @@ def prepare():
         sys.exit(f"demo: {failed}")
 
 
+def names() -> releases.Names:
+    """With the versions of updates, as 2025c.1.0, in place of their releases."""
+    found = releases.names()
+    return found._replace(update=f"{found.update}.1.0", refused=f"{found.refused}.1.0")
+
+
 def make():
-    names = releases.names()
-    releases.make_system(names.system, names.icu, TARGET / "system")
-    releases.make_system(names.upgrade, names.icu, TARGET / "upgrade")
-    releases.make_update(names.update, TARGET / "system", TARGET)
-    with tempfile.TemporaryDirectory() as work:
-        other = Path(work, "system")
-        releases.make_system(names.system, names.other_icu, other)
-        releases.make_update(names.refused, other, TARGET)
+    made = releases.names()
+    with tempfile.TemporaryDirectory(dir=TARGET) as work:
+        for data_set, release, schema, update, update_release in (
+                ("system", made.system, made.icu, "update", made.update),
+                ("upgrade", made.upgrade, made.icu, "", ""),
+                ("other", made.system, made.other_icu, "refused", made.refused)):
+            system = Path(work, data_set)
+            releases.make_system(release, schema, system)
+            if update:
+                releases.make_update(update_release, system, work)
+                Path(work, f"{update_release}.1.0").rename(TARGET / update)
+            if data_set != "other":
+                (system / "zoneinfo.default").rename(system / "zoneinfo")
+                system.rename(TARGET / data_set)
     releases.output("g++", "-O1", ICU_SOURCE, "-o", ICU_PROGRAM, "-licui18n",
                     "-licuuc")

@@ -19,7 +19,7 @@ import time
 from collections.abc import Iterable
 from pathlib import Path
 
-from lab import boot, lines, releases
+from lab import boot, lines
 from lab.carriers import namespace
 from lab.demo import data, screen
 from lab.device import Device, decoded
@@ -130,9 +130,7 @@ class Story:
 
     def __init__(self):
         self.device = Device()  # as it is to be at the next boot
-        self.names = releases.names()
-        self.names = self.names._replace(update=f"{self.names.update}.1.0",
-                                         refused=f"{self.names.refused}.1.0")
+        self.names = data.names()
         self.year = self.names.year
         self.endings = []  # of scenes, in the words of the summary
         self.facts = []  # as they were found
@@ -146,14 +144,14 @@ class Story:
         self.device.put(target, as_device(entries).find(source))
 
     def install_system(self, data_set: str):
-        self.bring(f"{data_set}/zoneinfo.default", SYSTEM_ZONEINFO)
+        self.bring(f"{data_set}/zoneinfo", SYSTEM_ZONEINFO)
         self.bring(f"{data_set}/icu", SYSTEM_ICU)
         # Where ICU looks for single files of its data.
         self.device.link(f"{SYSTEM_ICU}/icudt{self.names.icu}", ".")
 
     def download_and_announce(self, data_set: str):
         version = getattr(self.names, data_set)
-        self.bring(version, update_path(version))
+        self.bring(data_set, update_path(version))
         self.device.announce(version)
 
     def scene(self, title: str, words: str, clock_before="") -> Seen:

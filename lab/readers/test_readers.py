@@ -55,7 +55,7 @@ def bring(device: Device, source: Path, target: str):
 def device_with(system: str, links: tuple[str, ...], update: str | None) -> Device:
     """A device with a system partition's data and both updates; one is in use."""
     device = Device()
-    bring(device, data.TARGET / system / "zoneinfo.default", SYSTEM_ZONEINFO)
+    bring(device, data.TARGET / system / "zoneinfo", SYSTEM_ZONEINFO)
     bring(device, data.TARGET / system / "icu", SYSTEM_ICU)
     Path("/etc/localtime").unlink(missing_ok=True)
     os.symlink(LOCALTIME, "/etc/localtime")
@@ -66,8 +66,9 @@ def device_with(system: str, links: tuple[str, ...], update: str | None) -> Devi
             os.symlink(target, link)
         else:
             device.link(link, target)
-    for release in (NAMES.update, NAMES.refused):
-        bring(device, data.TARGET / f"{release}.1.0", update_path(f"{release}.1.0"))
+    for update_set in ("update", "refused"):
+        bring(device, data.TARGET / update_set,
+              update_path(getattr(data.names(), update_set)))
     device.point_links_at(update)
     device.choose_zone(ZONE)
     # Packages that are only unpacked look for their files here.
