@@ -596,13 +596,15 @@ def test_archives_that_are_refused(place, kind):
     assert os.listdir(place / "out") == []
 
 
-def test_an_archive_that_grows(place):
+@pytest.mark.parametrize("members, megabytes", [(1, 17), (30, 10)])
+def test_an_archive_that_grows(place, members, megabytes):
     """Small, and much too large when it is read."""
     archive = place / "rules.tar.gz"
-    with tarfile.open(archive, "w:gz", compresslevel=1) as tar:
-        info = tarfile.TarInfo("README")
-        info.size = 300 << 20
-        with open("/dev/zero", "rb") as zeros:
+    with (tarfile.open(archive, "w:gz", compresslevel=1) as tar,
+          open("/dev/zero", "rb") as zeros):
+        for _ in range(members):
+            info = tarfile.TarInfo("README")
+            info.size = megabytes << 20
             tar.addfile(info, zeros)
     refused(update(place, rules=archive), "far too large")
 
