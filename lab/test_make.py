@@ -177,7 +177,7 @@ def test_the_same_bytes(place, monkeypatch):
                 os.utime(copy, (1, 1))
     (other / "out").mkdir()
     monkeypatch.chdir(other)
-    was = os.umask(0o077)
+    was = os.umask(0o777)
     try:
         made(update(Path(), "--json", environment={
             "LC_ALL": "tr_TR.UTF-8", "TZ": "Asia/Tokyo", "PYTHONHASHSEED": "7"}))
