@@ -18,7 +18,7 @@ from lab.places import BUILD  # noqa: E402
 
 TALLY = {}
 DOORS = {"lab/emulator/": "device --tests", "lab/readers/": "readers",
-         "lab/test_recipe": "readers"}  # of tests that scripts/prove cannot run
+         "lab/test_recipe": "readers", "lab/test_image": "readers"}  # of tests that scripts/prove cannot run
 os.environ["PYTEST_CACHE"] = str(BUILD / "prove" / "pytest")  # for pytest.ini
 
 

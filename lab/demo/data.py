@@ -41,17 +41,17 @@ def names() -> releases.Names:
 def make():
     made = releases.names()
     with tempfile.TemporaryDirectory(dir=TARGET) as work:
-        for data_set, release, schema, update, update_release in (
-                ("system", made.system, made.icu, "update", made.update),
-                ("upgrade", made.upgrade, made.icu, "", ""),
-                ("other", made.system, made.other_icu, "refused", made.refused)):
-            system = Path(work, data_set)
-            releases.make_system(release, schema, system)
-            if update:
-                releases.make_update(update_release, system, work)
-                Path(work, f"{update_release}.1.0").rename(TARGET / update)
-            if data_set != "other":
-                (system / "zoneinfo.default").rename(system / "zoneinfo")
-                system.rename(TARGET / data_set)
+        system, upgrade, other = (Path(work, name) for name in
+                                  ("system", "upgrade", "other"))
+        releases.make_system(made.system, made.icu, system)
+        releases.make_system(made.upgrade, made.icu, upgrade)
+        releases.make_system(made.system, made.other_icu, other)
+        releases.make_update(made.update, system, work)
+        releases.make_update(made.refused, other, work)
+        Path(work, names().update).rename(TARGET / "update")
+        Path(work, names().refused).rename(TARGET / "refused")
+        for partition in (system, upgrade):
+            (partition / "zoneinfo.default").rename(partition / "zoneinfo")
+            partition.rename(TARGET / partition.name)
     releases.output("g++", "-O1", ICU_SOURCE, "-o", ICU_PROGRAM, "-licui18n",
                     "-licuuc")

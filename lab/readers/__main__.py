@@ -1,11 +1,12 @@
 # SPDX-License-Identifier: BSD-2-Clause
-"""usage: scripts/readers [TEST...]
+"""usage: scripts/readers [--image | TEST...]
 
 Runs the commands of docs/integration.md that make an update. Then shows what real
 programs from Debian read, on a private device on which an update is activated, another
 refused, and the system upgraded; compares it with docs/readers.md.
 Installs small packages, as root; the large programs are only unpacked, into the folder
-"build/readers", some 150 MB.
+"build/readers", some 150 MB. With --image it makes and boots the image of
+docs/integration.md instead, as root, in five minutes.
 
 Exit status: 0 when everything is as the document says, 1 when it is not, 2 for bad
 use, 77 when there can be no private device.
@@ -25,7 +26,7 @@ from lab.readers.programs import GLIBC, HOME, ICU, MUSL, UNPACKED
 
 PACKAGES = ("libnode108 node-undici node-acorn node-cjs-module-lexer miller "
             "postgresql-15 postgresql-client-15").split()
-RECIPE = "lab/test_recipe.py"
+RECIPE, IMAGE = "lab/test_recipe.py", "lab/test_image.py"
 # Of the machine's "/etc": what programs need to start.
 ETC = ("alternatives", "group", "ld.so.cache", "passwd")
 
@@ -72,12 +73,14 @@ def inside(*command: str) -> list[str]:
 
 def main() -> int:
     options = Options(__doc__)
+    options.add_argument("--image", action="store_const", const=[IMAGE], dest="tests")
     options.add_argument("tests", nargs="*", default=[RECIPE, "lab/readers"])
     chosen = options.parse_args()
     need("private-device")
     if status := subprocess.call([PROJECT / "scripts/private-device", "--probe"]):
         return status
-    need("build", "demo", "prove", "pytest", "readers")
+    need("build", "demo", "prove", "pytest", "readers",
+         *["image"] * (IMAGE in chosen.tests))
     build_program()
     with locked(data.TARGET.parent):
         data.prepare()
@@ -89,8 +92,8 @@ def main() -> int:
             stop(1, str(failed))
     pytest = ["/usr/bin/python3", "-B", "-m", "pytest", "-c", "lab/pytest.ini",
               f"--rootdir={PROJECT}", "-p", "no:cacheprovider", "-q"]
-    # The recipe has private devices of its own.
-    outside = [test for test in chosen.tests if test.startswith(RECIPE)]
+    # These have private devices, or a whole system, of their own.
+    outside = [test for test in chosen.tests if test.startswith((RECIPE, IMAGE))]
     others = [test for test in chosen.tests if test not in outside]
     statuses = []
     if outside:

@@ -1,0 +1,102 @@
+# SPDX-License-Identifier: BSD-2-Clause
+"""The image of docs/integration.md is made and boots; what systemd itself shows there.
+Takes root, a network and minutes: see scripts/readers."""
+
+import contextlib
+import os
+import re
+import select
+import subprocess
+import time
+
+import pytest
+
+from lab import releases
+from lab.doors import build
+from lab.places import PROJECT
+
+SECONDS = 400
+PROMPT = b":~# "
+
+
+class Console:
+    """The serial line of a system."""
+
+    def __init__(self, running: subprocess.Popen):
+        self.running = running
+        self.text = b""
+
+    def until(self, words: bytes) -> str:
+        """What is said until these words."""
+        end = time.monotonic() + SECONDS
+        while words not in self.text:
+            ready = select.select([self.running.stdout], [], [], 1)[0]
+            more = os.read(self.running.stdout.fileno(), 65536) if ready else b""
+            if ready and not more or time.monotonic() > end:
+                pytest.fail(f"never said {words!r}: {self.text[-3000:]!r}")
+            self.text += more
+        said, _, self.text = self.text.partition(words)
+        return said.decode(errors="replace")
+
+    def answer(self, command: str) -> str:
+        """What a command prints, on one line, and its status."""
+        line = f"echo A:$({command} 2>&1):$?:Z"
+        self.running.stdin.write(line.encode() + b"\n")
+        self.running.stdin.flush()
+        self.until(b":Z\r")  # the line itself, as it is typed
+        said = self.until(b":Z\r")
+        return re.search("A:(.*)", said, re.DOTALL)[1].replace("\r", "")
+
+
+@pytest.fixture(scope="module")
+def console(tmp_path_factory):
+    """A system from the recipe, logged in."""
+    place = tmp_path_factory.mktemp("image")
+    release = releases.names().system
+    given = releases.given(release)
+    releases.run(releases.tool("make-system", **given, schema=releases.icu_schema(),
+                               out=place / "system"))
+    folder = build("release")
+    releases.output("cpack", "--config", folder / "CPackConfig.cmake", "-B", place,
+                    cwd=folder)
+    text = (PROJECT / "docs/integration.md").read_text()
+    recipe = re.search(r"<!-- image -->\n```\n(.*?)```\n<!-- end -->", text,
+                       re.DOTALL)[1]
+    make, boot = recipe.split("qemu-system", 1)
+    releases.output("/bin/sh", "-euc", make, cwd=place)
+    with subprocess.Popen(["/bin/sh", "-euc", f"exec qemu-system{boot}"], cwd=place,
+                          stdin=subprocess.PIPE, stdout=subprocess.PIPE) as running:
+        there = Console(running)
+        try:
+            there.until(b"login: ")
+            running.stdin.write(b"root\n")
+            running.stdin.flush()
+            there.until(PROMPT)
+            yield there
+        finally:
+            with contextlib.suppress(ProcessLookupError):
+                running.kill()
+
+
+def test_marlin_ran(console):
+    told = console.answer("journalctl -q -o cat -u marlin")
+    for words in ("Bad zoneinfo link", "localtime link invalid; resetting to America"):
+        assert words in told
+    assert console.answer("readlink /var/db/timezone/zoneinfo") == (
+        "/usr/share/zoneinfo.default:0")
+    assert console.answer("date -d @1782900000 +%H:%M-%Z") == "03:00-PDT:0"
+
+
+def test_timers_of_pid_1(console):
+    """PID 1 read "/etc/localtime" first when there was no link yet."""
+    console.answer("systemd-run --on-calendar='2040-07-01 12:00' --unit=local true")
+    console.answer("systemctl daemon-reload")
+    told = console.answer("TZ=UTC systemctl show local.timer -p NextElapseUSecRealtime")
+    print(told)
+    assert "2040-07-01 19:00:00" in told
+
+
+def test_timedatectl(console):
+    told = console.answer("timedatectl show -p Timezone")
+    print(told)
+    assert told == ""
