@@ -17,8 +17,9 @@ from lab.carriers import namespace  # noqa: E402
 from lab.places import BUILD  # noqa: E402
 
 TALLY = {}
+# Of tests that scripts/prove cannot run.
 DOORS = {"lab/emulator/": "device --tests", "lab/readers/": "readers",
-         "lab/test_recipe": "readers", "lab/test_image": "readers"}  # of tests that scripts/prove cannot run
+         "lab/test_recipe": "readers", "lab/test_image": "readers --image"}
 os.environ["PYTEST_CACHE"] = str(BUILD / "prove" / "pytest")  # for pytest.ini
 
 

@@ -73,28 +73,30 @@ def inside(*command: str) -> list[str]:
 
 def main() -> int:
     options = Options(__doc__)
-    options.add_argument("--image", action="store_const", const=[IMAGE], dest="tests")
+    options.add_argument("--image", action="store_true")
     options.add_argument("tests", nargs="*", default=[RECIPE, "lab/readers"])
     chosen = options.parse_args()
+    tests = [IMAGE] if chosen.image else chosen.tests
+    # These have private devices, or a whole system, of their own.
+    outside = [test for test in tests if test.startswith((RECIPE, IMAGE))]
+    others = [test for test in tests if test not in outside]
     need("private-device")
     if status := subprocess.call([PROJECT / "scripts/private-device", "--probe"]):
         return status
     need("build", "demo", "prove", "pytest", "readers",
-         *["image"] * (IMAGE in chosen.tests))
+         *["image"] * chosen.image)
     build_program()
     with locked(data.TARGET.parent):
         data.prepare()
-    with locked(BUILD / "locks"):
-        try:
-            releases.once(HOME, [data.TARGET / "inputs", __file__, "/etc/ld.so.cache",
-                                 *sorted((PROJECT / "lab/readers").glob("*.c*"))], make)
-        except (releases.NotOfTheForm, subprocess.CalledProcessError) as failed:
-            stop(1, str(failed))
+        if others:
+            try:
+                releases.once(HOME, [data.TARGET / "inputs", __file__,
+                                     *sorted((PROJECT / "lab/readers").glob("*.c*"))],
+                              make)
+            except (releases.NotOfTheForm, subprocess.CalledProcessError) as failed:
+                stop(1, str(failed))
     pytest = ["/usr/bin/python3", "-B", "-m", "pytest", "-c", "lab/pytest.ini",
               f"--rootdir={PROJECT}", "-p", "no:cacheprovider", "-q"]
-    # These have private devices, or a whole system, of their own.
-    outside = [test for test in chosen.tests if test.startswith((RECIPE, IMAGE))]
-    others = [test for test in chosen.tests if test not in outside]
     statuses = []
     if outside:
         statuses.append(subprocess.call([*pytest, *outside], cwd=PROJECT))

@@ -39,7 +39,8 @@ CLOCKS = {("13:00", "13:00"): "system", ("14:00", "14:00"): "update",
 PLACES = re.compile(r'"(/etc/localtime|/var/db/timezone/[^"]*|'
                     r'/usr/share/(?:zoneinfo|icu|marlin)[^"]*)"')
 ENVIRONMENT = {"PATH": "/usr/bin:/bin:/usr/sbin", "LC_ALL": "C.UTF-8",
-               "LD_LIBRARY_PATH": debian("usr/lib/x86_64-linux-gnu")}
+               "LD_LIBRARY_PATH": ":".join(
+                   str(place) for place in UNPACKED.glob("usr/lib/*-linux-gnu"))}
 
 
 # --- The device -------------------------------------------------------------------
