@@ -40,12 +40,11 @@ class Console:
 
     def answer(self, command: str) -> str:
         """What a command prints, on one line, and its status."""
-        line = f"echo A:$({command} 2>&1):$?:Z"
+        # As it is typed, the end is not yet what is waited for.
+        line = f'echo "A:$({command} 2>&1):$?:""Z"'
         self.running.stdin.write(line.encode() + b"\n")
         self.running.stdin.flush()
-        self.until(b":Z\r")  # the line itself, as it is typed
-        said = self.until(b":Z\r")
-        return re.search("A:(.*)", said, re.DOTALL)[1].replace("\r", "")
+        return self.until(b":Z\r").rpartition("\nA:")[2].replace("\r", "")
 
 
 @pytest.fixture(scope="module")

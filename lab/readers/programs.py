@@ -17,7 +17,7 @@ ZONE = "Europe/Lisbon"
 # Links that an image may have, by the name that docs/readers.md gives them.
 LINKS = {
     "names": (FORMER_ZONEINFO, ZONEINFO),
-    "zone": ("/etc/localtime", f"{ZONEINFO}/{ZONE}"),
+    "zone": ("/etc/localtime", f"{FORMER_ZONEINFO}/{ZONE}"),
     "ICU's update": ("/usr/share/zoneinfo-icu/44/le", ICUTZ),
     "ICU's system": (f"{SYSTEM_ICU}/icudt72l", "."),
 }
@@ -95,7 +95,9 @@ READERS = [
     Reader("glibc, `date`", DATE, {"TZ": ZONE, "TZDIR": ZONEINFO}, question=at),
     Reader("glibc, `date`", DATE, {"TZ": ZONE}, ("names",), question=at),
     Reader("glibc, a program", [GLIBC]),
+    Reader("glibc, a program", [GLIBC], links=("names", "zone")),
     Reader("musl, a program", [MUSL]),
+    Reader("musl, a program", [MUSL], links=("names", "zone")),
     Reader("musl, a program", [MUSL], TZ),
     Reader("musl, a program", [MUSL], {"TZ": ZONE}),
     Reader("musl, a program", [MUSL], {"TZ": ZONE, "TZDIR": ZONEINFO}),
@@ -109,7 +111,7 @@ READERS = [
     Reader("ICU4C, the host's zone", [ICU, "-"], FILES, ("names",)),
     Reader("ICU4C, the host's zone", [ICU, "-"], FILES | TZ),
     Reader("ICU4C, the host's zone", [ICU, "-"], FILES | {"TZ": ZONE}),
-    Reader("ICU4C, the host's zone", [ICU, "-"], FILES, ("zone",)),
+    Reader("ICU4C, the host's zone", [ICU, "-"], FILES, ("names", "zone")),
     Reader("Python, zoneinfo", ["/usr/bin/python3", "-c", PYTHON]),
     Reader("Python, zoneinfo", ["/usr/bin/python3", "-c", PYTHON],
            {"PYTHONTZPATH": ZONEINFO}),
@@ -118,7 +120,7 @@ READERS = [
     Reader("Node, a zone by name", NODE_NAMED),
     Reader("Node, a zone by name", NODE_NAMED, DATA, ("ICU's update", "ICU's system")),
     Reader("Node, local time", NODE_LOCAL, FILES),
-    Reader("Node, local time", NODE_LOCAL, FILES, ("zone",)),
+    Reader("Node, local time", NODE_LOCAL, FILES, ("names", "zone")),
     Reader("PostgreSQL, a zone by name", PSQL, question=by_name),
     Reader("PostgreSQL, a zone by name", PSQL, links=("names",), question=by_name),
     Reader("Go, a zone by name", GO, runs_on=False),
