@@ -44,7 +44,7 @@ class Console:
         line = f'echo "A:$({command} 2>&1):$?:""Z"'
         self.running.stdin.write(line.encode() + b"\n")
         self.running.stdin.flush()
-        return self.until(b":Z\r").rpartition("\nA:")[2].replace("\r", "")
+        return self.until(b":Z\r").rpartition("A:")[2].replace("\r", "")
 
 
 @pytest.fixture(scope="module")
@@ -86,16 +86,18 @@ def test_marlin_ran(console):
     assert console.answer("date -d @1782900000 +%H:%M-%Z") == "03:00-PDT:0"
 
 
-def test_timers_of_pid_1(console):
-    """PID 1 read "/etc/localtime" first when there was no link yet."""
-    console.answer("systemd-run --on-calendar='2040-07-01 12:00' --unit=local true")
-    console.answer("systemctl daemon-reload")
-    told = console.answer("TZ=UTC systemctl show local.timer -p NextElapseUSecRealtime")
-    print(told)
-    assert "2040-07-01 19:00:00" in told
-
-
-def test_timedatectl(console):
-    told = console.answer("timedatectl show -p Timezone")
-    print(told)
-    assert told == ""
+def test_systemd(console):
+    """As docs/readers.md tells. PID 1 has started before there was a link."""
+    console.answer("systemd-run --on-calendar='2040-07-01 12:00' --unit=noon true")
+    timer = "TZ=UTC systemctl show noon.timer -p NextElapseUSecRealtime"
+    assert " 2040-07-01 19:00:00 UTC" in console.answer(timer)
+    assert console.answer("timedatectl show -p Timezone") == "Timezone=:0"
+    console.answer("ln -sfn /usr/share/zoneinfo/Europe/Lisbon /etc/localtime")
+    # It reads the link when it starts.
+    console.answer("systemctl stop systemd-timedated")
+    assert console.answer("timedatectl show -p Timezone") == "Timezone=Europe/Lisbon:0"
+    assert " 2040-07-01 11:00:00 UTC" in console.answer(timer)
+    assert console.answer("timedatectl set-timezone Europe/Paris") == ":0"
+    assert console.answer("readlink /etc/localtime") == (
+        "../usr/share/zoneinfo/Europe/Paris:0")
+    assert "America/Los_Angeles" in console.answer("readlink /var/db/timezone/localtime")
