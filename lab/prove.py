@@ -30,7 +30,7 @@ import subprocess
 import time
 
 from lab import releases
-from lab.doors import Options, build_program, need
+from lab.doors import Options, build_program, need, stop
 from lab.places import BUILD, PROJECT
 
 PYTHON = ["/usr/bin/python3", "-B", "-m"]
@@ -89,10 +89,15 @@ def main() -> int:
     for name in chosen.proofs:
         if not alone and name not in TRIALS and name not in OTHERS:
             options.error(f"'{name}' is not a proof")
-    need("build", "private-device", "pytest", "prove", "demo")
+    makes = any("make" in name for name in alone or chosen.proofs or TRIALS)
+    need("build", "private-device", "pytest", "prove", *["demo"] * makes)
     (BUILD / "prove").mkdir(exist_ok=True)
     build_program()
-    releases.prepare()
+    if makes:
+        try:
+            releases.prepare()
+        except (releases.NotOfTheForm, subprocess.CalledProcessError) as failed:
+            stop(1, str(failed))
     if alone:
         return subprocess.call(trials("alone", "-rs", *alone), cwd=PROJECT)
     results = [
