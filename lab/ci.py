@@ -38,7 +38,7 @@ def files(*patterns: str) -> list[str]:
         folders[:] = [name for name in folders
                       if name not in (".git", "build") and here / name != BUILD]
         found += [str((here / name).relative_to(PROJECT)) for name in names
-                  if any(Path(name).match(pattern) for pattern in patterns)]
+                  if any((here / name).match(pattern) for pattern in patterns)]
     return sorted(found)
 
 
@@ -75,8 +75,9 @@ def check_shell():
 
 def check_python():
     need("lint")
-    many("/usr/bin/python3 -m pycodestyle --max-line-length=88", files("*.py"))
-    many("/usr/bin/python3 -m pyflakes", files("*.py"))
+    names = files("*.py", "tools/make-*")
+    many("/usr/bin/python3 -m pycodestyle --max-line-length=88", names)
+    many("/usr/bin/python3 -m pyflakes", names)
 
 
 def first_contact():
@@ -110,6 +111,8 @@ STAGES = {
     "python": ("pycodestyle, pyflakes", check_python),
     "contact": ("the first contact of a new user", first_contact),
     "demo": ("the demonstration ends as it says", demonstration),
+    "readers": ("real programs read what the document says; its recipe",
+                door("readers")),
     "bench": ("the cost of a boot has not grown", door("bench", "--check")),
     "package": ("the package, the boot unit, boots under its restrictions",
                 door("package")),

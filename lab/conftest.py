@@ -17,6 +17,9 @@ from lab.carriers import namespace  # noqa: E402
 from lab.places import BUILD  # noqa: E402
 
 TALLY = {}
+# Of tests that scripts/prove cannot run.
+DOORS = {"lab/emulator/": "device --tests", "lab/readers/": "readers",
+         "lab/test_recipe": "readers", "lab/test_image": "readers --image"}
 os.environ["PYTEST_CACHE"] = str(BUILD / "prove" / "pytest")  # for pytest.ini
 
 
@@ -62,7 +65,8 @@ def count(request):
 def pytest_runtest_makereport(item, call):
     report = (yield).get_result()
     if report.failed:
-        door = "device --tests" if "lab/emulator/" in report.nodeid else "prove"
+        door = next((door for part, door in DOORS.items() if part in report.nodeid),
+                    "prove")
         report.sections.append(
             ("Alone", f"scripts/{door} {shlex.quote(report.nodeid)}"))
 

@@ -13,6 +13,7 @@ takes samples, in eight minutes.
   log        a log that is lost, or fails in the middle
   status     what marlin-status says, against what then happens
   install    the installer of updates: calls that fail, kills, several at once
+  make       what makes updates and a system's data, and what it refuses
   fuzz       hostile texts
   sanitize   the tests under sanitizers and (not with --quick) valgrind
   coverage   lines and branches that the tests run through
@@ -29,7 +30,8 @@ import os
 import subprocess
 import time
 
-from lab.doors import Options, build_program, need
+from lab import releases
+from lab.doors import Options, build_program, need, stop
 from lab.places import BUILD, PROJECT
 
 PYTHON = ["/usr/bin/python3", "-B", "-m"]
@@ -42,6 +44,7 @@ TRIALS = {
     "status": ["test_status.py"],
     "install": ["test_install_faults.py", "test_install_kills.py",
                 "test_install_races.py"],
+    "make": ["test_make.py"],
 }
 OTHERS = {  # the whole, and with --quick
     "fuzz": (["lab.fuzz", "--seconds", "600"], ["lab.fuzz", "--seconds", "60"]),
@@ -96,9 +99,15 @@ def main() -> int:
     for name in chosen.proofs:
         if not alone and name not in TRIALS and name not in OTHERS:
             options.error(f"'{name}' is not a proof")
-    need("build", "private-device", "pytest", "prove")
+    makes = any("make" in name for name in alone or chosen.proofs or TRIALS)
+    need("build", "private-device", "pytest", "prove", *["demo"] * makes)
     (BUILD / "prove").mkdir(exist_ok=True)
     build_program()
+    if makes:
+        try:
+            releases.prepare()
+        except (releases.NotOfTheForm, subprocess.CalledProcessError) as failed:
+            stop(1, str(failed))
     if alone:
         return subprocess.call(trials("alone", "-rs", *alone), cwd=PROJECT)
     results = [

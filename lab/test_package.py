@@ -43,6 +43,7 @@ CONTENT = dict(reversed(line.split(maxsplit=1)) for line in """
     644 /usr/share/doc/marlin/docs/growth.svg
     644 /usr/share/doc/marlin/docs/integration.md
     644 /usr/share/doc/marlin/docs/proofs.md
+    644 /usr/share/doc/marlin/docs/readers.md
     755 /usr/share/doc/marlin/examples/init-script
     644 /usr/share/doc/marlin/examples/inittab
     644 /usr/share/doc/marlin/examples/marlin.service.d/mend.conf

@@ -1,7 +1,7 @@
 # SPDX-License-Identifier: BSD-2-Clause
 """usage: scripts/bench [--rounds N]
        scripts/bench --check | --record | --growth | --hardening | --parsers |
-                     --companions | --status
+                     --companions | --status | --making
 
 Measures marlin, as it ships, inside a private device. Without an option: beside the
 least that its system calls can cost ("the floor", lab/bench/floor.c), its own dynamic
@@ -20,6 +20,7 @@ user-space instructions to the size of the file.
   --companions  marlin-install with an update of 1 MB, which may take 100 ms beside
                 fsync(2) and 16 MB; marlin-mend, which has to cost less than marlin
   --status      marlin-status, on a large device and on hostile ones; takes minutes
+  --making      the time that make-system and make-update take
 
 Installs the Debian packages that it needs. Instructions are those of an environment
 that holds only PATH: each variable more costs some 550 in the C library's start-up, for
@@ -30,11 +31,15 @@ import json
 import os
 import re
 import shlex
+import shutil
 import subprocess
 import sys
+import tempfile
+import time
 from collections.abc import Iterator
 from pathlib import Path
 
+from lab import releases
 from lab.bench.measure import SCENES
 from lab.bench.status import rows as status_rows
 from lab.doors import Options, need
@@ -138,6 +143,34 @@ def parsers():
         rows.append((operation["name"], f"{operation['cpu_time']:.1f}",
                      (many - few) // 1000))
     print_table("Operation, ns, Instructions", rows)
+
+
+def making():
+    """Beside the usual update one in which every zone file is another."""
+    releases.prepare()
+    names = releases.names()
+    with tempfile.TemporaryDirectory() as work:
+        system, other = Path(work, "system"), Path(work, "other")
+
+        def timed(job, *arguments) -> tuple[str, str]:
+            started, before = time.monotonic(), os.times()
+            job(*arguments)
+            used = os.times()
+            processor = sum(used[2:4]) - sum(before[2:4])
+            return f"{time.monotonic() - started:.2f}", f"{processor:.2f}"
+
+        rows = [("make-system", *timed(
+            releases.make_system, names.system, names.icu, system))]
+        rows.append(("make-update", *timed(
+            releases.make_update, names.update, system, work)))
+        shutil.copytree(system, other)
+        run("zic", "-b", "fat", "-d", f"{other}/zoneinfo.default", str(releases.RULES))
+        rows.append(("make-update, all files differ", *timed(
+            releases.make_update, names.refused, other, work)))
+        size = sum(path.stat().st_size for path in Path(
+            work, f"{names.update}.1.0").rglob("*") if path.is_file())
+    print_table("Job, Seconds, of a processor", rows)
+    print(f"\nThe update has {size} bytes, in files.")
 
 
 def growth():
@@ -310,8 +343,8 @@ def main():
     parser = Options(__doc__)
     parser.add_argument("--rounds", default="11")
     jobs = parser.add_mutually_exclusive_group()
-    for job in (check, record, growth, hardening, parsers, companions,
-                status):
+    for job in (check, record, growth, hardening, parsers, companions, status,
+                making):
         jobs.add_argument(f"--{job.__name__}", dest="job", action="store_const",
                           const=job, default=table)
     options = parser.parse_args()
@@ -319,6 +352,7 @@ def main():
         parser.error("--rounds needs a number")
     name = options.job.__name__
     more = [f"bench-{name}"] if name in ("table", "growth", "parsers") else []
+    more += ["demo"] if name == "making" else []
     need("build", "private-device", "bench", *more)
     options.job(*[options.rounds] * (options.job is table))
 

@@ -9,6 +9,7 @@ printed but what was found, to be the same as the file.
 from __future__ import annotations
 
 import contextlib
+import datetime
 import difflib
 import os
 import signal
@@ -48,11 +49,14 @@ def tell(story: Story):
   {screen.paint(screen.DIM, "Shown beside them:")}
   record      the file TZVersionDiffRecord: from which version to which the last \
 update led
-  clock       "date" with TZ=:{LOCALTIME}, at noon UTC on 1 February {year}""")
+  clock       "date" with TZ=:{LOCALTIME}, at noon UTC on 1 February {year}
+  ICU clock   a program with Debian's ICU, for the zone that localtime names, at the \
+same moment""")
     screen.say("""The device is private and gone when this ends. Its data is real,
-        that of this machine, but for one invention in the later releases: Lisbon
-        goes from Western European Time, WET, to Central European Time, CET. The ICU
-        data is the same in all; one download has it under the name of another
+        that of this machine, except for the names of the releases and one invention
+        in the later ones: Lisbon goes from Western European Time, WET, to Central
+        European Time, CET, in the zone files and in the ICU data. All of it is made
+        by make-system and make-update. One download is made for another ICU
         format.""")
     print(f"""
   {screen.paint(screen.DIM, " " * 12 + "ICU format   Lisbon changes   what it is")}
@@ -127,7 +131,7 @@ class Story:
     def __init__(self):
         self.device = Device()  # as it is to be at the next boot
         self.names = data.names()
-        self.year = int(self.names.system[:4]) + 1
+        self.year = self.names.year
         self.endings = []  # of scenes, in the words of the summary
         self.facts = []  # as they were found
         self.wrong = []  # where that is not as claimed
@@ -142,6 +146,8 @@ class Story:
     def install_system(self, data_set: str):
         self.bring(f"{data_set}/zoneinfo", SYSTEM_ZONEINFO)
         self.bring(f"{data_set}/icu", SYSTEM_ICU)
+        # Where ICU looks for single files of its data.
+        self.device.link(f"{SYSTEM_ICU}/icudt{self.names.icu}", ".")
 
     def download_and_announce(self, data_set: str):
         version = getattr(self.names, data_set)
@@ -167,7 +173,8 @@ class Story:
         print()
         screen.printed(log)
         screen.field("exit", f"status {status}")
-        self.endings.append(f"{title:<42}{data_in_use(seen.after):<26}{found['clock']}")
+        self.endings.append(f"{title:<42}{data_in_use(seen.after):<23}"
+                            f"{found['clock']:<11}{found['ICU clock']}")
 
         warned = [f"warned '{line.removeprefix(lines.NAME).rpartition(': ')[0]}'"
                   for line in log] or ["no warning"]
@@ -194,17 +201,22 @@ class Story:
         rows = {name: stands(entries, path) for name, path in ROWS.items()}
         if rows["record"] == "(a plain file)":
             rows["record"] = entries[RECORD].text
-        clock = subprocess.run(
-            ["date", "-d", f"{self.year}-02-01 12:00 UTC", "+%H:%M %Z"], check=True,
-            env={"TZ": f":{LOCALTIME}"}, stdout=subprocess.PIPE, text=True
-        ).stdout.rstrip("\n")
+        noon = datetime.datetime(self.year, 2, 1, 12, tzinfo=datetime.timezone.utc)
+        seconds = f"{noon.timestamp():.0f}"
+        clock = output("date", "-d", f"@{seconds}", "+%H:%M %Z", TZ=f":{LOCALTIME}")
         # Without a zone file there is no name of a zone, and the hour is UTC's.
         rows["clock"] = clock[:-1] + ", no zone" if clock.endswith(" ") else clock
+        rows["ICU clock"] = "no zone"
+        if rows["localtime"].startswith(f"{ZONEINFO}/"):
+            zone = rows["localtime"].removeprefix(f"{ZONEINFO}/")
+            rows["ICU clock"] = " ".join(output(
+                str(data.ICU_PROGRAM), seconds, zone, ICU_DATA=SYSTEM_ICU,
+                ICU_TIMEZONE_FILES_DIR=ICUTZ).split()[:2])
         return rows
 
     def summary(self):
         screen.rule("In short")
-        heading = f"   {'boot':<42}{'data in use after it':<26}clock"
+        heading = f"   {'boot':<42}{'data in use after it':<23}{'clock':<11}ICU clock"
         print("\n  " + screen.paint(screen.DIM, heading))
         for number, ending in enumerate(self.endings, start=1):
             print(f"  {number}  {ending}")
@@ -217,6 +229,11 @@ class Story:
             screen.say(f"All {len(CLAIMS)} facts told above were found on the device.",
                        screen.GREEN)
         print()
+
+
+def output(*command: str, **environment: str) -> str:
+    return subprocess.run(command, check=True, env=environment, text=True,
+                          stdout=subprocess.PIPE).stdout.rstrip("\n")
 
 
 def stands(entries: Entries, path: str) -> str:

@@ -1,0 +1,108 @@
+# SPDX-License-Identifier: BSD-2-Clause
+"""usage: scripts/readers [--image | TEST...]
+
+Runs the commands of docs/integration.md that make an update. Then shows what real
+programs from Debian read, on a private device on which an update is activated, another
+refused, and the system upgraded; compares it with docs/readers.md.
+Installs small packages, as root; the large programs are only unpacked, into the folder
+"build/readers", some 150 MB. With --image it makes and boots the image of
+docs/integration.md instead, as root, in five minutes.
+
+Exit status: 0 when everything is as the document says, 1 when it is not, 2 for bad
+use, 77 when there can be no private device.
+"""
+
+import os
+import subprocess
+import sys
+from pathlib import Path
+
+from lab import boot, releases
+from lab.demo import data
+from lab.doors import Options, build_program, locked, need, say, stop
+from lab.places import BUILD, PROJECT
+from lab.private_device import ISOLATION, machine
+from lab.readers.programs import GLIBC, HOME, ICU, MUSL, UNPACKED
+
+PACKAGES = ("libnode108 node-undici node-acorn node-cjs-module-lexer miller "
+            "postgresql-15 postgresql-client-15").split()
+RECIPE, IMAGE = "lab/test_recipe.py", "lab/test_image.py"
+# Of the machine's "/etc": what programs need to start.
+ETC = ("alternatives", "group", "ld.so.cache", "passwd")
+
+
+def unpack():
+    """What would be large, or start a server, is not installed."""
+    UNPACKED.mkdir()
+    # Another Node than Debian's may be installed, and then counts as the candidate.
+    known = releases.output("apt-cache", "show", "--no-all-versions", "libnode108",
+                            text=True)
+    release = releases.find("Node", "^Version: (.*)", known)[1]
+    say("Fetching Debian packages (35 MB)")
+    fetched = subprocess.run(
+        ["apt-get", "-q", "download", f"nodejs={release}", *PACKAGES], cwd=HOME,
+        capture_output=True, text=True)
+    if fetched.returncode:
+        stop(1, f"cannot fetch the programs: {fetched.stderr.strip()}")
+    for package in HOME.glob("*.deb"):
+        releases.output("dpkg-deb", "-x", package, UNPACKED)
+        package.unlink()
+
+
+def make():
+    sources = PROJECT / "lab/readers"
+    unpack()
+    releases.output("gcc", "-O1", sources / "clock.c", "-o", GLIBC)
+    releases.output("musl-gcc", "-O1", "-static", sources / "clock.c", "-o", MUSL)
+    releases.output("g++", "-O1", sources / "icu.cpp", "-o", ICU, "-licui18n",
+                    "-licuuc")
+
+
+def inside(*command: str) -> list[str]:
+    """A private device with an "/etc" of its own, in which the zone can be set. Nobody
+    is root there, as PostgreSQL's server insists."""
+    places = [str(place) for place in (PROJECT, BUILD, Path(boot.PROGRAM).parent)]
+    places += [f"/etc/{name}" for name in ETC if os.path.exists(f"/etc/{name}")]
+    return ["bwrap", "--unshare-user", "--uid", "1000", "--gid", "1000", *ISOLATION,
+            *machine(), "--tmpfs", "/etc", "--tmpfs", "/tmp", "--dir",
+            "/run", "--tmpfs", "/var/db", "--tmpfs", "/usr/share",
+            *(word for place in places for word in ("--ro-bind", place, place)),
+            "--setenv", "HOME", "/tmp", "--setenv", "MARLIN_PRIVATE_DEVICE", "1",
+            "--setenv", "MARLIN", boot.PROGRAM, "--chdir", str(PROJECT), "--", *command]
+
+
+def main() -> int:
+    options = Options(__doc__)
+    options.add_argument("--image", action="store_true")
+    options.add_argument("tests", nargs="*", default=[RECIPE, "lab/readers"])
+    chosen = options.parse_args()
+    tests = [IMAGE] if chosen.image else chosen.tests
+    # These have private devices, or a whole system, of their own.
+    outside = [test for test in tests if test.startswith((RECIPE, IMAGE))]
+    others = [test for test in tests if test not in outside]
+    need("private-device")
+    if status := subprocess.call([PROJECT / "scripts/private-device", "--probe"]):
+        return status
+    need("build", "demo", "prove", "pytest", "readers",
+         *["image"] * chosen.image)
+    build_program()
+    with locked(data.TARGET.parent):
+        data.prepare()
+        if others:
+            try:
+                releases.once(HOME, [data.TARGET / "inputs", __file__,
+                                     *sorted((PROJECT / "lab/readers").glob("*.c*"))],
+                              make)
+            except (releases.NotOfTheForm, subprocess.CalledProcessError) as failed:
+                stop(1, str(failed))
+    pytest = ["/usr/bin/python3", "-B", "-m", "pytest", "-c", "lab/pytest.ini",
+              f"--rootdir={PROJECT}", "-p", "no:cacheprovider", "-q"]
+    statuses = []
+    if outside:
+        statuses.append(subprocess.call([*pytest, *outside], cwd=PROJECT))
+    if others:
+        statuses.append(subprocess.call(inside(*pytest, *others), cwd=PROJECT))
+    return int(any(statuses))
+
+
+sys.exit(main())

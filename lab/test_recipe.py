@@ -1,0 +1,46 @@
+# SPDX-License-Identifier: BSD-2-Clause
+"""The commands of docs/integration.md, from a release of the rules to a device."""
+
+import os
+import re
+import shutil
+import subprocess
+import tarfile
+
+import pytest
+
+from lab import releases
+from lab.places import PROJECT
+
+
+@pytest.fixture
+def given(tmp_path):
+    """A folder with what the recipe starts from: two releases and their ICU files."""
+    for release, lisbon_from in (("2025b", None), ("2025c", 2026)):
+        made = tmp_path / "made" / release
+        releases.make(made, release, lisbon_from)
+        with tarfile.open(tmp_path / f"tzdata{release}.tar.gz", "w:gz") as archive:
+            archive.add(made / "tzdata.zi", "tzdata.zi")
+        shutil.copytree(made / "icu", tmp_path / "icu" / release / "44/le")
+    shutil.rmtree(tmp_path / "made")
+    return tmp_path
+
+
+def test_the_recipe(given):
+    text = (PROJECT / "docs/integration.md").read_text()
+    recipe = re.search(r"<!-- recipe -->\n```\n(.*?)```\n<!-- end -->", text,
+                       re.DOTALL)[1]
+    done = subprocess.run(
+        ["/bin/sh", "-euc", recipe], cwd=given, capture_output=True, text=True,
+        env={**os.environ, "marlin": str(PROJECT)})
+    assert done.returncode == 0, done.stdout + done.stderr
+    shown = done.stdout
+    assert "zones that differ from the system's" in shown
+    assert "  Europe/Lisbon\n  Portugal\n" in shown
+    first, last = shown.split("2025c.1.0 for systems with 2025b.1.0")
+    assert "link to '/usr/share/zoneinfo.default'" in first.split("Boot 1: exit 0")[1]
+    after = last.split("Boot 1: exit 0")[1]
+    for words in ("link to '/var/db/timezone/tz/2025c.1.0/zoneinfo'",
+                  "link to '/var/db/timezone/tz/2025c.1.0/icutz'",
+                  "2025b.1.0_2025c.1.0"):
+        assert words in after

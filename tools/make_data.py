@@ -1,0 +1,409 @@
+# SPDX-License-Identifier: BSD-2-Clause
+"""What make-update and make-system have in common: rules and ICU files are read and
+checked, compiled and packed, and only a whole result gets its name."""
+
+from __future__ import annotations
+
+import argparse
+import contextlib
+import io
+import json
+import os
+import re
+import shutil
+import signal
+import stat
+import subprocess
+import sys
+import tarfile
+import tempfile
+from collections.abc import Iterator
+from pathlib import Path
+from typing import NamedTuple
+
+NAME = Path(sys.argv[0]).name
+RESOURCES = ("metaZones.res", "timezoneTypes.res", "windowsZones.res",
+             "zoneinfo64.res")
+SOURCES = ("africa", "antarctica", "asia", "australasia", "europe", "northamerica",
+           "southamerica", "etcetera", "factory", "backward")
+# Not compiled, but readers look for them in the tree.
+TABLES = ("iso3166.tab", "leap-seconds.list", "leapseconds", "tzdata.zi",
+          "zone.tab", "zone1970.tab", "zonenow.tab")
+LARGEST = 16 << 20  # bytes of one input file; ten times what the largest has today
+INT_MAX = 2147483647
+SECONDS = 60  # a tool that takes longer hangs
+HERE = "l" if sys.byteorder == "little" else "b"
+
+
+class Refused(Exception):
+    """Nothing is made; the text is all that is printed."""
+
+    def __init__(self, text: str, status=1):
+        super().__init__(text)
+        self.status = status
+
+
+# --- The command line -------------------------------------------------------------
+
+
+class Options(argparse.ArgumentParser):
+    def error(self, message):
+        self.exit(2, f"{NAME}: {plain(message)}; see --help\n")
+
+
+def options(about: str) -> Options:
+    """The options of both programs; `about` is their documentation."""
+    parser = Options(prog=NAME, usage=argparse.SUPPRESS, description=about,
+                     formatter_class=argparse.RawDescriptionHelpFormatter,
+                     allow_abbrev=False, add_help=False)
+    parser.format_help = lambda: about.lstrip()
+    parser.add_argument("--help", action="help")
+    for option in ("--rules", "--icu", "--out"):
+        parser.add_argument(option, type=Path, required=True)
+    parser.add_argument("--json", action="store_true")
+    return parser
+
+
+def main(make, parser: Options):
+    """Runs `make` with the options; a refusal is one line."""
+    # An interrupted program also takes away what it has begun.
+    for number in (signal.SIGINT, signal.SIGTERM, signal.SIGHUP):
+        signal.signal(number, lambda number, _: sys.exit(128 + number))
+    chosen = parser.parse_args()
+    os.umask(0o022)
+    try:
+        facts, text = make(chosen)
+        print(json.dumps(facts, indent=2, sort_keys=True) if chosen.json else text)
+        sys.stdout.flush()
+    except Refused as refused:
+        print(f"{NAME}: {plain(str(refused))}", file=sys.stderr)
+        sys.exit(refused.status)
+    except OSError as failed:
+        where = f"{failed.filename}: " if failed.filename is not None else ""
+        print(f"{NAME}: {plain(str(where))}{failed.strerror}; nothing was made",
+              file=sys.stderr)
+        sys.exit(1)
+
+
+def plain(text: str) -> str:
+    """Texts of other people on one line, and harmless on a terminal."""
+    return "".join(char if char.isprintable() else repr(char)[1:-1] for char in text)
+
+
+# --- Other programs ---------------------------------------------------------------
+
+
+def need(*tools: str):
+    # Some of them are in /usr/sbin, which is not on everybody's path.
+    os.environ["PATH"] = os.environ.get("PATH", os.defpath) + ":/usr/sbin:/sbin"
+    if missing := [tool for tool in tools if not shutil.which(tool)]:
+        raise Refused(f"missing: {' '.join(missing)}; install the Debian packages "
+                      "libc-bin and icu-devtools", 77)
+
+
+def output(*command, folder: Path, remedy: str, **environment: str) -> str:
+    """What a tool prints. One that fails is a refusal that quotes its first line."""
+    try:
+        done = subprocess.run(
+            command, cwd=folder, capture_output=True, text=True, errors="replace",
+            timeout=SECONDS, stdin=subprocess.DEVNULL,
+            env={"PATH": os.environ["PATH"], "LC_ALL": "C", "TZ": "UTC0"} | environment)
+    except subprocess.TimeoutExpired:
+        raise Refused(f"{command[0]} takes too long; {remedy}") from None
+    if done.returncode:
+        lines = done.stderr.strip() or f"it ended with status {done.returncode}"
+        line = lines.splitlines()[0].removeprefix(f"{command[0]}: ")
+        raise Refused(f"{command[0]}: {line}; {remedy}")
+    return done.stdout
+
+
+# --- Versions ---------------------------------------------------------------------
+# Read here a second time, apart from the boot program, so that making data takes no
+# C++ build; a test compares the two.
+
+
+def version(text: str) -> tuple[int, str, int, int]:
+    """A version, which compares as the boot program compares them."""
+    match = re.fullmatch(r"([0-9]+)([a-z]+)(?:\.([0-9]+)(?:\.([0-9]+))?)?", text)
+    if not match or any(int(number) > INT_MAX
+                        for number in match.group(1, 3, 4) if number):
+        raise Refused(f"'{text}' is not a version; write it like 2024a.1.0")
+    year, letters, first, second = match.groups()
+    return int(year), letters, int(first or -1), int(second or -1)
+
+
+def release_of(text: str, where: str) -> str:
+    if not re.fullmatch("[0-9]+[a-z]+", text):
+        raise Refused(f"{where} says '{text[:40]}', which is not a release; "
+                      "expected is one like 2024a")
+    version(text)
+    return text
+
+
+# --- What is given ----------------------------------------------------------------
+
+
+def read(path: Path, largest=LARGEST) -> bytes:
+    """A regular file of a sensible size; anything else could block or fill memory."""
+    try:
+        status = os.stat(path)
+    except (OSError, ValueError) as failed:
+        raise Refused(f"{path}: {getattr(failed, 'strerror', failed)}; "
+                      "name another") from None
+    if not stat.S_ISREG(status.st_mode):
+        raise Refused(f"{path} is not a regular file; name another")
+    if status.st_size > largest:
+        raise Refused(f"{path} has {status.st_size} bytes, more than {largest}; "
+                      "name another")
+    return path.read_bytes()
+
+
+def first_word(path: Path) -> str:
+    words = read(path).decode("ascii", "replace").split()
+    return words[0] if words else ""
+
+
+class Rules(NamedTuple):
+    release: str
+    compiled: list[str]  # files that zic takes
+    files: dict[str, bytes]  # these, and tables; by name
+
+
+def rules_from(path: Path) -> Rules:
+    """The rules in a tzdata.zi, in a directory with one or with the sources that it is
+    made of, or in an archive of such a directory."""
+    wanted = (*SOURCES, *TABLES, "version")
+    if path.is_dir():
+        files = {name: read(path / name) for name in wanted
+                 if (path / name).is_file()}
+    elif re.search(r"\.(tar|tgz|tar\.\w+)$", path.name):
+        files = unpacked(path, wanted)
+    else:
+        files = {"tzdata.zi": read(path)}
+    if "tzdata.zi" in files:
+        line = files["tzdata.zi"].partition(b"\n")[0].decode("ascii", "replace")
+        release = line.removeprefix("# version ").strip()
+        if release == line.strip():
+            raise Refused(f"{path} has no '# version' in its first line; "
+                          "name a tzdata.zi of a release")
+        compiled = ["tzdata.zi"]
+    elif set(SOURCES) <= files.keys() and "version" in files:
+        release = files.pop("version").decode("ascii", "replace").strip()
+        compiled = list(SOURCES)
+    else:
+        raise Refused(f"{path} holds neither tzdata.zi nor the sources africa to "
+                      "backward with the file version; name a release of the rules")
+    return Rules(release_of(release, f"{path}"), compiled, files)
+
+
+def unpacked(path: Path, wanted: tuple[str, ...]) -> dict[str, bytes]:
+    """Files of an archive, by name, whether or not they stand in a directory. Nothing
+    else in it is looked at, and nothing is written."""
+    files, packed = {}, io.BytesIO(read(path))
+    try:
+        with tarfile.open(fileobj=packed) as archive:
+            for member in archive:
+                name = member.name.rpartition("/")[2]
+                if member.size > LARGEST or archive.offset > 16 * LARGEST:
+                    raise Refused(f"{path} is far too large when it is unpacked; "
+                                  "name an archive of a release")
+                if name not in wanted or not member.isreg():
+                    continue
+                if name in files:
+                    raise Refused(f"{path} holds {name} twice; "
+                                  "name an archive of a release")
+                files[name] = archive.extractfile(member).read()
+    except (tarfile.TarError, EOFError, OSError, ValueError) as failed:
+        raise Refused(f"{path} cannot be read as an archive: {failed}; "
+                      "fetch it again") from None
+    return files
+
+
+class Icu(NamedTuple):
+    release: str
+    letter: str  # l, b or e: byte order and character set
+    format: int  # of resource files
+    schema: str  # as its icutzformat.txt has it; empty if there is none
+    files: dict[str, bytes]
+
+
+def icu_from(folder: Path) -> Icu:
+    """ICU's four resource files."""
+    files = {name: read(folder / name) for name in RESOURCES}
+    kinds = {}
+    for name, content in files.items():
+        # udata.h: size, magic numbers, byte order, character set, kind, its version.
+        if len(content) < 32 or content[2:4] != b"\xda\x27" or (
+                content[12:16] != b"ResB"):
+            raise Refused(f"{folder / name} is not an ICU resource file; "
+                          "fetch it again")
+        letter = "e" if content[9] else "b" if content[8] else "l"
+        kinds[letter, content[16]] = name
+    if len(kinds) > 1:
+        raise Refused(f"{' and '.join(sorted(kinds.values()))} in {folder} differ in "
+                      "byte order or format; take all four from one place")
+    letter, format = next(iter(kinds))
+    schema = folder / "icutzformat.txt"
+    return Icu(release_in(folder, files, letter), letter, format,
+               first_word(schema) if schema.exists() else "", files)
+
+
+def release_in(folder: Path, files: dict[str, bytes], letter: str) -> str:
+    """The release that zoneinfo64.res tells; derb has to be able to read all four."""
+    with tempfile.TemporaryDirectory(prefix=NAME) as work:
+        for name, content in files.items():
+            remedy = f"{folder / name} is damaged: fetch it again"
+            Path(work, name).write_bytes(content)
+            if letter != HERE:
+                output("icupkg", f"-t{HERE}", name, folder=Path(work), remedy=remedy)
+            text = output("derb", "-c", "-s", work, name, folder=Path(work),
+                          remedy=remedy)
+        found = re.search(r'^    TZVersion *\{ *"([^"\n]*)" *\}', text, re.MULTILINE)
+    if not found:
+        raise Refused(f"{folder}/zoneinfo64.res has no TZVersion; fetch it again")
+    return release_of(found[1], f"{folder}/zoneinfo64.res")
+
+
+def same_release(rules: Rules, icu: Icu):
+    if rules.release != icu.release:
+        raise Refused(f"the rules are {rules.release} and the ICU data is "
+                      f"{icu.release}; take both from one release")
+
+
+def fitting_schema(schema: str, icu: Icu, whose: str):
+    """`schema` is that of a system."""
+    if not re.fullmatch("[0-9]+[lbe]", schema):
+        raise Refused(f"{whose} is '{schema[:40]}', which is not an ICU schema; "
+                      "expected is one like 44l")
+    if icu.schema not in ("", schema):
+        raise Refused(f"the ICU data has the schema {icu.schema}, and {whose} is "
+                      f"{schema}; take ICU data that was made for {schema}")
+    if icu.letter != schema[-1]:
+        raise Refused(f"the ICU data has the byte order '{icu.letter}', and {whose} "
+                      f"is {schema}; take the files for '{schema[-1]}'")
+
+
+# --- Making -----------------------------------------------------------------------
+
+
+@contextlib.contextmanager
+def new(place: Path) -> Iterator[Path]:
+    """A directory that gets its name when everything in it is there; otherwise nothing
+    is left of it."""
+    if not place.parent.is_dir():
+        raise Refused(f"{place.parent} is not a directory; make it first")
+    if os.path.lexists(place):
+        raise Refused(f"{place} is there already; remove it, or choose another")
+    # Tools are run elsewhere and therefore get absolute paths.
+    begun = Path(tempfile.mkdtemp(prefix=f".{place.name}.",
+                                  dir=place.parent.absolute()))
+    try:
+        yield begun
+        settle(begun)
+        begun.rename(place)
+    finally:
+        shutil.rmtree(begun, ignore_errors=True)
+
+
+def settle(root: Path):
+    """Modes with which readers, and the boot program, can use it; owners if possible;
+    times only if they are asked for, in the way that other builds have it."""
+    moment = os.environ.get("SOURCE_DATE_EPOCH", "")
+    for folder, _, names in os.walk(root, topdown=False):
+        for path in [os.path.join(folder, name) for name in names] + [folder]:
+            os.chmod(path, 0o755 if path == folder else 0o644)
+            if os.geteuid() == 0:
+                os.chown(path, 0, 0)
+            if moment.isdecimal():
+                os.utime(path, (int(moment), int(moment)))
+
+
+def make_tree(rules: Rules, tree: Path):
+    """Compiles the rules."""
+    tree.mkdir()
+    with tempfile.TemporaryDirectory(prefix=NAME) as work:
+        for name, content in rules.files.items():
+            Path(work, name).write_bytes(content)
+        output("zic", "-b", "slim", "-d", tree, *rules.compiled, folder=Path(work),
+               remedy="correct the rules")
+    for folder, folders, names in os.walk(tree):
+        for name in folders + names:
+            path = Path(folder, name)
+            if not re.fullmatch(r"[A-Za-z0-9._+-]+", name) or (
+                    folder == str(tree) and name in (*TABLES, "+VERSION")):
+                raise Refused("the rules have a zone with the name "
+                              f"'{path.relative_to(tree)}', which cannot be used; "
+                              "correct them")
+            # zic does not take a link without a target as an error.
+            if path.is_symlink():
+                raise Refused("the rules have a link without its target, "
+                              f"'{path.relative_to(tree)}'; correct them")
+    if not any(path.is_file() for path in tree.rglob("*")):
+        raise Refused("the rules have no zone; name a release of the rules")
+    for name in TABLES:
+        if name in rules.files:
+            (tree / name).write_bytes(rules.files[name])
+    (tree / "+VERSION").write_text(f"{rules.release}\n")
+
+
+def make_icu(icu: Icu, schema: str, folder: Path):
+    """Packs the resource files, and keeps them: stock ICU reads these, not the pack."""
+    folder.mkdir()
+    for name, content in icu.files.items():
+        (folder / name).write_bytes(content)
+    with tempfile.TemporaryDirectory(prefix=NAME) as work:
+        Path(work, "list.txt").write_text("\n".join(icu.files) + "\n")
+        output("icupkg", f"-t{icu.letter}", "-s", folder, "-a", f"{work}/list.txt",
+               "new", f"icutz{schema}.dat", folder=folder,
+               remedy="take the four files as ICU publishes them")
+
+
+# --- Comparing --------------------------------------------------------------------
+
+
+def zones_in(tree: Path) -> dict[str, bytes]:
+    """Every zone by every name that it has, links included."""
+    zones = {}
+    for folder, folders, names in os.walk(tree):
+        inside = Path(folder).relative_to(tree)
+        if folder == str(tree):
+            # Other clocks and this machine's own zone, as distributions have them.
+            folders[:] = [name for name in folders if name not in ("posix", "right")]
+            names = [name for name in names if name not in ("localtime", "posixrules")]
+        for name in names:
+            path = Path(folder, name)
+            if path.is_file() and path.stat().st_size <= LARGEST:
+                content = path.read_bytes()
+                if content.startswith(b"TZif"):
+                    zones[str(inside / name)] = content
+    return zones
+
+
+def differing(old: Path, new: Path, since: int, years: int) -> dict[str, list[str]]:
+    """Names of zones that differ from a moment on, for so many years."""
+    before, after = zones_in(old), zones_in(new)
+    # Most are the same to the byte, and many have several names.
+    pairs = {}
+    for name in sorted(before.keys() & after.keys()):
+        if before[name] != after[name]:
+            pairs.setdefault((before[name], after[name]), []).append(name)
+    chosen = [names[0] for names in pairs.values()]
+    changed = []
+    if chosen:
+        until = since + years * 31556952
+        was, now = (clocks(tree, chosen, since, until) for tree in (old, new))
+        changed = [name for names, *clock in zip(pairs.values(), was, now)
+                   if clock[0] != clock[1] for name in names]
+    return {"changed": sorted(changed), "added": sorted(after.keys() - before.keys()),
+            "removed": sorted(before.keys() - after.keys())}
+
+
+def clocks(tree: Path, names: list[str], since: int, until: int) -> list[str]:
+    """For each zone its offset at the beginning and its changes until the end."""
+    text = output("zdump", "-i", "-t", f"{since},{until}", *names, folder=tree,
+                  remedy=f"check the zones in {tree}", TZDIR=str(tree.absolute()))
+    found = re.split(r'^TZ="[^\n]*\n', text, flags=re.MULTILINE)[1:]
+    if len(found) != len(names):
+        raise Refused(f"zdump cannot read the zones in {tree}; check that tree")
+    # Between two zones there is an empty line.
+    return [clock.strip("\n") for clock in found]
