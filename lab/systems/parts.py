@@ -30,6 +30,7 @@ class Processor(NamedTuple):
     """A Debian architecture, the preset that builds for it, and the machine."""
     name: str
     preset: str
+    compiler: str
     qemu: tuple[str, ...]
     console: str
 
@@ -43,9 +44,9 @@ class Processor(NamedTuple):
         return kernel
 
 
-AMD64 = Processor("amd64", "release", ("qemu-system-x86_64", "-M", "q35"), "ttyS0")
-ARM64 = Processor("arm64", "arm64-release", ("qemu-system-aarch64", "-M", "virt",
-                                             "-cpu", "cortex-a57"), "ttyAMA0")
+AMD64 = Processor("amd64", "release", "gcc", ("qemu-system-x86_64", "-M", "q35"), "ttyS0")
+ARM64 = Processor("arm64", "arm64-release", "aarch64-linux-gnu-gcc", (
+    "qemu-system-aarch64", "-M", "virt", "-cpu", "cortex-a57"), "ttyAMA0")
 
 
 def prepare(processor=AMD64):
@@ -98,6 +99,7 @@ def package(processor=AMD64) -> Path:
 
 
 IMAGE = r"""
+umask 022
 place=$1 package=$2 guest=$3 data=$4 megabytes=$5
 root=$place/root
 rm -rf "$root"
@@ -111,6 +113,9 @@ mkdir -p "$root/usr/share/icu" "$root/usr/lib/lab/data"
 cp -R "$data/system/icu/." "$root/usr/share/icu"
 cp -R "$data/update" "$data/refused" "$root/usr/lib/lab/data"
 cp "$package" "$root/usr/lib/lab"
+mkdir "$root/usr/lib/lab/probe"
+mv "$place/marlin" "$root/usr/lib/lab/probe"
+(umask 077; echo secret >"$root/root/secret")
 ln -sfn /var/db/timezone/localtime "$root/etc/localtime"
 rm -f "$root/etc/fstab"
 printf '%032d\n' 1 >"$root/etc/machine-id"
@@ -124,6 +129,9 @@ rm -rf "$root"
 
 def make_image(processor: Processor):
     """In a user namespace: whoever runs this owns all, as root."""
+    # In marlin's place it has to have its name.
+    run(processor.compiler, "-static", "-O1", "-o", processor.place / "marlin",
+        PROJECT / "packaging/probe.c")
     run("bwrap", "--unshare-user", "--uid", 0, "--gid", 0, "--dev-bind", "/", "/",
         "sh", "-euc", IMAGE, "-", processor.place, package(processor), GUEST,
         data.TARGET, MEGABYTES)
