@@ -14,7 +14,7 @@ from dataclasses import dataclass
 from pathlib import Path
 
 from lab.carriers import image
-from lab.systems.parts import AMD64, Processor, copy_of_image, room
+from lab.systems.parts import AMD64, Processor, make_image, room
 
 SECONDS = 240  # a boot that takes longer hangs
 UNIT = "marlin.service"
@@ -45,6 +45,10 @@ class Seen:
         return [entry for entry in self.journal
                 if all(entry.get(name) == value for name, value in fields.items())]
 
+    def failed(self) -> list[str]:
+        """The units that failed."""
+        return [line.split()[0] for line in self.text("failed").splitlines()]
+
     def at(self, unit: str, what: str) -> int:
         """A unit's time in microseconds since power-on, 0 if it never was."""
         return int(self.units[unit].get(what + "TimestampMonotonic") or 0)
@@ -57,25 +61,22 @@ def message(entry: dict) -> str:
 
 
 class System:
-    """In a directory of its own."""
+    """In a directory of its own. `script` and `apart` are those of make_image."""
 
-    def __init__(self, name: str, processor: Processor = AMD64):
+    def __init__(self, name: str, script="", apart="", megabytes=32,
+                 processor: Processor = AMD64):
         self.processor = processor
         self.directory = room(processor.place / "scenes" / name)
         self.root, self.told, self.third = (
             self.directory / name for name in ("system.img", "told.tar", "third.img"))
-        copy_of_image(processor, self.directory)
-        self.boots: list[Seen] = []
+        make_image(processor, self.root, script, apart, self.third, megabytes)
 
-    def put(self, files: dict[str, str]):
-        """Writes files to the root's image, whose directories are there."""
+    def replace(self, path: str, text: str):
+        """A file of the root, while the system is off."""
+        file = self.directory / "file"
+        file.write_text(text)
         image.replay_journal(self.root)
-        requests = []
-        for number, (path, text) in enumerate(files.items()):
-            file = self.directory / f"put-{number}"
-            file.write_text(text)
-            requests += [f"write {file} {path}"]
-        image.debugfs_quietly(self.root, *requests)
+        image.debugfs(self.root, f"rm {path}", f"write {file} {path}", write=True)
 
     def command(self, options: str, more: tuple[str, ...]) -> list[str]:
         parameters = (f"console={self.processor.console} root=/dev/nvme0n1 loglevel=4 "
@@ -117,7 +118,6 @@ class System:
         except (KeyError, tarfile.TarError) as reason:
             raise RuntimeError(f"the system told nothing ({status}; {reason}):\n"
                                + printed[-6000:]) from reason
-        self.boots.append(seen)
         return seen
 
 

@@ -1,7 +1,7 @@
 # SPDX-License-Identifier: BSD-2-Clause
 """What a system is made of: a Debian root with systemd, Debian's kernel, the package
-as it ships, and the demonstration's real data. All of it is made once, in the folder
-"build"; of the root's image every system has a copy."""
+as it ships, and the demonstration's real data. The first two are fetched once, into the
+folder "build"; each system has a disk of its own."""
 
 import fcntl
 import shutil
@@ -18,8 +18,7 @@ from lab.places import BUILD, PROJECT
 
 WORK = BUILD / "systems"
 GUEST = Path(__file__).parent / "guest"
-ROOT_PACKAGES = "systemd,systemd-sysv,udev,tzdata,dbus,kmod,dash"
-MEGABYTES = 512
+ROOT_PACKAGES = "apparmor,dbus,systemd,systemd-sysv,tzdata,udev"
 # Nobody asks these systems anything, and nobody reads on them.
 LEFT_OUT = [word for place in ("doc", "info", "locale", "man", "lintian")
             for word in (f"--dpkgopt=path-exclude=/usr/share/{place}/*",
@@ -69,7 +68,9 @@ def prepare(processor=AMD64):
             raise Unavailable(f"no Debian system can be made: {reason}") from reason
         data.prepare()
         make_package(processor)
-        make_image(processor)
+        # In marlin's place it has to have its name.
+        run(processor.compiler, "-static", "-O1", "-Wall", "-o", place / "marlin",
+            PROJECT / "packaging/probe.c")
 
 
 def tell(text: str):
@@ -100,46 +101,58 @@ def package(processor=AMD64) -> Path:
 
 IMAGE = r"""
 umask 022
-place=$1 package=$2 guest=$3 data=$4 megabytes=$5
-root=$place/root
+place=$1 guest=$2 data=$3 package=$4 image=$5 script=$6 apart=$7 third=$8 mb=$9
+root=$(dirname "$image")/root
 rm -rf "$root"
 mkdir "$root"
 tar -x -f "$place/root.tar" -C "$root" --no-same-owner --exclude='./dev/*'
 dpkg --root="$root" --force-script-chrootless --force-architecture --log=/dev/null \
   --install "$package"
 cp -R "$guest/." "$root"
-cp -R "$data/system/zoneinfo" "$root/usr/share/zoneinfo.default"
-mkdir -p "$root/usr/share/icu" "$root/usr/lib/lab/data"
-cp -R "$data/system/icu/." "$root/usr/share/icu"
-cp -R "$data/update" "$data/refused" "$root/usr/lib/lab/data"
-cp "$package" "$root/usr/lib/lab"
-mkdir "$root/usr/lib/lab/probe"
-mv "$place/marlin" "$root/usr/lib/lab/probe"
-(umask 077; echo secret >"$root/root/secret")
-ln -sfn /var/db/timezone/localtime "$root/etc/localtime"
-rm -f "$root/etc/fstab"
-printf '%032d\n' 1 >"$root/etc/machine-id"
-printf 'installer:x:1001:1001::/:/bin/sh\n' >>"$root/etc/passwd"
-rm -f "$place/system.img"
-mke2fs -q -t ext4 -b 4096 -m 0 -E root_owner=0:0,lazy_itable_init=0 \
-  -d "$root" "$place/system.img" "${megabytes}M"
+cd "$root"
+cp -R "$data/system/zoneinfo" usr/share/zoneinfo.default
+mkdir -p usr/share/icu usr/lib/lab/data usr/lib/lab/probe
+cp -R "$data/system/icu/." usr/share/icu
+cp -R "$data/update" "$data/refused" usr/lib/lab/data
+cp "$package" usr/lib/lab
+cp "$place/marlin" usr/lib/lab/probe
+cp "$place/packages/bin/busybox" usr/lib/lab
+(umask 077; echo secret >root/secret)
+ln -sfn /var/db/timezone/localtime etc/localtime
+rm -f etc/fstab
+# These take time, and nobody waits for them.
+for unit in apparmor.service dbus.socket dpkg-db-backup.timer e2scrub_all.timer \
+  fstrim.timer systemd-binfmt.service systemd-hwdb-update.service \
+  systemd-pstore.service systemd-random-seed.service systemd-tmpfiles-clean.timer \
+  systemd-update-utmp.service; do
+  ln -s /dev/null etc/systemd/system/$unit
+done
+printf '%032d\n' 1 >etc/machine-id
+printf 'installer:x:1001:1001::/:/bin/sh\n' >>etc/passwd
+eval "$script"
+make() {
+  rm -f "$1"
+  mke2fs -q -t ext4 -b 4096 -m 0 -E root_owner=0:0,lazy_itable_init=0 -d "$2" "$1" "$3"
+}
+if [ -n "$apart" ]; then
+  make "$third" "$apart" "${mb}M"
+  rm -rf "$apart"
+  mkdir "$apart"
+fi
+cd /
+make "$image" "$root" 512M
 rm -rf "$root"
 """
 
 
-def make_image(processor: Processor):
-    """In a user namespace: whoever runs this owns all, as root."""
-    # In marlin's place it has to have its name.
-    run(processor.compiler, "-static", "-O1", "-o", processor.place / "marlin",
-        PROJECT / "packaging/probe.c")
+def make_image(processor: Processor, image: Path, script="", apart="",
+               third: Path | None = None, megabytes=32):
+    """A system's disk, after a shell did what the script says in its root directory;
+    what is below the directory `apart` goes to a disk of its own. In a user namespace:
+    whoever runs this owns all, as root."""
     run("bwrap", "--unshare-user", "--uid", 0, "--gid", 0, "--dev-bind", "/", "/",
-        "sh", "-euc", IMAGE, "-", processor.place, package(processor), GUEST,
-        data.TARGET, MEGABYTES)
-
-
-def copy_of_image(processor: Processor, place: Path):
-    place.mkdir(parents=True, exist_ok=True)
-    run("cp", "--sparse=always", processor.place / "system.img", place / "system.img")
+        "sh", "-euc", IMAGE, "-", processor.place, GUEST, data.TARGET,
+        package(processor), image, script, apart, third or "", megabytes)
 
 
 def room(place: Path) -> Path:
