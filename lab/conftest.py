@@ -62,7 +62,8 @@ def count(request):
 def pytest_runtest_makereport(item, call):
     report = (yield).get_result()
     if report.failed:
-        door = "device --tests" if "lab/emulator/" in report.nodeid else "prove"
+        door = ("device --tests" if "lab/emulator/" in report.nodeid else
+                "device --systems" if "lab/systems/" in report.nodeid else "prove")
         report.sections.append(
             ("Alone", f"scripts/{door} {shlex.quote(report.nodeid)}"))
 

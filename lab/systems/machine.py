@@ -30,12 +30,10 @@ class Seen:
     console: str
 
     def __post_init__(self):
-        blocks = self.files["units"].decode().strip().split("\n\n")
         told = [dict(line.split("=", 1) for line in block.splitlines())
-                for block in blocks]
+                for block in self.text("units").strip().split("\n\n")]
         self.units = {block.get("Id", ""): block for block in told}
-        self.journal = [json.loads(line)
-                        for line in self.files["journal"].splitlines()]
+        self.journal = [json.loads(line) for line in self.text("journal").splitlines()]
 
     def text(self, name: str) -> str:
         return self.files.get(name, b"").decode(errors="replace")
@@ -61,15 +59,14 @@ def message(entry: dict) -> str:
 
 
 class System:
-    """In a directory of its own. `script` and `apart` are those of make_image."""
+    """In a directory of its own. `script` and the rest are for make_image."""
 
-    def __init__(self, name: str, script="", apart="", megabytes=32,
-                 processor: Processor = AMD64):
+    def __init__(self, name: str, script="", processor: Processor = AMD64, **how):
         self.processor = processor
         self.directory = room(processor.place / "scenes" / name)
         self.root, self.told, self.third = (
             self.directory / name for name in ("system.img", "told.tar", "third.img"))
-        make_image(processor, self.root, script, apart, self.third, megabytes)
+        make_image(processor, self.root, script, third=self.third, **how)
 
     def replace(self, path: str, text: str):
         """A file of the root, while the system is off."""
@@ -105,20 +102,34 @@ class System:
         console = self.directory / "console"
         console.unlink(missing_ok=True)
         started = time.monotonic()
-        try:
-            done = subprocess.run(self.command(options, more), timeout=seconds,
-                                  stdin=subprocess.DEVNULL, check=False)
-            status = f"the emulator ended with status {done.returncode}"
-        except subprocess.TimeoutExpired:
-            status = f"nothing after {seconds} s"
+        status = self.emulate(self.command(options, more), console, seconds)
         took = time.monotonic() - started
-        printed = console.read_text(errors="replace") if console.exists() else ""
+        printed = text_of(console)
         try:
             seen = Seen(took, *look(self.told), printed)
         except (KeyError, tarfile.TarError) as reason:
             raise RuntimeError(f"the system told nothing ({status}; {reason}):\n"
                                + printed[-6000:]) from reason
         return seen
+
+    @staticmethod
+    def emulate(command: list[str], console: Path, seconds: float) -> str:
+        """Until the system is off, or has told all and does not end."""
+        emulator = subprocess.Popen(command, stdin=subprocess.DEVNULL)
+        end = time.monotonic() + seconds
+        while emulator.poll() is None and time.monotonic() < end:
+            if "lab: all is told" in text_of(console):
+                end = min(end, time.monotonic() + 10)
+            time.sleep(0.2)
+        if emulator.poll() is not None:
+            return f"the emulator ended with status {emulator.returncode}"
+        emulator.kill()
+        emulator.wait()
+        return f"nothing after {seconds} s"
+
+
+def text_of(file: Path) -> str:
+    return file.read_text(errors="replace") if file.exists() else ""
 
 
 def look(told: Path):
@@ -137,5 +148,5 @@ def look(told: Path):
                     links[path] = entry.linkname
                 elif entry.isfile():
                     files[path] = archive.extractfile(entry).read()
-    files["units"], files["journal"]
+    files["reader"]  # which every system tells
     return files, links, owners

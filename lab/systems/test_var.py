@@ -2,8 +2,9 @@
 """Systems with "/var" on a disk of its own: beside a read-only root, and late."""
 
 from lab import lines
-from lab.systems.machine import System
-from lab.systems.scene import device, insist, install_update_here, linked, names
+from lab.systems.machine import UNIT, System, message
+from lab.systems.scene import (device, fail, insist, install_update_here, linked,
+                               names)
 
 VAR = "/dev/nvme0n3 /var ext4 {} 0 0\n"
 LATE = """[Unit]
@@ -51,5 +52,8 @@ def test_var_is_late_and_then_missing():
     system.third.unlink()
     system.replace("/etc/fstab", VAR.format("nofail,x-systemd.device-timeout=3s"))
     seen = system.boot()
-    print(seen.units, [e.get("MESSAGE") for e in seen.said_by(UNIT="marlin.service")])
-    assert 0
+    told = [message(entry) for entry in seen.said_by(UNIT=UNIT)]
+    fail(seen, [f"the journal does not tell why: {told}"] * (
+        not any("Dependency failed" in text for text in told)) + [
+            f"after {UNIT}: {unit} failed" for unit in seen.failed()])
+    assert seen.units[UNIT]["ActiveState"] == "inactive" and seen.links == {}
