@@ -60,8 +60,8 @@ KNOWN = set("""
     MemoryDenyWriteExecute SystemCallArchitectures SystemCallErrorNumber
     SystemCallFilter KeyringMode ProtectHome ProtectProc ProtectClock
     ProtectControlGroups ProtectKernelLogs ProtectKernelModules ProtectKernelTunables
-    PrivateNetwork IPAddressDeny RestrictAddressFamilies LockPersonality
-    RestrictNamespaces RestrictRealtime RestrictSUIDSGID
+    PrivateMounts PrivateNetwork IPAddressDeny RestrictAddressFamilies
+    LockPersonality RestrictNamespaces RestrictRealtime RestrictSUIDSGID
 """.split())
 
 
