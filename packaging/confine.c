@@ -94,7 +94,11 @@ static void hide_paths(void) {
 }
 
 static void limit_memory(void) {
-  const struct rlimit all = {MEMORY, MEMORY}, none = {0, 0};
+  const struct rlimit none = {0, 0};
+  struct rlimit all;
+  must(getrlimit(RLIMIT_AS, &all), "memory");
+  // A test may have set a smaller one.
+  if (all.rlim_max > MEMORY) all.rlim_cur = all.rlim_max = MEMORY;
   must(setrlimit(RLIMIT_AS, &all), "memory");
   must(setrlimit(RLIMIT_CORE, &none), "core");
 }

@@ -77,7 +77,7 @@ class System:
 
     def command(self, options: str, more: tuple[str, ...]) -> list[str]:
         parameters = (f"console={self.processor.console} root=/dev/nvme0n1 loglevel=4 "
-                      "systemd.unit=lab.target panic=-1 "
+                      "systemd.unit=lab.target panic=-1 no_timer_check "
                       f"{'' if ' ro ' in f' {options} ' else 'rw '}{options}")
         disks = [self.root, self.told] + [self.third] * self.third.exists()
         return [*self.processor.qemu, "-accel", "tcg", "-m", "512", "-nodefaults",
