@@ -13,6 +13,7 @@ from lab.paths import DOWNLOADS
 from lab.seen import Seen
 from lab.trial import entry_differences, expected, fail, log_differences, trial
 
+
 def test_a_new_device_boots():
     """It does not have the two directories yet."""
     device = Device()

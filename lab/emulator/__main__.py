@@ -36,8 +36,8 @@ def main() -> int:
                       "power at N random instants, and checks what is left")
     mode.add_argument("--boot-cost", action="store_true",
                       help="measures the part of a boot that the pass takes")
-    mode.add_argument("--systems", nargs="*", metavar="TEST", help="Debian systems with "
-                      "the package: the boot unit, other init systems; or these tests")
+    mode.add_argument("--systems", nargs="*", metavar="TEST", help="Debian systems "
+                      "with the package: the boot unit, other inits; or these tests")
     mode.add_argument("--unit-cost", choices=["amd64", "arm64"],
                       help="measures what each restriction of the boot unit costs")
     parser.add_argument("--quick", action="store_true",

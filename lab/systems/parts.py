@@ -43,7 +43,8 @@ class Processor(NamedTuple):
         return kernel
 
 
-AMD64 = Processor("amd64", "release", "gcc", ("qemu-system-x86_64", "-M", "q35"), "ttyS0")
+AMD64 = Processor("amd64", "release", "gcc", (
+    "qemu-system-x86_64", "-M", "q35"), "ttyS0")
 ARM64 = Processor("arm64", "arm64-release", "aarch64-linux-gnu-gcc", (
     "qemu-system-aarch64", "-M", "virt", "-cpu", "cortex-a57"), "ttyAMA0")
 PROCESSORS = {processor.name: processor for processor in (AMD64, ARM64)}
@@ -66,7 +67,9 @@ def prepare(processor=AMD64):
                 tell("Making a Debian system, in a minute or two")
                 make_root(processor)
         except RuntimeError as reason:
-            raise Unavailable(f"no Debian system can be made: {reason}") from reason
+            why = str(reason).strip().splitlines()[-1]
+            raise Unavailable("no Debian system can be made here, which takes a mirror "
+                              f"of Debian: {why}") from reason
         data.prepare()
         make_package(processor)
         # In marlin's place it has to have its name.

@@ -1,5 +1,5 @@
 # SPDX-License-Identifier: BSD-2-Clause
-"""What must be seen of every boot of a system, and the words that scenes are told in."""
+"""What must be seen of every boot of a system, and the words that scenes use."""
 
 import re
 

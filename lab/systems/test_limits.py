@@ -1,10 +1,9 @@
 # SPDX-License-Identifier: BSD-2-Clause
 """Boots under the unit's limits and restrictions."""
 
-from lab import lines
 from lab.paths import DOWNLOADS
 from lab.systems.machine import UNIT, System, message
-from lab.systems.scene import (ZONE, device, fail, insist, install_update_here, linked,
+from lab.systems.scene import (device, fail, insist, install_update_here, linked,
                                names)
 
 TERABYTE = "truncate -s 1T .{tree}/zoneinfo/+VERSION"
@@ -46,7 +45,6 @@ SuccessExitStatus=1
 
 def test_full_var():
     """Links fit into their inodes; only the record finds no room."""
-    update = names().update
     system = System("full-var", f"""
         {install_update_here()} {linked(device(announced=True))}
         echo '/dev/nvme0n3 /var ext4 defaults 0 0' >etc/fstab

@@ -23,7 +23,8 @@ def test_an_update_on_a_disk_that_never_answers():
     system = System("never-answers", f"""
         {install_update_here()} {linked(device(announced=True))}
         echo '/dev/nvme1n1 {place} ext4 ro 0 0' >etc/fstab
-        cat >etc/systemd/system/used-up.service <<'END'\n{USED_UP.format(place=place)}END
+        cat >etc/systemd/system/used-up.service <<'END'
+{USED_UP.format(place=place)}END
         mkdir -p etc/systemd/system/sysinit.target.wants
         ln -s ../used-up.service etc/systemd/system/sysinit.target.wants
         """, apart="." + place)
