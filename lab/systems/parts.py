@@ -83,7 +83,9 @@ def tell(text: str):
 
 def make_root(processor: Processor, tree="root", packages=ROOT_PACKAGES):
     made = processor.place / f"{tree}.new.tar"
-    run("mmdebstrap", "--quiet", "--variant=essential",
+    # Programs of another processor cannot run here: packages are only unpacked.
+    native = run("dpkg", "--print-architecture").strip() == processor.name
+    run("mmdebstrap", "--quiet", f"--variant={'essential' if native else 'extract'}",
         f"--architectures={processor.name}", f"--include={packages}",
         "--aptopt=Acquire::Languages \"none\"", *LEFT_OUT, "bookworm", made)
     made.rename(processor.place / f"{tree}.tar")
@@ -125,6 +127,10 @@ cp "$place/packages/bin/busybox" usr/lib/lab
 (umask 077; echo secret >root/secret)
 ln -sfn /var/db/timezone/localtime etc/localtime
 rm -f etc/fstab
+for file in passwd group; do
+  [ -e etc/$file ] || cp usr/share/base-passwd/$file.master etc/$file
+done
+[ -e usr/bin/sh ] || ln -s dash usr/bin/sh
 # These take time, and nobody waits for them.
 for unit in apparmor.service dbus.socket dpkg-db-backup.timer e2scrub_all.timer \
   fstrim.timer systemd-binfmt.service systemd-hwdb-update.service \
