@@ -80,7 +80,7 @@ class System:
                       "systemd.unit=lab.target panic=-1 no_timer_check "
                       f"{'' if ' ro ' in f' {options} ' else 'rw '}{options}")
         disks = [self.root, self.told] + [self.third] * self.third.exists()
-        return [*self.processor.qemu, "-accel", "tcg", "-m", "512", "-nodefaults",
+        return [*self.processor.qemu, "-accel", "tcg", "-m", "1024", "-nodefaults",
                 "-no-reboot", "-display", "none",
                 "-serial", f"file:{self.directory}/console",
                 "-kernel", str(self.processor.kernel), "-append", parameters,

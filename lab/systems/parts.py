@@ -45,15 +45,11 @@ class Processor(NamedTuple):
 
 AMD64 = Processor("amd64", "release", "gcc", (
     "qemu-system-x86_64", "-M", "q35"), "ttyS0")
-ARM64 = Processor("arm64", "arm64-release", "aarch64-linux-gnu-gcc", (
-    "qemu-system-aarch64", "-M", "virt", "-cpu", "cortex-a57"), "ttyAMA0")
-PROCESSORS = {processor.name: processor for processor in (AMD64, ARM64)}
 
 
 def prepare(processor=AMD64):
     """Builds and fetches what is missing; or raises Unavailable."""
-    if subprocess.call([PROJECT / "scripts/packages", "build", "arm64", "demo",
-                        "device", "systems"]):
+    if subprocess.call([PROJECT / "scripts/packages", "build", "demo", "systems"]):
         raise Unavailable("packages are missing")
     place = processor.place
     place.mkdir(parents=True, exist_ok=True)
@@ -83,9 +79,7 @@ def tell(text: str):
 
 def make_root(processor: Processor, tree="root", packages=ROOT_PACKAGES):
     made = processor.place / f"{tree}.new.tar"
-    # Programs of another processor cannot run here: packages are only unpacked.
-    native = run("dpkg", "--print-architecture").strip() == processor.name
-    run("mmdebstrap", "--quiet", f"--variant={'essential' if native else 'extract'}",
+    run("mmdebstrap", "--quiet", "--variant=essential",
         f"--architectures={processor.name}", f"--include={packages}",
         "--aptopt=Acquire::Languages \"none\"", *LEFT_OUT, "bookworm", made)
     made.rename(processor.place / f"{tree}.tar")
@@ -127,10 +121,6 @@ cp "$place/packages/bin/busybox" usr/lib/lab
 (umask 077; echo secret >root/secret)
 ln -sfn /var/db/timezone/localtime etc/localtime
 rm -f etc/fstab
-for file in passwd group; do
-  [ -e etc/$file ] || cp usr/share/base-passwd/$file.master etc/$file
-done
-[ -e usr/bin/sh ] || ln -s dash usr/bin/sh
 # These take time, and nobody waits for them.
 for unit in apparmor.service dbus.socket dpkg-db-backup.timer e2scrub_all.timer \
   fstrim.timer systemd-binfmt.service systemd-hwdb-update.service \
