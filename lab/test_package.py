@@ -58,7 +58,7 @@ KNOWN = set("""
     SyslogLevelPrefix LimitAS LimitCORE User UMask CapabilityBoundingSet NoNewPrivileges
     ProtectSystem ReadWritePaths ReadOnlyPaths InaccessiblePaths DevicePolicy
     MemoryDenyWriteExecute SystemCallArchitectures SystemCallErrorNumber
-    SystemCallFilter KeyringMode ProtectHome ProtectProc ProtectClock
+    SystemCallFilter KeyringMode ProtectHome ProtectProc
     ProtectControlGroups ProtectKernelLogs ProtectKernelModules ProtectKernelTunables
     PrivateMounts PrivateNetwork IPAddressDeny RestrictAddressFamilies
     LockPersonality RestrictNamespaces RestrictRealtime RestrictSUIDSGID

@@ -11,6 +11,7 @@
 #include <string.h>
 #include <sys/mman.h>
 #include <sys/ptrace.h>
+#include <sys/resource.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <sys/syscall.h>
@@ -111,6 +112,15 @@ static void print_capabilities(void) {
     if (strncmp(line, "Cap", 3) == 0) fputs(line, stderr);
 }
 
+static void print_limits(void) {
+  struct rlimit memory = {0}, core = {0};
+  getrlimit(RLIMIT_AS, &memory);
+  getrlimit(RLIMIT_CORE, &core);
+  fprintf(stderr, "limit memory: %llu\nlimit core: %llu\n",
+          (unsigned long long)memory.rlim_max,
+          (unsigned long long)core.rlim_max);
+}
+
 // With arguments that would fail anyway, but for another reason.
 static void make_calls(void) {
   tell("call", "socket", socket(AF_UNIX, SOCK_STREAM, 0));
@@ -146,6 +156,7 @@ int main(int argc, char** argv) {
   for (EACH(kernel_files)) open_only("write", kernel_files[i], O_WRONLY);
   for (EACH(secrets)) open_only("read", secrets[i], O_RDONLY);
   print_capabilities();
+  print_limits();
   fputs("calls: next\n", stderr);
   make_calls();
   return 0;

@@ -64,7 +64,7 @@ UNITS = PROJECT / "packaging"
 # By the place that the filter of system calls, or an empty set of capabilities, has.
 FILTERS = ("LockPersonality", "MemoryDenyWriteExecute", "RestrictAddressFamilies",
            "RestrictNamespaces", "RestrictRealtime", "RestrictSUIDSGID")
-KERNEL = ("ProtectClock", "ProtectControlGroups", "ProtectKernelLogs",
+KERNEL = ("ProtectControlGroups", "ProtectKernelLogs",
           "ProtectKernelModules", "ProtectKernelTunables", "ProtectProc")
 NETWORK = ("PrivateNetwork", "IPAddressDeny")
 CALLS = ("SystemCallFilter", "SystemCallArchitectures", "SystemCallErrorNumber")

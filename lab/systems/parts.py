@@ -77,12 +77,12 @@ def tell(text: str):
     print(text, file=sys.stderr, flush=True)
 
 
-def make_root(processor: Processor, tree="root", packages=ROOT_PACKAGES):
-    made = processor.place / f"{tree}.new.tar"
+def make_root(processor: Processor):
+    made = processor.place / "root.new.tar"
     run("mmdebstrap", "--quiet", "--variant=essential",
-        f"--architectures={processor.name}", f"--include={packages}",
+        f"--architectures={processor.name}", f"--include={ROOT_PACKAGES}",
         "--aptopt=Acquire::Languages \"none\"", *LEFT_OUT, "bookworm", made)
-    made.rename(processor.place / f"{tree}.tar")
+    made.rename(processor.place / "root.tar")
 
 
 def make_package(processor: Processor):
@@ -102,11 +102,10 @@ def package(processor=AMD64) -> Path:
 IMAGE = r"""
 umask 022
 place=$1 guest=$2 data=$3 package=$4 image=$5 script=$6 apart=$7 third=$8 mb=$9
-tree=${10}
 root=$(dirname "$image")/root
 rm -rf "$root"
 mkdir "$root"
-tar -x -f "$place/$tree.tar" -C "$root" --no-same-owner --exclude='./dev/*'
+tar -x -f "$place/root.tar" -C "$root" --no-same-owner --exclude='./dev/*'
 dpkg --root="$root" --force-script-chrootless --force-architecture --log=/dev/null \
   --install "$package"
 cp -R "$guest/." "$root"
@@ -147,13 +146,13 @@ rm -rf "$root"
 
 
 def make_image(processor: Processor, image: Path, script="", apart="",
-               third: Path | None = None, megabytes=32, tree="root"):
+               third: Path | None = None, megabytes=32):
     """A system's disk, after a shell did what the script says in its root directory;
     what is below the directory `apart` goes to a disk of its own. In a user namespace:
     whoever runs this owns all, as root."""
     run("bwrap", "--unshare-user", "--uid", 0, "--gid", 0, "--dev-bind", "/", "/",
         "sh", "-euc", IMAGE, "-", processor.place, GUEST, data.TARGET,
-        package(processor), image, script, apart, third or "", megabytes, tree)
+        package(processor), image, script, apart, third or "", megabytes)
 
 
 def room(place: Path) -> Path:

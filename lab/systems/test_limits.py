@@ -10,13 +10,12 @@ TERABYTE = "truncate -s 1T .{tree}/zoneinfo/+VERSION"
 
 
 def test_a_terabyte_for_a_word():
-    """The word of an update is cut where the memory ends; the boot goes on. This kernel
-    promises any amount, as many devices' do, and ends who takes too much."""
+    """The word of an update is cut where the memory ends; the boot goes on."""
     update = names().update
     system = System("terabyte", f"""
         {install_update_here()} {linked(device(announced=True))}
         {TERABYTE.format(tree=DOWNLOADS + update)}""")
-    seen = system.boot(options="sysctl.vm.overcommit_memory=1")
+    seen = system.boot()
     insist(seen, (), device(active=True, announced=True), reader="14:00 CEST",
            record=f"{names().system}.1.0_{update}")
 

@@ -35,7 +35,7 @@ def test_from_its_first_boot_on():
         assert owner == (0o775, 1001, 1001)
         if not printed:
             elsewhere = [path for path in seen.text("changed").splitlines()
-                         if path != "/run"
+                         if path not in ("/dev", "/run")
                          and not path.startswith(("/var/db", "/var/log"))]
             fail(seen, [f"changed elsewhere: {path}" for path in elsewhere])
 

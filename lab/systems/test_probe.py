@@ -22,11 +22,16 @@ def results(seen: Seen, unit: str) -> dict[str, str]:
                 if ":" in message(entry))
 
 
+LIMITS = {"limit memory": str(640 << 20), "limit core": "0"}
+
+
 def shortcomings(tried: dict[str, str], may: set[str]) -> list[str]:
-    """What was not refused, or not even tried."""
+    """What was not refused, or not even tried, or has no limit."""
     done = {what for what, result in tried.items() if result == "done"}
     return ([f"{what}: done" for what in sorted(done - may)] +
             [f"{what}: {tried.get(what)}" for what in sorted(may - done)] +
+            [f"{what}: {tried.get(what)}" for what, limit in LIMITS.items()
+             if tried.get(what) != limit] +
             ["too little was tried"] * (len(tried) < 60))
 
 
