@@ -19,6 +19,8 @@ ln -sfn /usr/lib/lab/busybox usr/sbin/init
   echo '::wait:/usr/lib/lab/after'
 }} >etc/inittab
 """
+
+
 def printed(seen: Seen) -> list[str]:
     return [line.rstrip("\r") for line in seen.console.split("\n")
             if "marlin" in line and not line.startswith("[")]
