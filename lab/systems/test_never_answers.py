@@ -1,10 +1,13 @@
 # SPDX-License-Identifier: BSD-2-Clause
 """An update on a disk that never answers: the boot waits, but not long."""
 
+import pytest
+
 from lab.paths import DOWNLOADS
 from lab.systems.machine import UNIT, System
 from lab.systems.scene import device, insist, install_update_here, linked, names
 
+pytestmark = pytest.mark.rest
 # Once this is read, the emulator lets through a byte a second.
 USED_UP = """[Unit]
 DefaultDependencies=no

@@ -10,9 +10,8 @@ from lab.systems.scene import (NEW, ZONE, announce, device, fail, insist,
 
 # The file systems on disks; what was changed from the program's start on.
 CHANGED = f"""
-day=$(systemctl show --timestamp=unix --property=ExecMainStartTimestamp {UNIT})
-find / -xdev -newerct "@${{day#*@}}" ! -type d >/run/lab/seen/changed
-find / -xdev -newerct "@${{day#*@}}" -type d >>/run/lab/seen/changed
+day=$(systemctl show --timestamp=us+utc --property=ExecMainStartTimestamp {UNIT})
+find / -xdev -newerct "${{day#* }}" >/run/lab/seen/changed
 """
 
 

@@ -2,10 +2,13 @@
 """The package on a running system: installed, installed again, upgraded, masked,
 removed and purged, and the boots after that."""
 
+import pytest
+
 from lab.paths import ZONEINFO
 from lab.systems.machine import UNIT, System, message
 from lab.systems.scene import STARTING, device, fail, insist, linked
 
+pytestmark = pytest.mark.rest
 NEWER = """
 cd /run
 dpkg-deb -R /usr/lib/lab/marlin_*.deb newer
