@@ -119,6 +119,8 @@ STAGES = {
     "arm64": ("arm64: build without a warning, all tests under qemu-user",
               door("test", "arm64-dev")),
     "device": ("an emulated device: sequences of boots, power cuts", device),
+    "systems": ("real systems boot with the package: the unit holds",
+                door("device", "--systems", "--quick")),
     "proofs": ("the proofs, in short", door("prove", "--quick")),
 }
 

@@ -18,7 +18,8 @@ from lab.places import BUILD  # noqa: E402
 
 TALLY = {}
 # Of tests that scripts/prove cannot run.
-DOORS = {"lab/emulator/": "device --tests", "lab/readers/": "readers",
+DOORS = {"lab/emulator/": "device --tests", "lab/systems/": "device --systems",
+         "lab/readers/": "readers",
          "lab/test_recipe": "readers", "lab/test_image": "readers --image"}
 os.environ["PYTEST_CACHE"] = str(BUILD / "prove" / "pytest")  # for pytest.ini
 

@@ -44,8 +44,10 @@ CONTENT = dict(reversed(line.split(maxsplit=1)) for line in """
     644 /usr/share/doc/marlin/docs/integration.md
     644 /usr/share/doc/marlin/docs/proofs.md
     644 /usr/share/doc/marlin/docs/readers.md
+    644 /usr/share/doc/marlin/examples/apparmor
     755 /usr/share/doc/marlin/examples/init-script
     644 /usr/share/doc/marlin/examples/inittab
+    644 /usr/share/doc/marlin/examples/lean.conf
     644 /usr/share/doc/marlin/examples/marlin.service.d/mend.conf
     644 /usr/share/lintian/overrides/marlin
     644 /usr/share/man/man5/marlin-layout.5.gz
@@ -60,14 +62,14 @@ CONTENT = dict(reversed(line.split(maxsplit=1)) for line in """
 # to does not have anyway, or does not restrict. A new one fails until somebody has
 # thought about it.
 KNOWN = set("""
-    Type RemainAfterExit ExecStart TimeoutStartSec SyslogLevel User UMask
-    CapabilityBoundingSet NoNewPrivileges ProtectSystem ReadWritePaths ReadOnlyPaths
+    Type RemainAfterExit ExecStart TimeoutStartSec TimeoutStopSec SyslogLevel
+    SyslogLevelPrefix LimitAS LimitCORE User UMask CapabilityBoundingSet NoNewPrivileges
+    ProtectSystem ReadWritePaths ReadOnlyPaths InaccessiblePaths DevicePolicy
     MemoryDenyWriteExecute SystemCallArchitectures SystemCallErrorNumber
-    SystemCallFilter KeyringMode ProtectHome PrivateDevices PrivateMounts ProtectProc
-    ProcSubset ProtectClock ProtectControlGroups ProtectHostname ProtectKernelLogs
-    ProtectKernelModules ProtectKernelTunables PrivateNetwork IPAddressDeny
-    RestrictAddressFamilies PrivateIPC LockPersonality RestrictNamespaces
-    RestrictRealtime RestrictSUIDSGID
+    SystemCallFilter KeyringMode ProtectHome ProtectProc
+    ProtectControlGroups ProtectKernelLogs ProtectKernelModules ProtectKernelTunables
+    PrivateMounts PrivateNetwork IPAddressDeny RestrictAddressFamilies
+    LockPersonality RestrictNamespaces RestrictRealtime RestrictSUIDSGID
 """.split())
 
 
@@ -293,8 +295,16 @@ def test_tmpfiles_make_the_two_directories(package, unit):
     shutil.copytree(package.content / "usr", root / "usr", symlinks=True)
     in_user_namespace(0, "systemd-tmpfiles", f"--root={root}", "--create",
                       "marlin.conf")
-    for directory in ("var/db/timezone", "var/db/timezone/tz"):
-        assert (root / directory).stat().st_mode == 0o40755
+    directories = root / "var/db/timezone", root / "var/db/timezone/tz"
+    for directory in directories:
+        assert directory.stat().st_mode == 0o40755
+    # What somebody chose stays.
+    for directory in directories:
+        directory.chmod(0o2770)
+    in_user_namespace(0, "systemd-tmpfiles", f"--root={root}", "--create",
+                      "marlin.conf")
+    for directory in directories:
+        assert directory.stat().st_mode == 0o42770
 
 
 @pytest.mark.parametrize("example, arguments", [("init-script", "start"),
@@ -364,21 +374,27 @@ def test_every_restriction_of_the_unit_is_known(unit):
 # --- Boots under the unit's restrictions ---------------------------------------------
 
 
+def confinement(place: Path, unit: str, visible="") -> Path:
+    """A program that starts "marlin.real" beside it under the unit's restrictions,
+    except that one of the hidden paths may be visible."""
+    lists = {"ALLOWED_CALLS": values(unit, "SystemCallFilter"),
+             "WRITABLE_PATHS": values(unit, "ReadWritePaths"),
+             "READ_ONLY_PATHS": values(unit, "ReadOnlyPaths"),
+             "HIDDEN_PATHS": [path for path in values(unit, "InaccessiblePaths")
+                              if path != visible]}
+    [limit] = values(unit, "LimitAS")
+    program = fresh(place) / "marlin"
+    compiled(program, "confine.c", "-lseccomp",
+             f"-DMEMORY={limit.removesuffix('M')}ul<<20", *(
+                 f"-D{name}=" + ",".join(f'"{word.removeprefix("-")}"'
+                                         for word in words)
+                 for name, words in lists.items()))
+    return program
+
+
 @pytest.fixture(scope="module")
 def confined(package, unit) -> Path:
-    """A program that starts "marlin.real" beside it under the unit's restrictions."""
-    # What systemd adds to every list.
-    calls = re.findall(r"^ +([a-z][a-z0-9_]*)$",
-                       run("systemd-analyze", "syscall-filter", "@default"), re.M)
-    assert "execve" in calls
-    lists = {"ALLOWED_CALLS": calls + values(unit, "SystemCallFilter"),
-             "WRITABLE_PATHS": values(unit, "ReadWritePaths"),
-             "READ_ONLY_PATHS": values(unit, "ReadOnlyPaths")}
-    program = fresh(package.work / "confined") / "marlin"
-    compiled(program, "confine.c", "-lseccomp", *(
-        f"-D{name}=" + ",".join(f'"{word.removeprefix("-")}"' for word in words)
-        for name, words in lists.items()))
-    return program
+    return confinement(package.work / "confined", unit)
 
 
 def compiled(program: Path, source: str, *options):
@@ -386,9 +402,11 @@ def compiled(program: Path, source: str, *options):
         PROJECT / "packaging" / source, *options)
 
 
-def test_the_confinement_confines(confined):
-    compiled(confined.with_suffix(".real"), "probe.c", "-static")
-    boot("test_the_probe_is_refused", confined)
+def test_the_confinement_confines(package, unit):
+    """The probe reads its capabilities in /proc."""
+    program = confinement(package.work / "probed", unit, visible="/proc")
+    compiled(program.with_suffix(".real"), "probe.c", "-static")
+    boot("test_the_probe_is_refused", program)
 
 
 def test_devices_boot_confined(package, confined):

@@ -1,8 +1,9 @@
 // SPDX-License-Identifier: BSD-2-Clause
 //
 // Stands in marlin's place in a test and starts "marlin.real" beside it, under
-// the restrictions of the boot unit: its read-only paths, no capability, and
-// its system calls. lab/test_package.py takes the three lists from the unit and
+// the restrictions of the boot unit: its read-only and hidden paths, no
+// capability, its limit of memory, and its system calls, those that systemd
+// adds left out. lab/test_package.py takes all of them from the unit and
 // compiles them in. One difference, on purpose: a call that the unit refuses
 // kills here, so that no refusal goes unnoticed.
 #define _GNU_SOURCE
@@ -19,12 +20,14 @@
 #include <sys/mman.h>
 #include <sys/mount.h>
 #include <sys/prctl.h>
+#include <sys/resource.h>
 #include <sys/stat.h>
 #include <sys/syscall.h>
 #include <unistd.h>
 
 static const char* const writable[] = {WRITABLE_PATHS};
 static const char* const read_only[] = {READ_ONLY_PATHS};
+static const char* const hidden[] = {HIDDEN_PATHS};
 static const char* const allowed_calls[] = {ALLOWED_CALLS};
 
 #define LENGTH(list) (sizeof(list) / sizeof *(list))
@@ -80,6 +83,24 @@ static void protect_paths(void) {
     set_read_only(writable[i], 0, 0);
   for (size_t i = 0; i < LENGTH(read_only); ++i)
     set_read_only(read_only[i], 1, 0);
+}
+
+// Last of all mounts: the log and what is needed until exec are open by then.
+static void hide_paths(void) {
+  for (size_t i = 0; i < LENGTH(hidden); ++i)
+    if (mount("hidden", hidden[i], "tmpfs", MS_RDONLY, "mode=000") != 0 &&
+        errno != ENOENT)
+      must(-1, hidden[i]);
+}
+
+static void limit_memory(void) {
+  const struct rlimit none = {0, 0};
+  struct rlimit all;
+  must(getrlimit(RLIMIT_AS, &all), "memory");
+  // A test may have set a smaller one.
+  if (all.rlim_max > MEMORY) all.rlim_cur = all.rlim_max = MEMORY;
+  must(setrlimit(RLIMIT_AS, &all), "memory");
+  must(setrlimit(RLIMIT_CORE, &none), "core");
 }
 
 static void drop_capabilities(void) {
@@ -139,7 +160,9 @@ int main(int argc, char** argv) {
   const int traced = is_traced();
   enter_namespaces();
   protect_paths();
+  hide_paths();
   drop_capabilities();
+  limit_memory();
   if (!traced) {
     refuse_writable_code();
     allow_only_listed_calls();

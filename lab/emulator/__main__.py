@@ -2,7 +2,8 @@
 """Builds the program for arm64 and boots it on an emulated device: a real kernel, a
 read-only system partition, an ext4 disk for "/var". Without an option it shows an
 update being announced at one boot and activated at the next: the console, what readers
-of time-zone data see, and the links.
+of time-zone data see, and the links. With --systems it boots whole Debian systems
+instead, with the package installed.
 
 What is needed is installed, as root, and a kernel is fetched into the folder "build".
 Exit status: 0 when all is as expected, otherwise 1; 2 for bad use; 77 when a device
@@ -39,6 +40,12 @@ def main() -> int:
                       "same while updates are installed")
     parser.add_argument("--mend", action="store_true", help="of --power-cuts: each "
                         "boot first removes links that are of two sets")
+    mode.add_argument("--systems", nargs="*", metavar="TEST", help="Debian systems "
+                      "with the package: the boot unit, other inits; or these tests")
+    mode.add_argument("--unit-cost", action="store_true",
+                      help="measures what each restriction of the boot unit costs")
+    parser.add_argument("--quick", action="store_true",
+                        help="of the systems only those that scripts/ci boots")
     parser.add_argument("--seed", type=int, help="of what chance decides in cuts")
     options = parser.parse_args()
     if subprocess.call([PROJECT / "scripts/packages", "pytest"]):
@@ -46,13 +53,21 @@ def main() -> int:
     # After the options are understood: these take pytest.
     import pytest
     from lab.emulator import boot_cost, install_cuts, parts, power_cuts, show
+    from lab.systems import cost
+    from lab.systems import parts as systems
+    run = ["-c", "lab/pytest.ini", f"--rootdir={PROJECT}", "-n", "2", "--dist"]
     try:
+        if options.systems is not None:
+            systems.prepare()
+            return pytest.main([*run, "load", "--durations=0", *(
+                ["-m", "not rest"] if options.quick else []),
+                *(options.systems or ["lab/systems"])])
+        if options.unit_cost:
+            cost.measure()
+            return 0
         parts.prepare()
         if options.tests is not None:
-            return pytest.main([
-                "-c", "lab/pytest.ini", f"--rootdir={PROJECT}",
-                "-n", "2", "--dist", "loadfile",
-                *(options.tests or ["lab/emulator"])])
+            return pytest.main([*run, "loadfile", *(options.tests or ["lab/emulator"])])
         if options.shell:
             return show.shell()
         if options.power_cuts:

@@ -37,20 +37,20 @@ def prepare():
         if not PARTS.is_dir():
             print("Fetching a kernel and busybox", file=sys.stderr, flush=True)
             try:
-                fetch()
+                fetch(PARTS, "arm64", "busybox-static")
             except RuntimeError as reason:
                 raise Unavailable(f"the parts cannot be fetched: {reason}") from reason
 
 
-def fetch():
-    """With an index and a package database of its own, for arm64, so that this
-    machine's stay as they are."""
-    work = WORK / "fetched"
+def fetch(place: Path, architecture: str, *names: str):
+    """Unpacks the newest kernel for virtual machines, and these packages. With an index
+    and a package database of its own, so that this machine's stay as they are."""
+    work = place.with_name("fetched")
     shutil.rmtree(work, ignore_errors=True)
     for directory in ("lists/partial", "cache/archives/partial", "unpacked"):
         (work / directory).mkdir(parents=True)
     (work / "status").touch()
-    settings = {"APT::Architecture": "arm64", "APT::Architectures::": "arm64",
+    settings = {"APT::Architecture": architecture, "APT::Architectures::": architecture,
                 "APT::Sandbox::User": "root", "Dir::State": work,
                 "Dir::State::lists": work / "lists", "Dir::Cache": work / "cache",
                 "Dir::State::status": work / "status"}
@@ -60,14 +60,14 @@ def fetch():
         return run(tool, "-qq", *options, *words, cwd=work)
 
     apt("apt-get", "update")
-    newest = apt("apt-cache", "depends", "linux-image-cloud-arm64")
+    newest = apt("apt-cache", "depends", f"linux-image-cloud-{architecture}")
     kernel = re.search(r"^ *Depends: (linux-image-[0-9]\S*)$", newest, re.MULTILINE)
     if not kernel:
-        raise RuntimeError("no kernel for arm64 in the package index")
-    apt("apt-get", "download", kernel[1], "busybox-static")
+        raise RuntimeError(f"no kernel for {architecture} in the package index")
+    apt("apt-get", "download", kernel[1], *names)
     for package in work.glob("*.deb"):
         run("dpkg-deb", "-x", package, work / "unpacked")
-    (work / "unpacked").rename(PARTS)
+    (work / "unpacked").rename(place)
     shutil.rmtree(work)
 
 

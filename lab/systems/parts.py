@@ -1,0 +1,162 @@
+# SPDX-License-Identifier: BSD-2-Clause
+"""What a system is made of: a Debian root with systemd, Debian's kernel, the package
+as it ships, and the demonstration's real data. The first two are fetched once, into the
+folder "build"; each system has a disk of its own."""
+
+import fcntl
+import shutil
+import subprocess
+import sys
+from pathlib import Path
+from typing import NamedTuple
+
+from lab.carriers.image import run
+from lab.demo import data
+from lab.doors import build
+from lab.emulator.parts import Unavailable, fetch
+from lab.places import BUILD, PROJECT
+
+WORK = BUILD / "systems"
+GUEST = Path(__file__).parent / "guest"
+ROOT_PACKAGES = "apparmor,dbus,systemd,systemd-sysv,tzdata,udev"
+# Nobody asks these systems anything, and nobody reads on them.
+LEFT_OUT = [word for place in ("doc", "info", "locale", "man", "lintian")
+            for word in (f"--dpkgopt=path-exclude=/usr/share/{place}/*",
+                         f"--dpkgopt=path-include=/usr/share/{place}/marlin*")]
+
+
+class Processor(NamedTuple):
+    """A Debian architecture, the preset that builds for it, and the machine."""
+    name: str
+    preset: str
+    compiler: str
+    qemu: tuple[str, ...]
+    console: str
+
+    @property
+    def place(self) -> Path:
+        return WORK / self.name
+
+    @property
+    def kernel(self) -> Path:
+        [kernel] = (self.place / "packages").rglob("vmlinuz-*")
+        return kernel
+
+
+AMD64 = Processor("amd64", "release", "gcc", (
+    "qemu-system-x86_64", "-M", "q35"), "ttyS0")
+
+
+def prepare(processor=AMD64):
+    """Builds and fetches what is missing; or raises Unavailable."""
+    if subprocess.call([PROJECT / "scripts/packages", "build", "demo", "systems"]):
+        raise Unavailable("packages are missing")
+    place = processor.place
+    place.mkdir(parents=True, exist_ok=True)
+    with open(place / "lock", "w", encoding="ascii") as lock:
+        fcntl.flock(lock, fcntl.LOCK_EX)
+        try:
+            if not (place / "packages").is_dir():
+                tell("Fetching a kernel")
+                fetch(place / "packages", processor.name, "busybox-static")
+            if not (place / "root.tar").exists():
+                tell("Making a Debian system, in a minute or two")
+                make_root(processor)
+        except RuntimeError as reason:
+            why = str(reason).strip().splitlines()[-1]
+            raise Unavailable("no Debian system can be made here, which takes a mirror "
+                              f"of Debian: {why}") from reason
+        data.prepare()
+        make_package(processor)
+        # In marlin's place it has to have its name.
+        run(processor.compiler, "-static", "-O1", "-Wall", "-o", place / "marlin",
+            PROJECT / "packaging/probe.c")
+
+
+def tell(text: str):
+    print(text, file=sys.stderr, flush=True)
+
+
+def make_root(processor: Processor):
+    made = processor.place / "root.new.tar"
+    run("mmdebstrap", "--quiet", "--variant=essential",
+        f"--architectures={processor.name}", f"--include={ROOT_PACKAGES}",
+        "--aptopt=Acquire::Languages \"none\"", *LEFT_OUT, "bookworm", made)
+    made.rename(processor.place / "root.tar")
+
+
+def make_package(processor: Processor):
+    """As scripts/package does, without its checks."""
+    folder = build(processor.preset)
+    for old in processor.place.glob("*.deb"):
+        old.unlink()
+    run("cpack", "--config", folder / "CPackConfig.cmake", "-B", processor.place,
+        cwd=folder)
+
+
+def package(processor=AMD64) -> Path:
+    [file] = processor.place.glob("marlin_*.deb")
+    return file
+
+
+IMAGE = r"""
+umask 022
+place=$1 guest=$2 data=$3 package=$4 image=$5 script=$6 apart=$7 third=$8 mb=$9
+root=$(dirname "$image")/root
+rm -rf "$root"
+mkdir "$root"
+tar -x -f "$place/root.tar" -C "$root" --no-same-owner --exclude='./dev/*'
+dpkg --root="$root" --force-script-chrootless --force-architecture --log=/dev/null \
+  --install "$package"
+cp -R "$guest/." "$root"
+cd "$root"
+cp -R "$data/system/zoneinfo" usr/share/zoneinfo.default
+mkdir -p usr/share/icu usr/lib/lab/data usr/lib/lab/probe
+cp -R "$data/system/icu/." usr/share/icu
+cp -R "$data/update" "$data/refused" usr/lib/lab/data
+cp "$package" usr/lib/lab
+cp "$place/marlin" usr/lib/lab/probe
+cp "$place/packages/bin/busybox" usr/lib/lab
+(umask 077; echo secret >root/secret)
+ln -sfn /var/db/timezone/localtime etc/localtime
+rm -f etc/fstab
+# These take time, and nobody waits for them.
+for unit in apparmor.service dbus.socket dpkg-db-backup.timer e2scrub_all.timer \
+  fstrim.timer systemd-binfmt.service systemd-hwdb-update.service \
+  systemd-pstore.service systemd-random-seed.service systemd-tmpfiles-clean.timer \
+  systemd-update-utmp.service; do
+  ln -s /dev/null etc/systemd/system/$unit
+done
+printf '%032d\n' 1 >etc/machine-id
+printf 'installer:x:1001:1001::/:/bin/sh\n' >>etc/passwd
+eval "$script"
+make() {
+  rm -f "$1"
+  mke2fs -q -t ext4 -b 4096 -m 0 -E root_owner=0:0,lazy_itable_init=0 -d "$2" "$1" "$3"
+}
+if [ -n "$apart" ]; then
+  make "$third" "$apart" "${mb}M"
+  rm -rf "$apart"
+  mkdir "$apart"
+fi
+cd /
+make "$image" "$root" 512M
+rm -rf "$root"
+"""
+
+
+def make_image(processor: Processor, image: Path, script="", apart="",
+               third: Path | None = None, megabytes=32):
+    """A system's disk, after a shell did what the script says in its root directory;
+    what is below the directory `apart` goes to a disk of its own. In a user namespace:
+    whoever runs this owns all, as root."""
+    run("bwrap", "--unshare-user", "--uid", 0, "--gid", 0, "--dev-bind", "/", "/",
+        "sh", "-euc", IMAGE, "-", processor.place, GUEST, data.TARGET,
+        package(processor), image, script, apart, third or "", megabytes)
+
+
+def room(place: Path) -> Path:
+    """An empty directory."""
+    shutil.rmtree(place, ignore_errors=True)
+    place.mkdir(parents=True)
+    return place
