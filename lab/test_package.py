@@ -193,7 +193,7 @@ def test_it_has_one_version_everywhere(package):
     changelog.write_bytes(gzip.decompress(
         (share / "doc/marlin/changelog.gz").read_bytes()))
     pages = sorted(share.glob("man/*/*.gz"))
-    assert len(pages) == 4
+    assert len(pages) == 5
     versions = [
         found(r"^## (\S+) - ", (PROJECT / "CHANGELOG.md").read_text()),
         found(r"^project\([^)]*VERSION ([\d.]+)",
@@ -206,7 +206,7 @@ def test_it_has_one_version_everywhere(package):
 
 
 @pytest.mark.parametrize("name", ["libexec/marlin", "libexec/marlin-mend",
-                                  "sbin/marlin-install"])
+                                  "sbin/marlin-install", "bin/marlin-status"])
 def test_its_programs_are_static_and_hardened(package, name):
     """Nothing that can be written to is executed, or the other way around; what has
     been relocated cannot be written to any more."""
