@@ -143,7 +143,8 @@ def test_whoever_is_not_root_is_told_a_command_that_works(root, fakes, tmp_path)
     assert run("/bin/sh", "-c", line.partition(": to install what is missing: ")[2],
                PATH=path).returncode == 0
     assert log.read_text().splitlines() == [
-        "update", "install -y --no-install-recommends cmake ninja-build"]
+        "update", "install -y --no-install-recommends cmake ninja-build "
+        "nlohmann-json3-dev"]
 
 
 def test_every_purpose_is_listed():

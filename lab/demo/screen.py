@@ -66,6 +66,11 @@ def changes(was: dict[str, str], found: dict[str, str], remade: set[str]):
         row(name, before, after, width, marker, colour)
 
 
+def broken(text: str) -> list[str]:
+    """As lines that fit beside a name."""
+    return textwrap.wrap(text, WIDTH - NAME, break_on_hyphens=False)
+
+
 def printed(lines: Iterable[str]):
     """Lines of a boot. One that is too long is broken before the system's text, which
     follows the last colon."""

@@ -12,6 +12,7 @@ import contextlib
 import datetime
 import difflib
 import os
+import shutil
 import signal
 import subprocess
 import sys
@@ -29,6 +30,7 @@ from lab.seen import Entries, Seen, as_device
 
 ROWS = {"zoneinfo": ZONEINFO, "icutz": ICUTZ, "localtime": LOCALTIME,
         "tz_latest": TZ_LATEST, "record": RECORD}
+COMPANIONS = Path(boot.PROGRAM).parent / "tools"
 CLAIMS = Path(__file__).with_name("facts").read_text(encoding="ascii").splitlines()
 CLAIMED = {claim.partition(" -> ")[0] for claim in CLAIMS}
 
@@ -52,6 +54,8 @@ update led
   clock       "date" with TZ=:{LOCALTIME}, at noon UTC on 1 February {year}
   ICU clock   a program with Debian's ICU, for the zone that localtime names, at the \
 same moment""")
+    screen.say("""Before each boot marlin-status is asked what it will do, and every
+        answer is compared with what it then did.""")
     screen.say("""The device is private and gone when this ends. Its data is real,
         that of this machine, except for the names of the releases and one invention
         in the later ones: Lisbon goes from Western European Time, WET, to Central
@@ -84,20 +88,22 @@ an upgrade""")
         screen.row(name, identity(seen.before, path), identity(seen.after, path))
 
     device.choose_zone("Europe/Lisbon")
-    story.download_and_announce("update")
+    story.install("update")
     story.scene("An update is activated", f"""The user has moved to Lisbon, and
         {names.update} has been downloaded: Lisbon changes to CET as {year} begins. The
         update is newer than {names.system} and its ICU data has the system's format, so
-        marlin links it. On 1 February noon UTC was to be 12:00 in Lisbon; now it is
+        marlin-install announces it, and marlin links it. On 1 February noon UTC was to be 12:00 in Lisbon; now it is
         13:00.""", clock_before="12:00 WET")
 
     story.scene("The same update again", f"""tz_latest still announces {names.update},
         which is in use by now. Equal is not newer, so marlin says so, as at every
         boot from now on, and touches nothing.""")
 
+    story.install("refused")
     story.download_and_announce("refused")
     story.scene("An update that does not fit is refused", f"""{names.refused} puts
-        Lisbon's change off by a year. It is newer, but its ICU data has the format
+        Lisbon's change off by a year. marlin-install does not take it, but somebody
+        has announced it by hand. It is newer, but its ICU data has the format
         {names.other_icu} and the system reads {names.icu}, so marlin refuses it and
         stays with {names.update}.""")
 
@@ -135,6 +141,7 @@ class Story:
         self.endings = []  # of scenes, in the words of the summary
         self.facts = []  # as they were found
         self.wrong = []  # where that is not as claimed
+        self.installer = ""  # what it said since the last boot
 
     def bring(self, source: str, target: str):
         """Has the device hold what stands somewhere in the data."""
@@ -154,13 +161,44 @@ class Story:
         self.bring(data_set, update_path(version))
         self.device.announce(version)
 
-    def scene(self, title: str, words: str, clock_before="") -> Seen:
-        screen.rule(f"{len(self.endings) + 1}  {title}")
-        screen.say(words)
+    def install(self, data_set: str):
+        """With marlin-install, on the device as it is."""
+        self.make_real()
+        version = getattr(self.names, data_set)
+        unpacked = Path("/tmp", version)
+        shutil.copytree(data.TARGET.absolute() / data_set, unpacked, symlinks=True)
+        done = subprocess.run([COMPANIONS / "marlin-install", unpacked], text=True,
+                              capture_output=True)
+        shutil.rmtree(unpacked)
+        self.device.root = as_device(namespace.look()).root
+        self.installer = (done.stdout or done.stderr).strip()
+        self.note([f"installer: {data_set} -> {done.returncode}"])
+
+    def make_real(self):
         # What is there already, from the boot before, is not made anew.
         if self.device.contents() != as_device(namespace.look()).contents():
             namespace.build(self.device)
+
+    def foretold(self) -> tuple[int, list[str]]:
+        """What marlin-status says of the next boot: its status and its reasons."""
+        done = subprocess.run([COMPANIONS / "marlin-status", "--check"], text=True,
+                              stdout=subprocess.PIPE)
+        return done.returncode, done.stdout.splitlines()
+
+    def scene(self, title: str, words: str, clock_before="") -> Seen:
+        screen.rule(f"{len(self.endings) + 1}  {title}")
+        screen.say(words)
+        self.make_real()
         before = namespace.look()
+        expected, reasons = self.foretold()
+        print()
+        for name, told in {"installer": [self.installer],
+                           "foretold": reasons or ["no change"]}.items():
+            for text in filter(None, told):
+                for part in screen.broken(text):
+                    screen.field(name, part)
+                    name = ""
+        self.installer = ""
         was = self.rows(before)
         booted = boot.boot()
         seen = Seen(before, namespace.look(), *booted)
@@ -178,9 +216,13 @@ class Story:
 
         warned = [f"warned '{line.removeprefix(lines.NAME).rpartition(': ')[0]}'"
                   for line in log] or ["no warning"]
-        facts = [f"status -> {status}", *["nothing touched"][:not touched], *warned,
+        facts = [f"status -> {status}", f"foretold -> {expected}",
+                 *["nothing touched"][:not touched], *warned,
                  *(f"{name} -> {value}" for name, value in found.items())]
         self.note(f"{title.lower()}: {fact}" for fact in facts)
+        if expected < 2 and bool(expected) != bool(touched):
+            self.wrong.append(f"{title.lower()}: foretold {expected}, touched "
+                              f"{touched}")
         if clock_before not in ("", was["clock"]):
             self.wrong.append(f"{title.lower()}: clock was {was['clock']} before it")
         return seen
