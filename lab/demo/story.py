@@ -92,8 +92,8 @@ an upgrade""")
     story.scene("An update is activated", f"""The user has moved to Lisbon, and
         {names.update} has been downloaded: Lisbon changes to CET as {year} begins. The
         update is newer than {names.system} and its ICU data has the system's format, so
-        marlin-install announces it, and marlin links it. On 1 February noon UTC was to be 12:00 in Lisbon; now it is
-        13:00.""", clock_before="12:00 WET")
+        marlin-install announces it, and marlin links it. On 1 February noon UTC was to
+        be 12:00 in Lisbon; now it is 13:00.""", clock_before="12:00 WET")
 
     story.scene("The same update again", f"""tz_latest still announces {names.update},
         which is in use by now. Equal is not newer, so marlin says so, as at every
