@@ -24,8 +24,9 @@ from lab.paths import ICUTZ, LOCALTIME, SYSTEM_ZONEINFO, TZ_LATEST, ZONEINFO
 from lab.seen import Entries
 
 GUEST = Path(__file__).parent / "guest"
-MODULES = ("virtio/virtio_ring", "virtio/virtio", "virtio/virtio_mmio",
-           "block/virtio_blk")
+MODULES = ("drivers/virtio/virtio_ring", "drivers/virtio/virtio",
+           "drivers/virtio/virtio_mmio", "drivers/block/virtio_blk",
+           "fs/overlayfs/overlay")
 LINKS = (ZONEINFO, ICUTZ, LOCALTIME, TZ_LATEST)
 
 
@@ -54,7 +55,7 @@ def first_memory() -> bytes:
         ("bin/busybox", 0o100755, part("bin/busybox").read_bytes()),
         ("init", 0o100755, (GUEST / "init").read_bytes()),
         *((f"modules/{name.rpartition('/')[2]}.ko", 0o100644,
-           part(f"kernel/drivers/{name}.ko").read_bytes()) for name in MODULES)])
+           part(f"kernel/{name}.ko").read_bytes()) for name in MODULES)])
 
 
 def system_partition(device: Device) -> Node:
@@ -173,7 +174,7 @@ class Machine:
 
     def build_system(self):
         compile_zones(self.device)
-        image.build(self.system, system_partition(self.device), 12,
+        image.build(self.system, system_partition(self.device), 14,
                     "-O", "^has_journal")
         self.built = image.digest(self.system)
 

@@ -19,7 +19,7 @@ WORK = BUILD / "emulator"
 PARTS = WORK / "packages"
 PROGRAM = BUILD / "arm64-release" / "marlin"
 COMPANIONS = [PROGRAM.parent / "tools" / name
-              for name in ("marlin-install", "marlin-mend")]
+              for name in ("marlin-install", "marlin-mend", "marlin-status")]
 
 
 class Unavailable(Exception):

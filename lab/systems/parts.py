@@ -117,6 +117,7 @@ cp -R "$data/update" "$data/refused" usr/lib/lab/data
 cp "$package" usr/lib/lab
 cp "$place/marlin" usr/lib/lab/probe
 cp "$place/packages/bin/busybox" usr/lib/lab
+find "$place/packages" -name overlay.ko -exec cp {} usr/lib/lab \;
 (umask 077; echo secret >root/secret)
 ln -sfn /var/db/timezone/localtime etc/localtime
 rm -f etc/fstab

@@ -1,18 +1,36 @@
 # SPDX-License-Identifier: BSD-2-Clause
 """A system whose root can be written, as Debian installs it: from its first boot on."""
 
+import json
+
 from lab import lines
 from lab.paths import (DOWNLOADS, LOCALTIME, RECORD, TZ_LATEST, ZONEINFO,
                        DEFAULT_ZONE)
 from lab.systems.machine import UNIT, System
 from lab.systems.scene import (NEW, ZONE, announce, device, fail, insist,
-                               install_update, names)
+                               install_update, links, names)
 
 # The file systems on disks; what was changed from the program's start on.
 CHANGED = f"""
 day=$(systemctl show --timestamp=us+utc --property=ExecMainStartTimestamp {UNIT})
 find / -xdev -newerct "${{day#* }}" >/run/lab/seen/changed
 """
+
+# What the next boot will do, as marlin-status says.
+ASKED = """
+insmod /usr/lib/lab/overlay.ko
+marlin-status --json >/run/lab/seen/status || :
+"""
+
+
+def foretold(seen) -> tuple[int, dict[str, str]]:
+    """The status, and the links after the next boot."""
+    said = json.loads(seen.text("status"))
+    after = said["next_boot"]["after"]
+    return said["status"], {
+        f"/var/db/timezone/{name}": after[name]["target"]
+        for name in ("zoneinfo", "icutz", "localtime", "tz_latest")
+        if after[name]["kind"] == "link"}
 
 
 def test_from_its_first_boot_on():
@@ -21,9 +39,12 @@ def test_from_its_first_boot_on():
     seen = system.boot(f"""
         ln -sfn {ZONEINFO}/{ZONE} {LOCALTIME}
         {install_update()} {announce()}
-        chown installer: {DOWNLOADS} && chmod 775 {DOWNLOADS}""")
+        chown installer: {DOWNLOADS} && chmod 775 {DOWNLOADS}
+        {ASKED}""")
     first = device(zone=DEFAULT_ZONE)
     insist(seen, NEW, first, reader="05:00 PDT")
+
+    assert foretold(seen) == (1, links(device(active=True, announced=True)))
 
     for printed, then in (((), CHANGED),
                           ([lines.NOT_NEWER % (update, update)], f"rm {TZ_LATEST}")):
