@@ -8,6 +8,7 @@ import itertools
 import json
 import os
 import random
+import shlex
 import shutil
 import signal
 import subprocess
@@ -607,6 +608,46 @@ def test_an_archive_that_grows(place, members, megabytes):
             info.size = megabytes << 20
             tar.addfile(info, zeros)
     refused(update(place, rules=archive), "far too large")
+
+
+def test_an_archive_with_a_wrong_checksum(place):
+    """It is behind all that is read from it."""
+    archive = place / "rules.tar.gz"
+    with tarfile.open(archive, "w:gz") as tar:
+        tar.add(place / "rules", "rules")
+    raw = bytearray(archive.read_bytes())
+    raw[-8] ^= 1
+    archive.write_bytes(raw)
+    refused(update(place, rules=archive), "cannot be read as an archive")
+    assert os.listdir(place / "out") == []
+
+
+def test_a_damaged_archive_of_another_kind(place):
+    archive = place / "rules.tar.xz"
+    with tarfile.open(archive, "w:xz") as tar:
+        tar.add(place / "rules", "rules")
+    raw = bytearray(archive.read_bytes())
+    raw[len(raw) // 2] ^= 255
+    archive.write_bytes(raw)
+    refused(update(place, rules=archive), "cannot be read as an archive")
+
+
+@pytest.mark.parametrize("output", ["/dev/full", None])
+def test_an_update_that_cannot_be_told(place, names, output):
+    """It is made all the same, and the line says so."""
+    command = shlex.join(map(str, releases.tool(
+        "make-update", rules=place / "rules", icu=place / "icu",
+        system=place / "system", out=place / "out")))
+    done = ran(["/bin/sh", "-c", f"{command} >{output or '&-'}"])
+    refused(done, "is made, but standard output fails")
+    assert os.listdir(place / "out") == [f"{names.update}.1.0"]
+
+
+def test_numbers_that_no_machine_has(place):
+    refused(update(place, "--revision", "1" * 5000), "is not a version")
+    refused(update(place, environment={"SOURCE_DATE_EPOCH": "9" * 20}),
+            "SOURCE_DATE_EPOCH is too large")
+    assert os.listdir(place / "out") == []
 
 
 def test_a_name_with_a_newline(place):

@@ -73,8 +73,6 @@ def main(make, parser: Options):
     os.umask(0o022)
     try:
         facts, text = make(chosen)
-        print(json.dumps(facts, indent=2, sort_keys=True) if chosen.json else text)
-        sys.stdout.flush()
     except Refused as refused:
         print(f"{NAME}: {plain(str(refused))}", file=sys.stderr)
         sys.exit(refused.status)
@@ -82,6 +80,15 @@ def main(make, parser: Options):
         where = f"{failed.filename}: " if failed.filename is not None else ""
         print(f"{NAME}: {plain(str(where))}{failed.strerror}; nothing was made",
               file=sys.stderr)
+        sys.exit(1)
+    try:
+        print(json.dumps(facts, indent=2, sort_keys=True) if chosen.json else text)
+        sys.stdout.flush()
+    except (OSError, AttributeError) as failed:
+        # Python would try to write it again at the end.
+        sys.stdout = None
+        print(f"{NAME}: {facts['directory']} is made, but standard output fails: "
+              f"{getattr(failed, 'strerror', 'it is closed')}", file=sys.stderr)
         sys.exit(1)
 
 
@@ -125,7 +132,7 @@ def output(*command, folder: Path, remedy: str, **environment: str) -> str:
 def version(text: str) -> tuple[int, str, int, int]:
     """A version, which compares as the boot program compares them."""
     match = re.fullmatch(r"([0-9]+)([a-z]+)(?:\.([0-9]+)(?:\.([0-9]+))?)?", text)
-    if not match or any(int(number) > INT_MAX
+    if not match or any(len(number.lstrip("0")) > 10 or int(number) > INT_MAX
                         for number in match.group(1, 3, 4) if number):
         raise Refused(f"'{text}' is not a version; write it like 2024a.1.0")
     year, letters, first, second = match.groups()
@@ -213,8 +220,14 @@ def unpacked(path: Path, wanted: tuple[str, ...]) -> dict[str, bytes]:
                     raise Refused(f"{path} holds {name} twice; "
                                   "name an archive of a release")
                 files[name] = archive.extractfile(member).read()
-    except (tarfile.TarError, EOFError, OSError, ValueError) as failed:
-        raise Refused(f"{path} cannot be read as an archive: {failed}; "
+            # To the end, where a checksum may stand.
+            while archive.fileobj.read(1 << 16):
+                pass
+    except Refused:
+        raise
+    except Exception as failed:  # of any library of compression
+        reason = str(failed).splitlines()[0] if str(failed) else "it is damaged"
+        raise Refused(f"{path} cannot be read as an archive: {reason}; "
                       "fetch it again") from None
     return files
 
@@ -309,6 +322,8 @@ def settle(root: Path):
     """Modes with which readers, and the boot program, can use it; owners if possible;
     times only if they are asked for, in the way that other builds have it."""
     moment = os.environ.get("SOURCE_DATE_EPOCH", "")
+    if len(moment) > 11:
+        raise Refused("SOURCE_DATE_EPOCH is too large; set a number of seconds")
     for folder, _, names in os.walk(root, topdown=False):
         for path in [os.path.join(folder, name) for name in names] + [folder]:
             os.chmod(path, 0o755 if path == folder else 0o644)

@@ -215,6 +215,21 @@ TEST_F(Installer, RefusesWhatIsNotNewerThanWhatIsAnnounced) {
   expect_refused("it is not newer than 2024c.1.0, which is announced", 4);
 }
 
+// The next boot refuses that one, and every later boot.
+TEST_F(Installer, ReplacesAnAnnouncementThatDoesNotFitTheSystem) {
+  install_update("2024c.1.0", "43l");
+  announce("2024c.1.0");
+  EXPECT_EQ(install().exit_status, 0);
+  expect_installed();
+}
+
+TEST_F(Installer, ChecksAlsoWhetherASetOfThatNameIsNeeded) {
+  install_update(version, "44l");
+  make_link(icutz, update(version) + "/icutz");
+  expect_refused(
+      "a set of this version is in use or announced; give other data another");
+}
+
 TEST_F(Installer, RefusesWhatIsNotNewerThanWhatIsInUse) {
   install_update("2024c.1.0", "44l");
   point_links_at_update("2024c.1.0");
@@ -282,6 +297,14 @@ TEST_F(Installer, TakesBackASetThatCannotBeAnnounced) {
       "/var/db/timezone/tz_latest: Is a directory; nothing was changed\n");
   EXPECT_EQ(file_at(update(version)), nothing);
   EXPECT_EQ(link_at(timezone_root + "/.marlin-install.tz_latest"), nothing);
+}
+
+TEST_F(Installer, BringsBackTheSetThatItWasToReplace) {
+  install_update(version, "43l");
+  make_directory(tz_latest);
+  EXPECT_EQ(install().exit_status, 1);
+  EXPECT_NE(file_at(update(version) + "/icutz/icutz43l.dat"), nothing);
+  EXPECT_EQ(file_at(update(version) + "/icutz/icutz44l.dat"), nothing);
 }
 
 TEST_F(Installer, TakesBackACopyThatCannotBeWrittenWhole) {

@@ -44,6 +44,13 @@ TEST_F(Mend, LeavesLinksOfOneSetAlone) {
   expect_left_alone();
 }
 
+// It counts as none, for marlin as well.
+TEST_F(Mend, LeavesALegacyLinkThatDanglesAlone) {
+  point_links_at_system();
+  make_link(legacy_icutz, "/nowhere");
+  expect_left_alone();
+}
+
 TEST_F(Mend, LeavesToMarlinWhatItResetsAnyway) {
   expect_left_alone();
   make_link(icutz, update("2024a.1.0") + "/icutz");

@@ -22,15 +22,25 @@ std::string release_in(const std::string& name) {
   return groups ? std::string(groups->year) + std::string(groups->letters) : "";
 }
 
+void check_age(const mln_version& version) {
+  check_newer(version, system_version(), "the system's");
+  // What the next boot will refuse is no reason to stay with it.
+  if (fits_system(announced_set()))
+    check_newer(version, announced_set(), "announced");
+  check_newer(version, set_in_use(), "in use");
+}
+
 }  // namespace
 
 void check_version(const std::string& name, bool any_age) {
   const auto version = version_in(name);
   if (!version) refuse("its name is no version such as 2024a.1.0");
-  if (any_age) return;
-  check_newer(*version, system_version(), "the system's");
-  check_newer(*version, announced_set(), "announced");
-  check_newer(*version, set_in_use(), "in use");
+  if (!any_age) check_age(*version);
+  // No set ever changes.
+  if (needed_sets().contains(name))
+    refuse(
+        "a set of this version is in use or announced; give other data "
+        "another");
 }
 
 void check_contents(const std::string& name, const contents& update) {

@@ -11,6 +11,7 @@
 #include <string_view>
 
 #include "dataset/icu.h"
+#include "dataset/icu_file_name.h"
 #include "dataset/zoneinfo.h"
 #include "support/paths.h"
 #include "support/version_grammar.h"
@@ -72,6 +73,18 @@ std::string set_in_use() {
 std::string system_version() { return mln_zoneinfo().version() + ".1.0"; }
 
 std::string system_schema() { return mln_icu().schema; }
+
+bool fits_system(const std::string& set) {
+  const std::string path = paths::download_root + set + "/icutz";
+  const std::unique_ptr<DIR, close_listing> entries(::opendir(path.c_str()));
+  const std::string schema = system_schema();
+  while (entries) {
+    const dirent* const entry = ::readdir(entries.get());
+    if (entry == nullptr) break;
+    if (!schema.empty() && icu_schema_in(entry->d_name) == schema) return true;
+  }
+  return false;
+}
 
 std::string zone_of_the_user() {
   const std::string text = text_of(paths::localtime_link);

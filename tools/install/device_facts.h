@@ -28,6 +28,9 @@ std::string system_version();
 // The ICU schema of the system; empty where there is none.
 std::string system_schema();
 
+// Whether a set has ICU data of the system's schema.
+bool fits_system(const std::string& set);
+
 // The zone that "localtime" names, such as Europe/Paris, here or where it was
 // on older systems; empty for any other link.
 std::string zone_of_the_user();

@@ -10,6 +10,7 @@
 #include <vector>
 
 #include "support/paths.h"
+#include "tools/escaped.h"
 #include "tools/install/device_facts.h"
 #include "tools/install/failure.h"
 
@@ -45,7 +46,9 @@ downloads::downloads()
     : links_(open_place(paths::timezone_directory)),
       sets_(open_place(paths::download_root)) {
   lock(sets_.number());
-  delete_hidden();
+  // What belongs to another user can stay: it stands in the way of nothing but
+  // a directory of its own name.
+  tidy();
   sync_announcement();
 }
 
@@ -63,16 +66,19 @@ descriptor downloads::make_incoming() {
   return open_directory(sets_.number(), incoming, path_of(incoming));
 }
 
-void downloads::insist_on_room_for(const std::string& name) const {
-  if (needed_sets().contains(name))
-    refuse(
-        "a set of this version is in use or announced; give other data "
-        "another");
+void downloads::insist_on_own(const std::string& name) const {
+  const auto status = status_of(sets_.number(), name, path_of(name));
+  if (status.st_mode != 0 && ::geteuid() != 0 && status.st_uid != ::geteuid())
+    refuse(escaped(path_of(name)) +
+           " belongs to another user, who has to remove it");
 }
 
 void downloads::put_in_place(const std::string& name) {
-  if (status_of(sets_.number(), name, path_of(name)).st_mode != 0)
+  if (status_of(sets_.number(), name, path_of(name)).st_mode != 0) {
+    insist_on_own(name);
     rename_entry(sets_.number(), name, outgoing, path_of(name));
+    replaced_ = name;
+  }
   rename_entry(sets_.number(), incoming, name, path_of(incoming));
   placed_ = name;
   sync(sets_.number(), paths::download_root);
@@ -107,6 +113,7 @@ void downloads::prune(
              next_name(sets.get(), paths::download_root)) {
     const std::string name = found;
     if (needed.contains(name) || !version_in(name)) continue;
+    insist_on_own(name);
     // A stop in the middle leaves no half of a set.
     rename_entry(sets_.number(), name, outgoing, path_of(name));
     tell(name, remove_entry(sets_.number(), outgoing, path_of(name)));
@@ -118,6 +125,8 @@ void downloads::take_back() noexcept {
   try {
     if (!placed_.empty())
       rename_entry(sets_.number(), placed_, incoming, path_of(placed_));
+    if (!replaced_.empty())
+      rename_entry(sets_.number(), outgoing, replaced_, path_of(outgoing));
   } catch (...) {
     // The reason for taking it back is what has to be told. A whole set stays,
     // which nothing names.

@@ -15,18 +15,16 @@ class downloads {
  public:
   // Opens both directories and locks the first against others of this class;
   // throws `failure` with status::busy if one has the lock. Then deletes what
-  // an earlier one left that was stopped, and syncs what it may have announced.
+  // an earlier one left that was stopped, as far as that can be done, and syncs
+  // what it may have announced.
   downloads();
-
-  // Throws `failure` if something needs a set of this name: no set ever
-  // changes.
-  void insist_on_room_for(const std::string& name) const;
 
   // Makes the hidden directory that a new set is written into, and opens it.
   descriptor make_incoming();
   std::string incoming_path() const;
 
-  // Gives the hidden directory its name. A set of that name is replaced.
+  // Gives the hidden directory its name. A set of that name is replaced, unless
+  // it belongs to another user, who alone could delete it.
   void put_in_place(const std::string& name);
 
   // Makes "tz_latest" name a set. Until sync_announcement() has returned, a
@@ -37,7 +35,8 @@ class downloads {
   // Removes "tz_latest". Whether it was there.
   bool withdraw();
 
-  // Deletes every set that nothing needs, and tells of each.
+  // Deletes every set that nothing needs, and tells of each. Stops at one that
+  // belongs to another user.
   void prune(const std::function<void(const std::string& name,
                                       const removed& gone)>& tell);
 
@@ -50,8 +49,10 @@ class downloads {
 
  private:
   void delete_hidden();
+  void insist_on_own(const std::string& name) const;
 
   descriptor links_{};
   descriptor sets_{};
-  std::string placed_{};  // by put_in_place()
+  std::string placed_{};    // by put_in_place()
+  std::string replaced_{};  // hidden by it
 };

@@ -99,7 +99,6 @@ void install(const update& given, bool force) {
   downloads place;
   const contents found = check(given, force);
   about(escaped(given.name) + ": ", "; nothing was changed", [&] {
-    place.insist_on_room_for(given.name);
     try {
       copy_into(place, given, found);
       place.put_in_place(given.name);

@@ -2,8 +2,8 @@
 //
 // Run before marlin, on devices that switch it on: if "zoneinfo" and "icutz" do
 // not name the same data, as after a loss of power between the two links,
-// removes "zoneinfo". marlin then makes both anew, by its own rules. Two calls
-// on a quiet boot; it may fail, and the boot goes on without it.
+// removes "zoneinfo". marlin then makes both anew, by its own rules. Two to
+// four calls on a quiet boot; it may fail, and the boot goes on without it.
 #include <err.h>
 #include <limits.h>
 #include <unistd.h>
@@ -49,7 +49,9 @@ bool mixed(const link_read& tree, const link_read& icu_data) {
 bool mixed(const link_read& tree) {
   const link_read icu_data(paths::icu_link);
   if (!icu_data.missing()) return mixed(tree, icu_data);
-  // marlin is about to move a link from where older systems had it.
+  // marlin is about to move a link from where older systems had it, unless it
+  // leads nowhere.
+  if (::access(paths::legacy_icu_link, F_OK) != 0) return mixed(tree, icu_data);
   return mixed(tree, link_read(paths::legacy_icu_link));
 }
 
