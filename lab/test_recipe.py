@@ -43,3 +43,36 @@ def test_the_recipe(given):
                   "2025c.1.0 is activated: newer than 2025b.1.0",
                   "the change is recorded: 2025b.1.0_2025c.1.0"):
         assert words in last
+
+
+@pytest.mark.parametrize("tool", ["signify", "minisign"])
+def test_the_signature(tool, tmp_path):
+    """An update that was signed is installed, and one that was changed is not."""
+    text = (PROJECT / "docs/integration.md").read_text()
+    script = re.search(r"```\n(signify-openbsd -V .*?)```", text, re.DOTALL)[1]
+    minisign = re.search(r"`(minisign -V [^`]*)`", text)[1]
+    sign = ("signify-openbsd -G -n -p key.pub -s key.sec\n"
+            "signify-openbsd -S -s key.sec -m update.tar\n")
+    if tool == "minisign":
+        script = script.replace("signify-openbsd -V -p /etc/update.pub -m update.tar",
+                                minisign)
+        sign = ("minisign -G -W -p key.pub -s key.sec\n"
+                "minisign -S -s key.sec -m update.tar\n")
+    assert f"{tool}" in script
+    for given, here in (("/etc/update.pub", "key.pub"), ("/run/update", "update"),
+                        ("marlin-install", "ls -d")):
+        script = script.replace(given, here)
+    (tmp_path / "2024b.1.0").mkdir()
+
+    def done(*command):
+        return subprocess.run(command, cwd=tmp_path, capture_output=True, text=True)
+
+    assert done("tar", "-cf", "update.tar", "2024b.1.0").returncode == 0
+    signed = done("/bin/sh", "-euc", sign)
+    assert signed.returncode == 0, signed.stderr
+    verified = done("/bin/sh", "-c", script)
+    assert verified.returncode == 0 and "update/2024b.1.0" in verified.stdout, verified
+    with open(tmp_path / "update.tar", "ab") as archive:
+        archive.write(b"more")
+    refused = done("/bin/sh", "-c", script)
+    assert refused.returncode != 0 and "2024b.1.0" not in refused.stdout

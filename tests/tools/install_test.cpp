@@ -583,6 +583,16 @@ TEST_F(Installer, PrunesOnlyWhatNothingNeeds) {
   EXPECT_EQ(file_at(paris), tzif::file()) << "behind a link";
 }
 
+TEST_F(Installer, TellsWhatItPrunes) {
+  make_file(downloads + "/.marlin-install.new/x", "of one that was stopped");
+  make_file(update("2022a.1.0") + "/zoneinfo/+VERSION", "2022a");
+  run({"/bin/sh", "-c", MARLIN_INSTALL " --prune >/tmp/told"});
+  EXPECT_THAT(file_at("/tmp/told"),
+              ::testing::MatchesRegex("removed what an earlier one left: 1 "
+                                      "files, [0-9]+ kB\nremoved 2022a.1.0: 1 "
+                                      "files, [0-9]+ kB\n"));
+}
+
 TEST_F(Installer, DoesOneThingAtATime) {
   for (const auto& words :
        std::vector<std::vector<std::string>>{{},

@@ -53,8 +53,11 @@ downloads::downloads()
 }
 
 void downloads::delete_hidden() {
-  for (const char* name : {incoming, outgoing})
-    remove_entry(sets_.number(), name, path_of(name));
+  for (const char* name : {incoming, outgoing}) {
+    const removed gone = remove_entry(sets_.number(), name, path_of(name));
+    leftovers_.files += gone.files;
+    leftovers_.bytes += gone.bytes;
+  }
   remove_entry(links_.number(), next_announcement, next_announcement);
 }
 
@@ -107,6 +110,7 @@ bool downloads::withdraw() {
 
 void downloads::prune(
     const std::function<void(const std::string&, const removed&)>& tell) {
+  if (leftovers_.files != 0) tell("what an earlier one left", leftovers_);
   const std::set<std::string> needed = needed_sets();
   const listing sets = open_listing(sets_.number(), paths::download_root);
   while (const char* const found =

@@ -35,7 +35,8 @@ class downloads {
   // Removes "tz_latest". Whether it was there.
   bool withdraw();
 
-  // Deletes every set that nothing needs, and tells of each. Stops at one that
+  // Deletes every set that nothing needs, and tells of each, and of what an
+  // earlier one had left. Stops at one that
   // belongs to another user.
   void prune(const std::function<void(const std::string& name,
                                       const removed& gone)>& tell);
@@ -53,6 +54,7 @@ class downloads {
 
   descriptor links_{};
   descriptor sets_{};
+  removed leftovers_{};     // of an earlier one
   std::string placed_{};    // by put_in_place()
   std::string replaced_{};  // hidden by it
 };
