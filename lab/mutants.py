@@ -277,7 +277,8 @@ class Tree:
         if not (self.root / "build/build.ninja").exists():
             subprocess.run(
                 ["cmake", "-S", self.root, "-B", self.root / "build", "-G", "Ninja",
-                 "-DBUILD_TESTING=ON", "-DCMAKE_BUILD_TYPE=None",
+                 "-DBUILD_TESTING=ON", "-DMARLIN_TOOLS=OFF",
+                 "-DCMAKE_BUILD_TYPE=None",
                  "-DCMAKE_CXX_FLAGS=-O0 -w "
                  "-D_GLIBCXX_ASSERTIONS -fsanitize=return",
                  "-DCMAKE_GTEST_DISCOVER_TESTS_DISCOVERY_MODE=PRE_TEST"],
