@@ -30,6 +30,7 @@ import os
 import re
 from errno import EACCES, EEXIST, EINVAL, EISDIR, ENOENT, ENAMETOOLONG, ENOTDIR
 from errno import ENOTEMPTY, ERANGE
+from typing import NamedTuple
 
 from lab import lines
 from lab.device import Node, failure
@@ -604,12 +605,11 @@ class Boot:
             self.warn(lines.NOT_NEWER, update.version_text, current.version_text)
 
 
-class DataSet:
-    def __init__(self, path, version_text, version, schema):
-        self.path = path
-        self.version_text = version_text
-        self.version = version
-        self.schema = schema
+class DataSet(NamedTuple):
+    path: str
+    version_text: str
+    version: tuple
+    schema: str
 
 
 def zoneinfo_path(path):
@@ -625,11 +625,9 @@ class Outcome:
         self.ending = ending  # "exit 0", "abort" or "killed"
 
 
-def boot(device, fault=None, killed_before=None, walk_error=None):
+def boot(device, fault=None, killed_before=None):
     """Boots a device, which changes it; the arguments are those of Kernel."""
     kernel = Kernel(device, fault, killed_before)
-    if walk_error:
-        kernel.walk_error = walk_error
     pass_ = Boot(kernel)
     try:
         pass_.run()

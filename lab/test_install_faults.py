@@ -9,8 +9,8 @@ from errno import (EAGAIN, EDQUOT, EEXIST, EINTR, EIO, EMLINK, ENOLCK, ENOSPC,
 
 from lab import boot
 from lab.carriers import namespace
-from lab.install import (BUSY, DONE, FAILED, NEW, NOT_NEWER, SCENES, announced, hidden,
-                         names, next_boot, runs_again, traced, violations)
+from lab.install import (BUSY, DONE, FAILED, NEW, NOT_NEWER, SCENES, announced, calls,
+                         hidden, names, next_boot, runs_again, traced, violations)
 from lab.paths import update_path
 from lab.test_faults import CHANGE, ERRORS, LASTING, OPEN
 from lab.trial import fail
@@ -32,15 +32,12 @@ TELLING = {"create", "mkdir", "link", "rename", "symlink", "chmod", "fsync", "wr
 
 
 def disturbances(quick):
-    for scene, (make, words) in SCENES.items():
-        namespace.build(make())
-        traced(words)
-        calls = list(boot.calls())
+    for scene in SCENES:
+        made = calls(scene)
         # After that only what nobody needs is deleted, as far as that can be done.
-        done = max(number for number, call in enumerate(calls) if call.name == "fsync")
-        for number, call in enumerate(calls):
-            if number < boot.beginning(calls):
-                continue
+        done = max(number for number, call in enumerate(made) if call.name == "fsync")
+        start = boot.beginning(made)
+        for number, call in enumerate(made[start:], start):
             errors = EXPECTED.get(call.name, [])
             if quick and errors:
                 errors = [errors[number % len(errors)]]

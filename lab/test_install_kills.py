@@ -7,18 +7,15 @@ import pytest
 
 from lab import boot
 from lab.carriers import namespace
-from lab.install import (NEW, SCENES, announced, next_boot, runs_again, traced,
+from lab.install import (NEW, SCENES, announced, calls, next_boot, runs_again, traced,
                          violations)
 from lab.paths import update_path
 from lab.trial import fail
 
 
 def pytest_generate_tests(metafunc):
-    table = []
-    for scene, (make, words) in SCENES.items():
-        namespace.build(make())
-        traced(words)
-        table += [(scene, call) for call in list(boot.calls())[1:]]
+    # strace makes the first call itself.
+    table = [(scene, call) for scene in SCENES for call in calls(scene)[1:]]
     if metafunc.config.getoption("quick"):
         table = table[::4]
     metafunc.parametrize("scene, call", table, ids=[
@@ -31,8 +28,7 @@ def test_a_kill_of_the_installer(scene, call, boots_first, count):
     make, words = SCENES[scene]
     namespace.build(make())
     before = namespace.look()
-    told = traced(words, "-e", f"trace={call.call}",
-                  "-e", f"inject={call.call}:signal=KILL:when={call.number}")
+    told = traced(words, *boot.killing(call.call, call.number))
     after = namespace.look()
     found = violations(words, before, after)
     if told.ending != "killed" or told.log:
@@ -42,8 +38,6 @@ def test_a_kill_of_the_installer(scene, call, boots_first, count):
     is_new = announced(after) == update_path(NEW)
     count("kills that leave the new update announced" if is_new else
           "kills that leave the old announcement")
-    if boots_first:
-        next_boot(after)
-    else:
+    if not boots_first:
         runs_again(words, before)
-        next_boot(namespace.look())
+    next_boot(namespace.look())

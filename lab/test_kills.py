@@ -101,17 +101,8 @@ def kills(name: str, quick: bool):
             yield Killed(call.call, call.number, carried_out + (not within))
 
 
-class Change(NamedTuple):
-    call: str
-    number: int
-    killed_before: int
-
-    def kill(self):
-        return Killed(*self)
-
-
-def link_changes(device: Device):
-    """The changes to links in the next boot of a described device."""
+def kills_at_links(device: Device):
+    """One before every change to a link in the next boot of a described device."""
     families = {"symlink": "?symlink,?symlinkat", "unlink": "?unlink,?unlinkat"}
     counts = collections.Counter()
     for number, (name, _) in enumerate(model.boot(device).calls, start=1):
@@ -119,15 +110,15 @@ def link_changes(device: Device):
             return
         if name in families:
             counts[name] += 1
-            yield Change(families[name], counts[name], number)
+            yield Killed(families[name], counts[name], number)
 
 
 def pairs(name: str):
-    for first in link_changes(CHOSEN[name]()):
+    for first in kills_at_links(CHOSEN[name]()):
         device = CHOSEN[name]()
         model.boot(device, killed_before=first.killed_before)
-        for second in link_changes(device):
-            yield first.kill(), second.kill()
+        for second in kills_at_links(device):
+            yield first, second
 
 
 def pytest_generate_tests(metafunc):

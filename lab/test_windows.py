@@ -5,7 +5,6 @@ so that a change of the window is noticed even if model and program change alike
 
 from lab import boot, devices, lines
 from lab.carriers import namespace
-from lab.conditions import Killed
 from lab.paths import (DEFAULT_LOCALTIME, DEFAULT_ZONE, ICUTZ, LEGACY_ICUTZ, LOCALTIME,
                        RECORD, SYSTEM_ZONEINFO, TZ_LATEST, ZONEINFO, update_path)
 from lab.seen import as_device
@@ -18,8 +17,7 @@ def killed_before(name, path, device):
     call = next(call for call in boot.pass_of(list(boot.calls()))
                 if (call.name, call.path) == (name, path))
     namespace.build(device)
-    kill = Killed(call.call, call.number, None)
-    assert boot.traced(*kill.options(None)).ending == "killed"
+    assert boot.traced(*boot.killing(call.call, call.number)).ending == "killed"
 
 
 def boots(*printed):
