@@ -7,6 +7,8 @@ the next boot takes what is announced, or stays; and the next run is undisturbed
 from errno import (EAGAIN, EDQUOT, EEXIST, EINTR, EIO, EMLINK, ENOLCK, ENOSPC,
                    ENOTDIR, ENOTEMPTY, EPERM, EROFS, EXDEV, errorcode)
 
+import pytest
+
 from lab import boot
 from lab.carriers import namespace
 from lab.install import (BUSY, DONE, FAILED, NEW, NOT_NEWER, SCENES, announced, calls,
@@ -31,7 +33,8 @@ TAKEN = {EEXIST, ENOTDIR, ENOTEMPTY}
 TELLING = {"create", "mkdir", "link", "rename", "symlink", "chmod", "fsync", "write"}
 
 
-def disturbances(quick):
+def disturbances(option):
+    quick = option("quick")
     for scene in SCENES:
         made = calls(scene)
         # After that only what nobody needs is deleted, as far as that can be done.
@@ -42,18 +45,15 @@ def disturbances(quick):
             if quick and errors:
                 errors = [errors[number % len(errors)]]
             for error in sorted(errors):
-                yield scene, call, error, str(call.number), number <= done
-                if error in LASTING and not (quick and number % 4):
-                    yield scene, call, error, f"{call.number}+", number <= done
+                lasting = error in LASTING and not (quick and number % 4)
+                for when in [str(call.number)] + [f"{call.number}+"] * lasting:
+                    yield pytest.param(
+                        scene, call, error, when, number <= done,
+                        id=f"{scene}: {call.call} {when}, {call.name} "
+                           f"{call.path or ''} {errorcode[error]}")
 
 
-def pytest_generate_tests(metafunc):
-    table = list(disturbances(metafunc.config.getoption("quick")))
-    metafunc.parametrize("scene, call, error, when, telling", table, ids=[
-        f"{scene}: {call.call} {when}, {call.name} {call.path or ''} {errorcode[error]}"
-        for scene, call, error, when, _ in table])
-
-
+@pytest.mark.cases("scene, call, error, when, telling", disturbances)
 def test_a_call_that_fails(scene, call, error, when, telling, count):
     make, words = SCENES[scene]
     namespace.build(make())

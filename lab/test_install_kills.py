@@ -13,16 +13,15 @@ from lab.paths import update_path
 from lab.trial import fail
 
 
-def pytest_generate_tests(metafunc):
+def kills(option):
     # strace makes the first call itself.
-    table = [(scene, call) for scene in SCENES for call in calls(scene)[1:]]
-    if metafunc.config.getoption("quick"):
-        table = table[::4]
-    metafunc.parametrize("scene, call", table, ids=[
-        f"{scene}: {call.call} {call.number}, {call.name} {call.path or ''}"
-        for scene, call in table])
+    found = [pytest.param(scene, call, id=f"{scene}: {call.call} {call.number}, "
+                                          f"{call.name} {call.path or ''}")
+             for scene in SCENES for call in calls(scene)[1:]]
+    return found[::4] if option("quick") else found
 
 
+@pytest.mark.cases("scene, call", kills)
 @pytest.mark.parametrize("boots_first", [True, False])
 def test_a_kill_of_the_installer(scene, call, boots_first, count):
     make, words = SCENES[scene]

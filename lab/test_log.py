@@ -79,11 +79,9 @@ def disturbances(name):
                boot.failing(call.call, EIO, f"{call.number}+"), later, printed[:1])
 
 
-def pytest_generate_tests(metafunc):
-    if "hit" in metafunc.fixturenames:
-        table = [(name, *rest) for name in CHOSEN for rest in disturbances(name)]
-        metafunc.parametrize("name, what, options, hit, left", table,
-                             ids=[f"{name}: {what}" for name, what, *_ in table])
+def with_names(_):
+    return [pytest.param(name, what, *rest, id=f"{name}: {what}")
+            for name in CHOSEN for what, *rest in disturbances(name)]
 
 
 @pytest.mark.parametrize("log", LOST_LOGS)
@@ -129,6 +127,7 @@ def test_lines_in_one_write_each(name, count):
         fail("write by write", [repr(writes)], before)
 
 
+@pytest.mark.cases("name, what, options, hit, left", with_names)
 def test_a_log_that_fails_in_the_middle(name, what, options, hit, left):
     """The error texts of the lines that are left may have become those of the log's own
     failure."""

@@ -202,14 +202,13 @@ def test_a_chosen_device(name, count):
     examine(CHOSEN[name](), name, count)
 
 
-def pytest_generate_tests(metafunc):
-    if "numbers" in metafunc.fixturenames:
-        quick = metafunc.config.getoption("quick")
-        total = metafunc.config.getoption("states") or (1000 if quick else 20_000)
-        metafunc.parametrize("numbers", [range(first, first + BLOCK) for first in
-                                         range(0, total, BLOCK)], ids=str)
+def blocks(option):
+    total = option("states") or (1000 if option("quick") else 20_000)
+    return [pytest.param(range(first, first + BLOCK), id=str(first))
+            for first in range(0, total, BLOCK)]
 
 
+@pytest.mark.cases("numbers", blocks)
 def test_random_devices(numbers, count):
     for number in numbers:
         examine(compose(random.Random(f"status/{number}")), f"status/{number}", count)
