@@ -137,8 +137,8 @@ def look_below(path: str, entries: Entries):
         os.chmod(raw, mode)
 
 
-def described(path: Path) -> Node:
-    """A description of what stands anywhere on this machine."""
+def description_of(path: Path) -> Node:
+    """Of what stands anywhere on this machine."""
     entries, source = {}, decoded(os.fsencode(path))
     look_below(source, entries)
     return as_device(entries).find(source)
