@@ -155,5 +155,4 @@ def runs_again(words: list[str], before: Entries):
         found.append(f"after the next run {announced(after)} is announced")
     if words == ["--prune"] and set(names(after)) - {OLD, NEW}:
         found.append(f"the next run leaves {names(after)}")
-    if found:
-        fail("the next run", found, before)
+    fail("the next run", found, before)

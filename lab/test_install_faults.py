@@ -86,8 +86,7 @@ def test_a_call_that_fails(scene, call, error, when, telling, count):
         found += [f"{name} is left" for name in hidden(after)]
         if (NEW in names(after)) != (announced(after) is not None):
             found.append("what is there is not what is announced")
-    if found:
-        fail(f"{told}", found, before)
+    fail(f"{told}", found, before)
     count(f"that end with {told.ending}")
     runs_again(words, before)
     next_boot(namespace.look())

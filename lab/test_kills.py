@@ -139,8 +139,7 @@ def killed(device: Device, kill: Killed, start: Entries, whole_log="") -> model.
         found.append(f"ended with {booted.ending}")
     if whole_log and not whole_log.startswith(booted.log):
         found.append(f"printed {booted.log!r}")
-    if found:
-        fail(kill.name, found, start)
+    fail(kill.name, found, start)
     return outcome
 
 
@@ -153,8 +152,7 @@ def settles(name: str, device: Device, start: Entries):
             found += properties.not_ready(seen)
         if number > BOOTS_TO_SETTLE:
             found += properties.changed_by_a_settled_boot(properties.Judged(seen))
-        if found:
-            fail(f"boot {number} after the kill", found, start)
+        fail(f"boot {number} after the kill", found, start)
 
 
 @pytest.mark.cases("name, kill", kills)

@@ -102,8 +102,7 @@ def test_a_lost_log(name, log):
         found.append(f"ended with {ending}, expected {outcome.ending}")
     found += [f"a line landed in {path}" for path, here in after.items()
               if "marlin" in here.text or "terminate" in here.text]
-    if found:
-        fail(log, found, before)
+    fail(log, found, before)
 
 
 @pytest.mark.parametrize("name", CHOSEN)
@@ -149,5 +148,4 @@ def test_a_log_that_fails_in_the_middle(name, what, options, hit, left):
     if (printed[:len(left)] != left or
             len(printed) > len(left) and outcome.ending != "abort"):
         found.append(f"printed {booted.log!r}, expected {left}")
-    if found:
-        fail(what, found, before)
+    fail(what, found, before)

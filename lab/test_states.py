@@ -62,8 +62,7 @@ def settle(device: Device, tell: str, count):
             found += properties.changed_by_a_settled_boot(judged)
         elif turn > most_boots(judged.lines):
             found.append(f"has not settled after {turn - 1} boots")
-        if found:
-            fail(what, found, seen.before)
+        fail(what, found, seen.before)
         if contents == last:
             return
 

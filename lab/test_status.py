@@ -109,17 +109,13 @@ def link_differences(said: dict, entries: Entries) -> list[str]:
 def boot_differences(said: dict, seen: Seen) -> list[str]:
     found = link_differences(said["after"], seen.after)
     told = "".join(unescaped(line) + "\n" for line in said["lines"])
-    if said["ends"] == "normally":
-        if seen.ending != "exit 0":
-            found.append(f"said that it ends normally, but: {seen.ending}")
-        if told != seen.log:
-            found.append(f"said it prints {told!r}, prints {seen.log!r}")
-    else:
-        if seen.ending != "abort":
-            found.append(f"said that it ends abnormally, but: {seen.ending}")
-        # What follows is the runtime's.
-        if not seen.log.startswith(told) or lines.NAME in seen.log[len(told):]:
-            found.append(f"said it prints {told!r}, prints {seen.log!r}")
+    ending = {"normally": "exit 0", "abnormally": "abort"}[said["ends"]]
+    if seen.ending != ending:
+        found.append(f"said that it ends {said['ends']}, but: {seen.ending}")
+    rest = seen.log.removeprefix(told)
+    # What follows an abnormal end is the runtime's.
+    if told + rest != seen.log or lines.NAME in rest or rest and ending == "exit 0":
+        found.append(f"said it prints {told!r}, prints {seen.log!r}")
     return found
 
 
@@ -181,7 +177,7 @@ def examine(device: Device, tell: str, count):
     found = [f"changed: {path}" for path, now in times(*PLACES).items()
              if untouched.get(path) != now]
     if answer.status == 77:
-        fail(f"{tell}: {answer.errors}", found, before)
+        fail(tell, [*found, answer.errors], before)
     said = answer.said
     booted = boot.boot()
     seen = Seen(before, namespace.look(), *booted)
@@ -190,8 +186,7 @@ def examine(device: Device, tell: str, count):
     found += status_differences(said, seen) + reason_differences(said)
     if answer.status != said["status"] or answer.errors:
         found.append(f"exit status {answer.status}, {answer.errors!r}")
-    if found:
-        fail(tell, found, before)
+    fail(tell, found, before)
     for step in said["next_boot"]["steps"]:
         count(f"said: {step['step']} {step['does']}: {step['reason']}")
     count(f"status {answer.status}")
