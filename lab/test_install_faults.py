@@ -37,8 +37,10 @@ def disturbances(option):
     quick = option("quick")
     for scene in SCENES:
         made = calls(scene)
-        # After that only what nobody needs is deleted, as far as that can be done.
-        done = max(number for number, call in enumerate(made) if call.name == "fsync")
+        # After the last of these only what nobody needs is deleted, as far as that can
+        # be done; so are leftovers before the first, which a withdrawal does not need.
+        synced = [number for number, call in enumerate(made) if call.name == "fsync"]
+        telling = range(synced[0] * (scene == "withdrawing"), synced[-1] + 1)
         start = boot.beginning(made)
         for number, call in enumerate(made[start:], start):
             errors = EXPECTED.get(call.name, [])
@@ -48,7 +50,7 @@ def disturbances(option):
                 lasting = error in LASTING and not (quick and number % 4)
                 for when in [str(call.number)] + [f"{call.number}+"] * lasting:
                     yield pytest.param(
-                        scene, call, error, when, number <= done,
+                        scene, call, error, when, number in telling,
                         id=f"{scene}: {call.call} {when}, {call.name} "
                            f"{call.path or ''} {errorcode[error]}")
 
