@@ -41,6 +41,10 @@ class Node:
         """Whether the owner, which the program runs as, may: 4, 2, 1 or sums."""
         return self.mode >> 6 & wanted == wanted
 
+    def insist_on(self, wanted: int):
+        if not self.permits(wanted):
+            raise failure(EACCES)
+
     def everything(self, path: str) -> Iterator[tuple[str, Node]]:
         """Every (path, node) from here, which is at this path, downwards."""
         yield path, self
@@ -166,8 +170,7 @@ class Device:
             directory, name = way[-1], todo.pop(0)
             if directory.kind != "dir":
                 raise failure(ENOTDIR)
-            if not directory.permits(1):
-                raise failure(EACCES)
+            directory.insist_on(1)
             if name == ".":
                 continue
             if name == "..":
