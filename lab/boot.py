@@ -7,7 +7,7 @@ import errno
 import os
 import re
 import signal
-from collections.abc import Iterator
+from collections.abc import Iterator, Sequence
 from typing import NamedTuple
 
 from lab.carriers.namespace import insist_on_private_device
@@ -31,12 +31,14 @@ def ending_of(status: int) -> str:
         number, f"signal {number}")
 
 
-def boot(*wrapper: str) -> Booted:
-    """Runs the program, as the last words of another command if one is given, with
-    nothing but a log at standard error."""
-    log = os.memfd_create("log")
-    null = os.open("/dev/null", os.O_RDWR)
-    status = spawn([*wrapper, PROGRAM], {0: null, 1: null, 2: log})
+def boot() -> Booted:
+    return run(PROGRAM)
+
+
+def run(*command: str) -> Booted:
+    """Runs a command with nothing but a log at standard error."""
+    log, null = os.memfd_create("log"), os.open("/dev/null", os.O_RDWR)
+    status = spawn([*command], {0: null, 1: null, 2: log})
     os.close(null)
     os.lseek(log, 0, os.SEEK_SET)
     with open(log, encoding="latin-1", newline="") as printed:
@@ -101,9 +103,9 @@ TRACED = ",".join("?" + call for call in NAMES)
 WITH_PATH = set("access readlink open create stat lstat symlink unlink rmdir".split())
 
 
-def traced(*options: str) -> Booted:
+def traced(*options: str, command: Sequence[str] = (PROGRAM,)) -> Booted:
     """Boots under strace; every line of its log has one whole call."""
-    return boot("/usr/bin/strace", "-o", TRACE, "-s", "0", *options)
+    return run("/usr/bin/strace", "-o", TRACE, "-s", "0", *options, *command)
 
 
 def inject(call: str, what: str, when) -> list[str]:
@@ -114,6 +116,12 @@ def inject(call: str, what: str, when) -> list[str]:
 
 def failing(call: str, number: int, when) -> list[str]:
     return inject(call, f"error={errno.errorcode[number]}", when)
+
+
+def killing(call: str, when: int) -> list[str]:
+    """The options that kill before the call takes effect; `call` may be several names
+    with "?", of which one is counted."""
+    return ["-e", f"trace={call}", "-e", f"inject={call}:signal=KILL:when={when}"]
 
 
 def calls() -> Iterator[Call]:

@@ -137,14 +137,12 @@ class WritesInPart(Condition):
 
 
 class Killed(Condition):
-    """Killed before a call takes effect. `killed_before` counts calls of the pass,
-    `call` is the machine's name of the call, or several names with "?", and `turn` its
-    number among those calls."""
+    """Killed before a call of the pass, by its number there. The other two are those of
+    boot.killing."""
 
     def __init__(self, call: str, turn: int, killed_before: int):
         self.call, self.turn, self.killed_before = call, turn, killed_before
         self.name = f"killed before {call} number {turn}"
 
     def options(self, outcome):
-        return ["-e", f"trace={self.call}",
-                "-e", f"inject={self.call}:signal=KILL:when={self.turn}"]
+        return boot.killing(self.call, self.turn)

@@ -41,10 +41,19 @@ def pytest_addoption(parser):
 
 
 def pytest_configure(config):
+    config.addinivalue_line(
+        "markers", "cases(names, table): table(option) gives the cases of a run; "
+        "option gives the value of an option above")
     hypothesis.settings.register_profile(
         "run", max_examples=300 if config.getoption("quick") else 3000, deadline=None,
         database=None, suppress_health_check=list(hypothesis.HealthCheck))
     hypothesis.settings.load_profile("run")
+
+
+def pytest_generate_tests(metafunc):
+    for mark in metafunc.definition.iter_markers("cases"):
+        names, table = mark.args
+        metafunc.parametrize(names, list(table(metafunc.config.getoption)))
 
 
 def pytest_sessionstart(session):

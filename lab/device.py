@@ -41,6 +41,16 @@ class Node:
         """Whether the owner, which the program runs as, may: 4, 2, 1 or sums."""
         return self.mode >> 6 & wanted == wanted
 
+    def insist_on(self, wanted: int):
+        if not self.permits(wanted):
+            raise failure(EACCES)
+
+    def everything(self, path: str) -> Iterator[tuple[str, Node]]:
+        """Every (path, node) from here, which is at this path, downwards."""
+        yield path, self
+        for name, child in (self.entries or {}).items():
+            yield from child.everything(f"{path}/{name}")
+
 
 def names_in(path: str) -> list[str]:
     return [name for name in path.split("/") if name]
@@ -58,20 +68,19 @@ class Device:
 
     def directory(self, path: str, mode=0o755) -> Node:
         """Makes a directory, and those that lead to it."""
+        here = self.made(path)
+        here.mode = mode
+        return here
+
+    def made(self, path: str) -> Node:
         here = self.root
         for name in names_in(path):
-            if name not in here.entries:
-                here.entries[name] = Node("dir", 0o755, entries={})
-            here = here.entries[name]
-        here.mode = mode
+            here = here.entries.setdefault(name, Node("dir", 0o755, entries={}))
         return here
 
     def put(self, path: str, node: Node):
         parent, _, name = path.rpartition("/")
-        here = self.root
-        for step in names_in(parent):
-            here = here.entries.setdefault(step, Node("dir", 0o755, entries={}))
-        here.entries[name] = node
+        self.made(parent).entries[name] = node
 
     def file(self, path: str, content="", mode=0o644):
         self.put(path, Node("file", mode, content))
@@ -132,15 +141,8 @@ class Device:
 
     def everything(self) -> Iterator[tuple[str, Node]]:
         """Every (path, node) of the device."""
-
-        def below(path, node):
-            yield path, node
-            if node.kind == "dir":
-                for name, child in node.entries.items():
-                    yield from below(path + "/" + name, child)
-
         for path in PLACES:
-            yield from below(path, self.find(path))
+            yield from self.find(path).everything(path)
 
     def contents(self) -> dict[str, str]:
         """The texts of all files and links, by path."""
@@ -168,8 +170,7 @@ class Device:
             directory, name = way[-1], todo.pop(0)
             if directory.kind != "dir":
                 raise failure(ENOTDIR)
-            if not directory.permits(1):
-                raise failure(EACCES)
+            directory.insist_on(1)
             if name == ".":
                 continue
             if name == "..":

@@ -13,14 +13,21 @@ CHOSEN: dict[str, Callable[[], Device]] = {}  # by name; each call makes a new o
 ABNORMAL: set[str] = set()  # those on which a boot ends abnormally, as it has to
 
 
-def chosen(make):
-    CHOSEN[make.__name__.replace("_", " ")] = make
-    return make
+def chosen(start=sound_device, *arguments: str, abnormal=False):
+    """The function that follows changes a device that `start` makes."""
+    def add(change):
+        def make():
+            device = start(*arguments)
+            change(device)
+            return device
 
+        name = change.__name__.replace("_", " ")
+        CHOSEN[name] = make
+        if abnormal:
+            ABNORMAL.add(name)
+        return make
 
-def chosen_abnormal(make):
-    ABNORMAL.add(make.__name__.replace("_", " "))
-    return chosen(make)
+    return add
 
 
 def activation(current: str | None = None, update="2024a.1.0") -> Device:
@@ -38,103 +45,84 @@ def activation(current: str | None = None, update="2024a.1.0") -> Device:
 # --- Boots that end well ------------------------------------------------------
 
 
-@chosen
-def nothing_to_do():
-    return sound_device()
+@chosen()
+def nothing_to_do(device):
+    """The links are right, and nothing is announced."""
 
 
-@chosen
-def update_stays():
-    return activation("2024a.1.0")
+@chosen(activation, "2024a.1.0")
+def update_stays(device):
+    """It is announced still."""
 
 
-@chosen
-def first_activation():
-    return activation()
+@chosen(activation)
+def first_activation(device):
+    """The system's data is in use."""
 
 
-@chosen
-def activation_after_an_update():
-    return activation("2023d.1.0")
+@chosen(activation, "2023d.1.0")
+def activation_after_an_update(device):
+    """That one has left its record."""
 
 
-@chosen
-def links_wiped():
-    device = sound_device()
+@chosen()
+def links_wiped(device):
     device.drop(ZONEINFO)
     device.drop(LOCALTIME)
-    return device
 
 
-@chosen
-def links_wiped_and_update_announced():
-    device = activation()
+@chosen(activation)
+def links_wiped_and_update_announced(device):
     device.drop(ZONEINFO)
-    return device
 
 
-@chosen
-def system_overtakes_the_update():
-    device = sound_device()
+@chosen()
+def system_overtakes_the_update(device):
     device.install_update("2023b.1.0")
     device.point_links_at("2023b.1.0")
     device.link(LEGACY_ICUTZ, "/nowhere")
-    return device
 
 
-@chosen
-def reset_then_an_update_older_than_the_system():
-    device = sound_device()
+@chosen()
+def reset_then_an_update_older_than_the_system(device):
     device.install_update("2023a.1.0")
     device.install_update("2023b.1.0")
     device.point_links_at("2023a.1.0")
     device.announce("2023b.1.0")
-    return device
 
 
-@chosen
-def reset_for_the_schema_then_an_update():
-    device = sound_device()
+@chosen()
+def reset_for_the_schema_then_an_update(device):
     device.install_update("2024a.1.0", "45l")
     device.install_update("2024b.1.0")
     device.point_links_at("2024a.1.0")
     device.announce("2024b.1.0")
-    return device
 
 
-@chosen
-def update_of_another_schema():
-    device = activation()
+@chosen(activation)
+def update_of_another_schema(device):
     device.drop(f"{update_path('2024a.1.0')}/icutz/icutz44l.dat")
     device.file(f"{update_path('2024a.1.0')}/icutz/icutz45b.dat", "ICU")
-    return device
 
 
-@chosen
-def announcement_is_no_data_set():
-    device = activation("2024a.1.0")
+@chosen(activation, "2024a.1.0")
+def announcement_is_no_data_set(device):
     device.link(TZ_LATEST, "tz/2024a.1.0")
-    return device
 
 
-@chosen
-def announcement_is_a_file():
-    device = activation("2024a.1.0")
+@chosen(activation, "2024a.1.0")
+def announcement_is_a_file(device):
     device.file(TZ_LATEST, "2024a.1.0")
-    return device
 
 
-@chosen
-def announcement_of_a_number_too_great():
-    device = activation("2024a.1.0")
+@chosen(activation, "2024a.1.0")
+def announcement_of_a_number_too_great(device):
     device.announce("2024b.2147483648")
-    return device
 
 
-@chosen
-def crowded_icu_directory():
+@chosen(activation)
+def crowded_icu_directory(device):
     """Data that counts among much that does not, behind a link."""
-    device = activation()
     icu = f"{update_path('2024a.1.0')}/icutz"
     device.drop(icu)
     device.link(icu, "icu-data")
@@ -146,108 +134,81 @@ def crowded_icu_directory():
         device.file(f"{real}/{name}", "x")
     device.link(f"{real}/icutz46l.dat", "icutz44l.dat")
     device.file(f"{real}/icutz47l.dat/icutz48l.dat", "ICU")
-    return device
 
 
-@chosen
-def no_icu_data():
-    device = activation("2023d.1.0")
+@chosen(activation, "2023d.1.0")
+def no_icu_data(device):
     device.drop(f"{update_path('2023d.1.0')}/icutz")
     device.link(f"{update_path('2023d.1.0')}/icutz", "gone")
     device.drop(f"{update_path('2024a.1.0')}/icutz/icutz44l.dat")
-    return device
 
 
-@chosen
-def legacy_migration():
-    device = activation("2024a.1.0")
+@chosen(activation, "2024a.1.0")
+def legacy_migration(device):
     device.drop(ICUTZ)
     device.link(LEGACY_ICUTZ, f"{update_path('2024a.1.0')}/icutz")
     device.directory(OLD_ICU)
-    return device
 
 
-@chosen
-def legacy_directory():
-    device = sound_device()
+@chosen()
+def legacy_directory(device):
     device.directory(LEGACY_ICUTZ)
     device.file(f"{OLD_ICU}/data", "x")
-    return device
 
 
-@chosen
-def localtime_corrected():
-    device = sound_device()
+@chosen()
+def localtime_corrected(device):
     device.link(LOCALTIME, "/usr/share/zoneinfo/Europe/Paris")
     device.file(OLD_ICU, "x")
-    return device
 
 
-@chosen
-def localtime_corrected_in_vain():
-    device = sound_device()
+@chosen()
+def localtime_corrected_in_vain(device):
     device.link(LOCALTIME, "/usr/share/zoneinfo/Europe/Nowhere")
-    return device
 
 
-@chosen
-def localtime_relative():
-    device = sound_device()
+@chosen()
+def localtime_relative(device):
     device.link(LOCALTIME, "zoneinfo/Europe/Paris")
-    return device
 
 
-@chosen
-def localtime_file():
-    device = sound_device()
+@chosen()
+def localtime_file(device):
     device.file(LOCALTIME, "TZif")
-    return device
 
 
-@chosen
-def localtime_directory():
-    device = sound_device()
+@chosen()
+def localtime_directory(device):
     device.directory(LOCALTIME)
-    return device
 
 
-@chosen
-def long_version_file():
+@chosen(activation)
+def long_version_file(device):
     """A word that ends where a read does, and a format without a line end."""
-    device = activation()
     device.file(f"{SYSTEM_ZONEINFO}/+VERSION", "2023c".rjust(4096) + "\n" + "x" * 5000)
     device.file(f"{SYSTEM_ICU}/icutzformat.txt", "44l")
-    return device
 
 
 # --- Boots that end abnormally, as they have to -------------------------------
 
 
-@chosen_abnormal
-def no_timezone_directory():
-    device = sound_device()
+@chosen(abnormal=True)
+def no_timezone_directory(device):
     device.drop(TIMEZONE)
-    return device
 
 
-@chosen_abnormal
-def localtime_blocked():
-    device = sound_device()
+@chosen(abnormal=True)
+def localtime_blocked(device):
     device.drop(LOCALTIME)
     device.file(f"{LOCALTIME}/inside", "x")
-    return device
 
 
-@chosen_abnormal
-def zoneinfo_blocked():
-    device = activation()
+@chosen(activation, abnormal=True)
+def zoneinfo_blocked(device):
     device.drop(ZONEINFO)
     device.file(f"{ZONEINFO}/inside", "x")
-    return device
 
 
-@chosen_abnormal
-def system_release_too_great():
-    device = sound_device()
+@chosen(abnormal=True)
+def system_release_too_great(device):
     device.file(f"{SYSTEM_ZONEINFO}/+VERSION", "99999999999a\n")
-    return device

@@ -10,7 +10,7 @@ from lab.carriers import namespace
 from lab.device import Device, sound_device
 from lab.paths import (DOWNLOADS, ICUTZ, LOCALTIME, RECORD, TIMEZONE, TZ_LATEST,
                        ZONEINFO, update_path)
-from lab.seen import Entries, as_device
+from lab.seen import Call, Entries, as_device
 from lab.trial import fail, trial
 
 PROGRAM = os.path.join(os.path.dirname(boot.PROGRAM), "tools/marlin-install")
@@ -75,18 +75,20 @@ SCENES = {
 }
 
 
-def run(words: list[str], *wrapper: str) -> boot.Booted:
-    """Runs the installer with nothing but a log at standard error."""
-    log, null = os.memfd_create("log"), os.open("/dev/null", os.O_RDWR)
-    status = boot.spawn([*wrapper, PROGRAM, *words], {0: null, 1: null, 2: log})
-    os.close(null)
-    os.lseek(log, 0, os.SEEK_SET)
-    with open(log, encoding="latin-1", newline="") as printed:
-        return boot.Booted(boot.ending_of(status), printed.read())
+def run(words: list[str]) -> boot.Booted:
+    return boot.run(PROGRAM, *words)
 
 
 def traced(words: list[str], *options: str) -> boot.Booted:
-    return run(words, "/usr/bin/strace", "-o", boot.TRACE, "-s", "0", *options)
+    return boot.traced(*options, command=[PROGRAM, *words])
+
+
+def calls(scene: str) -> list[Call]:
+    """Those of an undisturbed run."""
+    make, words = SCENES[scene]
+    namespace.build(make())
+    traced(words)
+    return list(boot.calls())
 
 
 def below(entries: Entries, place: str) -> dict:
@@ -108,6 +110,11 @@ def announced(entries: Entries) -> str | None:
     return entries[TZ_LATEST].text if TZ_LATEST in entries else None
 
 
+def announced_at_the_end(words: list[str], before: Entries) -> str | None:
+    return {"--prune": announced(before), "--withdraw": None}.get(
+        words[0], update_path(NEW))
+
+
 def violations(words: list[str], before: Entries, after: Entries) -> list[str]:
     """What must not be, whatever happened to the installer."""
     found = [f"{path} was changed" for path in NOT_ITS_OWN
@@ -122,9 +129,7 @@ def violations(words: list[str], before: Entries, after: Entries) -> list[str]:
         if not name.startswith(HIDDEN) and here != was and not is_update:
             found.append(f"{name} is neither what it was nor the update")
     target = announced(after)
-    other = {"--prune": announced(before), "--withdraw": None}.get(
-        words[0], update_path(NEW))
-    if target not in (announced(before), other):
+    if target not in (announced(before), announced_at_the_end(words, before)):
         found.append(f"{target} is announced")
     if target == update_path(NEW) and below(after, target) != source:
         found.append(f"{NEW} is announced and not whole")
@@ -146,11 +151,8 @@ def runs_again(words: list[str], before: Entries):
     found += [f"{name} is left" for name in hidden(after)]
     if again.ending not in (DONE, NOT_NEWER):
         found.append(f"the next run ends with {again.ending}: {again.log}")
-    wanted = {"--prune": announced(before), "--withdraw": None}.get(
-        words[0], update_path(NEW))
-    if announced(after) != wanted:
+    if announced(after) != announced_at_the_end(words, before):
         found.append(f"after the next run {announced(after)} is announced")
     if words == ["--prune"] and set(names(after)) - {OLD, NEW}:
         found.append(f"the next run leaves {names(after)}")
-    if found:
-        fail("the next run", found, before)
+    fail("the next run", found, before)

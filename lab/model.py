@@ -28,8 +28,9 @@ The sections, from the bottom up:
 import functools
 import os
 import re
-from errno import EACCES, EEXIST, EINVAL, EISDIR, ENOENT, ENAMETOOLONG, ENOTDIR
+from errno import EEXIST, EINVAL, EISDIR, ENOENT, ENAMETOOLONG, ENOTDIR
 from errno import ENOTEMPTY, ERANGE
+from typing import NamedTuple
 
 from lab import lines
 from lab.device import Node, failure
@@ -112,8 +113,7 @@ class Kernel:
         directory, name, node = self.device.walk(path, follow=False)
         if node is not None:
             raise failure(EEXIST)
-        if not directory.permits(3):
-            raise failure(EACCES)
+        directory.insist_on(3)
         made = Node("link", text=target)
         directory.entries[name] = made
         self.changed |= {directory, made}
@@ -122,8 +122,7 @@ class Kernel:
     def unlink(self, path):
         self._call("unlink", path)
         directory, name, node = self._existing(path, follow=False)
-        if not directory.permits(3):
-            raise failure(EACCES)
+        directory.insist_on(3)
         if node.kind == "dir":
             raise failure(EISDIR)
         del directory.entries[name]
@@ -133,8 +132,7 @@ class Kernel:
     def rmdir(self, path):
         self._call("rmdir", path)
         directory, name, node = self._existing(path, follow=False)
-        if not directory.permits(3):
-            raise failure(EACCES)
+        directory.insist_on(3)
         if node.kind != "dir":
             raise failure(ENOTDIR)
         if node.entries:
@@ -146,8 +144,7 @@ class Kernel:
     def open(self, path):
         self._call("open", path)
         node = self._existing(path, follow=True)[2]
-        if not node.permits(4):
-            raise failure(EACCES)
+        node.insist_on(4)
         return node
 
     @system_call
@@ -156,16 +153,14 @@ class Kernel:
         self._call("create", path)
         directory, name, node = self.device.walk(path, follow=True)
         if node is None:
-            if not directory.permits(3):
-                raise failure(EACCES)
+            directory.insist_on(3)
             node = Node("file", 0o644)  # 0666 as this device's umask cuts it
             directory.entries[name] = node
             self.changed |= {directory, node}
             return node
         if node.kind == "dir":
             raise failure(EISDIR)
-        if not node.permits(2):
-            raise failure(EACCES)
+        node.insist_on(2)
         node.text = ""
         self.changed.add(node)
         return node
@@ -214,8 +209,8 @@ class Kernel:
     def fchdir(self, node=None):
         """To a directory, or back to where the process started."""
         self._call("fchdir")
-        if node is not None and not node.permits(1):
-            raise failure(EACCES)
+        if node is not None:
+            node.insist_on(1)
 
     @system_call
     def getdents(self, node):
@@ -604,12 +599,11 @@ class Boot:
             self.warn(lines.NOT_NEWER, update.version_text, current.version_text)
 
 
-class DataSet:
-    def __init__(self, path, version_text, version, schema):
-        self.path = path
-        self.version_text = version_text
-        self.version = version
-        self.schema = schema
+class DataSet(NamedTuple):
+    path: str
+    version_text: str
+    version: tuple
+    schema: str
 
 
 def zoneinfo_path(path):
@@ -625,11 +619,9 @@ class Outcome:
         self.ending = ending  # "exit 0", "abort" or "killed"
 
 
-def boot(device, fault=None, killed_before=None, walk_error=None):
+def boot(device, fault=None, killed_before=None):
     """Boots a device, which changes it; the arguments are those of Kernel."""
     kernel = Kernel(device, fault, killed_before)
-    if walk_error:
-        kernel.walk_error = walk_error
     pass_ = Boot(kernel)
     try:
         pass_.run()

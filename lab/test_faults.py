@@ -8,9 +8,10 @@ from errno import (EACCES, EAGAIN, EBUSY, EDQUOT, EEXIST, EFBIG, EINTR, EINVAL, 
                    EISDIR, ELOOP, EMFILE, ENAMETOOLONG, ENFILE, ENODEV, ENOENT, ENOMEM,
                    ENOSPC, ENOTDIR, ENOTEMPTY, ENXIO, EOVERFLOW, EPERM, EROFS, ETXTBSY)
 
+import pytest
+
 from lab import boot
-from lab.conditions import (Fails, FailsForGood, WritesInPart,
-                            storage_conditions)
+from lab.conditions import Fails, FailsForGood, WritesInPart, storage_conditions
 from lab.devices import CHOSEN
 from lab.trial import trial, undisturbed
 
@@ -45,8 +46,7 @@ LASTING = {EACCES, EDQUOT, EIO, EMFILE, ENFILE, ENOMEM, ENOSPC, EPERM, EROFS}
 QUICK = {ENOENT, EISDIR, EEXIST, EIO}
 
 
-def disturbances(quick):
-    """The tables: (test, device, condition)."""
+def disturbances(option):
     count = 0
     for name, make in CHOSEN.items():
         calls = boot.pass_of(undisturbed(name).calls)
@@ -54,41 +54,27 @@ def disturbances(quick):
             count += 1
             once = ERRORS[call.name]
             for_good = [error for error in once if error in LASTING]
-            if quick:
+            if option("quick"):
                 turn = once[count % len(once)]
                 once = [error for error in once if error in QUICK or error == turn]
                 for_good = [for_good[count % len(for_good)]]
             for error in once:
-                yield "call", name, Fails(number, call, error)
+                yield "a call that fails", name, Fails(number, call, error)
             for error in for_good:
-                yield "good", name, FailsForGood(number, call, error)
+                yield "a failure for good", name, FailsForGood(number, call, error)
             if call.name == "write":
                 for taken in (0, 1, 8):
-                    yield "part", name, WritesInPart(number, call, taken)
+                    yield "a write in part", name, WritesInPart(number, call, taken)
         for condition in storage_conditions(make(), calls):
             yield "storage", name, condition
 
 
-def pytest_generate_tests(metafunc):
-    kind = metafunc.function.__name__
-    table = [(name, condition) for test, name, condition
-             in disturbances(metafunc.config.getoption("quick")) if test in kind]
-    if "condition" in metafunc.fixturenames:
-        metafunc.parametrize("name, condition", table,
-                             ids=[f"{n}: {c.name}" for n, c in table])
+def with_names(option):
+    for kind, name, condition in disturbances(option):
+        yield pytest.param(kind, name, condition, id=f"{name}: {condition.name}")
 
 
-def test_a_call_that_fails(name, condition):
+@pytest.mark.cases("kind, name, condition", with_names)
+def test_a_disturbance(kind, name, condition, count):
     trial(CHOSEN[name](), condition)
-
-
-def test_a_failure_for_good(name, condition):
-    trial(CHOSEN[name](), condition)
-
-
-def test_storage(name, condition):
-    trial(CHOSEN[name](), condition)
-
-
-def test_a_write_in_part(name, condition):
-    trial(CHOSEN[name](), condition)
+    count(kind)

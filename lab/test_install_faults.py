@@ -7,10 +7,12 @@ the next boot takes what is announced, or stays; and the next run is undisturbed
 from errno import (EAGAIN, EDQUOT, EEXIST, EINTR, EIO, EMLINK, ENOLCK, ENOSPC,
                    ENOTDIR, ENOTEMPTY, EPERM, EROFS, EXDEV, errorcode)
 
+import pytest
+
 from lab import boot
 from lab.carriers import namespace
-from lab.install import (BUSY, DONE, FAILED, NEW, NOT_NEWER, SCENES, announced, hidden,
-                         names, next_boot, runs_again, traced, violations)
+from lab.install import (BUSY, DONE, FAILED, NEW, NOT_NEWER, SCENES, announced, calls,
+                         hidden, names, next_boot, runs_again, traced, violations)
 from lab.paths import update_path
 from lab.test_faults import CHANGE, ERRORS, LASTING, OPEN
 from lab.trial import fail
@@ -31,32 +33,29 @@ TAKEN = {EEXIST, ENOTDIR, ENOTEMPTY}
 TELLING = {"create", "mkdir", "link", "rename", "symlink", "chmod", "fsync", "write"}
 
 
-def disturbances(quick):
-    for scene, (make, words) in SCENES.items():
-        namespace.build(make())
-        traced(words)
-        calls = list(boot.calls())
-        # After that only what nobody needs is deleted, as far as that can be done.
-        done = max(number for number, call in enumerate(calls) if call.name == "fsync")
-        for number, call in enumerate(calls):
-            if number < boot.beginning(calls):
-                continue
+def disturbances(option):
+    quick = option("quick")
+    for scene in SCENES:
+        made = calls(scene)
+        # After the last of these only what nobody needs is deleted, as far as that can
+        # be done; so are leftovers before the first, which a withdrawal does not need.
+        synced = [number for number, call in enumerate(made) if call.name == "fsync"]
+        telling = range(synced[0] * (scene == "withdrawing"), synced[-1] + 1)
+        start = boot.beginning(made)
+        for number, call in enumerate(made[start:], start):
             errors = EXPECTED.get(call.name, [])
             if quick and errors:
                 errors = [errors[number % len(errors)]]
             for error in sorted(errors):
-                yield scene, call, error, str(call.number), number <= done
-                if error in LASTING and not (quick and number % 4):
-                    yield scene, call, error, f"{call.number}+", number <= done
+                lasting = error in LASTING and not (quick and number % 4)
+                for when in [str(call.number)] + [f"{call.number}+"] * lasting:
+                    yield pytest.param(
+                        scene, call, error, when, number in telling,
+                        id=f"{scene}: {call.call} {when}, {call.name} "
+                           f"{call.path or ''} {errorcode[error]}")
 
 
-def pytest_generate_tests(metafunc):
-    table = list(disturbances(metafunc.config.getoption("quick")))
-    metafunc.parametrize("scene, call, error, when, telling", table, ids=[
-        f"{scene}: {call.call} {when}, {call.name} {call.path or ''} {errorcode[error]}"
-        for scene, call, error, when, _ in table])
-
-
+@pytest.mark.cases("scene, call, error, when, telling", disturbances)
 def test_a_call_that_fails(scene, call, error, when, telling, count):
     make, words = SCENES[scene]
     namespace.build(make())
@@ -89,8 +88,7 @@ def test_a_call_that_fails(scene, call, error, when, telling, count):
         found += [f"{name} is left" for name in hidden(after)]
         if (NEW in names(after)) != (announced(after) is not None):
             found.append("what is there is not what is announced")
-    if found:
-        fail(f"{told}", found, before)
+    fail(f"{told}", found, before)
     count(f"that end with {told.ending}")
     runs_again(words, before)
     next_boot(namespace.look())

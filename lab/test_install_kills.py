@@ -7,43 +7,35 @@ import pytest
 
 from lab import boot
 from lab.carriers import namespace
-from lab.install import (NEW, SCENES, announced, next_boot, runs_again, traced,
+from lab.install import (NEW, SCENES, announced, calls, next_boot, runs_again, traced,
                          violations)
 from lab.paths import update_path
 from lab.trial import fail
 
 
-def pytest_generate_tests(metafunc):
-    table = []
-    for scene, (make, words) in SCENES.items():
-        namespace.build(make())
-        traced(words)
-        table += [(scene, call) for call in list(boot.calls())[1:]]
-    if metafunc.config.getoption("quick"):
-        table = table[::4]
-    metafunc.parametrize("scene, call", table, ids=[
-        f"{scene}: {call.call} {call.number}, {call.name} {call.path or ''}"
-        for scene, call in table])
+def kills(option):
+    # strace makes the first call itself.
+    found = [pytest.param(scene, call, id=f"{scene}: {call.call} {call.number}, "
+                                          f"{call.name} {call.path or ''}")
+             for scene in SCENES for call in calls(scene)[1:]]
+    return found[::4] if option("quick") else found
 
 
+@pytest.mark.cases("scene, call", kills)
 @pytest.mark.parametrize("boots_first", [True, False])
 def test_a_kill_of_the_installer(scene, call, boots_first, count):
     make, words = SCENES[scene]
     namespace.build(make())
     before = namespace.look()
-    told = traced(words, "-e", f"trace={call.call}",
-                  "-e", f"inject={call.call}:signal=KILL:when={call.number}")
+    told = traced(words, *boot.killing(call.call, call.number))
     after = namespace.look()
     found = violations(words, before, after)
     if told.ending != "killed" or told.log:
         found.append(f"ended with {told.ending}, printed {told.log!r}")
-    if found:
-        fail("the kill", found, before)
+    fail("the kill", found, before)
     is_new = announced(after) == update_path(NEW)
     count("kills that leave the new update announced" if is_new else
           "kills that leave the old announcement")
-    if boots_first:
-        next_boot(after)
-    else:
+    if not boots_first:
         runs_again(words, before)
-        next_boot(namespace.look())
+    next_boot(namespace.look())

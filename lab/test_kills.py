@@ -12,6 +12,8 @@ has to settle in the same way.
 import collections
 from typing import NamedTuple
 
+import pytest
+
 from lab import boot, model, properties
 from lab.carriers import namespace
 from lab.conditions import Killed
@@ -87,31 +89,24 @@ def window_of(path, left, usual, carried_out):
 CHANGES = ("symlink", "unlink", "rmdir", "create", "write")
 
 
-def kills(name: str, quick: bool):
-    """One before every call of a chosen boot; a quick run takes those next to a change.
-    strace makes the first call itself."""
-    traced = undisturbed(name).calls
-    in_the_pass = boot.pass_of(traced)
-    carried_out = 0
-    for call in traced[1:]:
-        within = call in in_the_pass
-        carried_out += within
-        near = in_the_pass[max(0, carried_out - 2):carried_out]
-        if not quick or any(other.name in CHANGES for other in near):
-            yield Killed(call.call, call.number, carried_out + (not within))
+def kills(option):
+    """One before every call of every chosen boot; a quick run takes those next to a
+    change. strace makes the first call itself."""
+    for name in CHOSEN:
+        traced = undisturbed(name).calls
+        in_the_pass = boot.pass_of(traced)
+        carried_out = 0
+        for call in traced[1:]:
+            within = call in in_the_pass
+            carried_out += within
+            near = in_the_pass[max(0, carried_out - 2):carried_out]
+            if not option("quick") or any(other.name in CHANGES for other in near):
+                kill = Killed(call.call, call.number, carried_out + (not within))
+                yield pytest.param(name, kill, id=f"{name}: {kill.name}")
 
 
-class Change(NamedTuple):
-    call: str
-    number: int
-    killed_before: int
-
-    def kill(self):
-        return Killed(*self)
-
-
-def link_changes(device: Device):
-    """The changes to links in the next boot of a described device."""
+def kills_at_links(device: Device):
+    """One before every change to a link in the next boot of a described device."""
     families = {"symlink": "?symlink,?symlinkat", "unlink": "?unlink,?unlinkat"}
     counts = collections.Counter()
     for number, (name, _) in enumerate(model.boot(device).calls, start=1):
@@ -119,30 +114,20 @@ def link_changes(device: Device):
             return
         if name in families:
             counts[name] += 1
-            yield Change(families[name], counts[name], number)
+            yield Killed(families[name], counts[name], number)
 
 
-def pairs(name: str):
-    for first in link_changes(CHOSEN[name]()):
-        device = CHOSEN[name]()
-        model.boot(device, killed_before=first.killed_before)
-        for second in link_changes(device):
-            yield first.kill(), second.kill()
-
-
-def pytest_generate_tests(metafunc):
-    quick = metafunc.config.getoption("quick")
-    if "kill" in metafunc.fixturenames:
-        table = [(name, kill) for name in CHOSEN for kill in kills(name, quick)]
-        metafunc.parametrize("name, kill", table,
-                             ids=[f"{name}: {kill.name}" for name, kill in table])
-    elif "second" in metafunc.fixturenames:
-        table = [(name, *pair) for name in CHOSEN for pair in pairs(name)]
-        table = table[::10] if quick else table
-        metafunc.parametrize(
-            "name, first, second", table,
-            ids=[f"{name}: {first.name}, then {second.name}"
-                 for name, first, second in table])
+def pairs(option):
+    """Every tenth, in a quick run."""
+    found = []
+    for name, make in CHOSEN.items():
+        for first in kills_at_links(make()):
+            device = make()
+            model.boot(device, killed_before=first.killed_before)
+            found += [pytest.param(name, first, second,
+                                   id=f"{name}: {first.name}, then {second.name}")
+                      for second in kills_at_links(device)]
+    return found[::10] if option("quick") else found
 
 
 def killed(device: Device, kill: Killed, start: Entries, whole_log="") -> model.Outcome:
@@ -154,8 +139,7 @@ def killed(device: Device, kill: Killed, start: Entries, whole_log="") -> model.
         found.append(f"ended with {booted.ending}")
     if whole_log and not whole_log.startswith(booted.log):
         found.append(f"printed {booted.log!r}")
-    if found:
-        fail(kill.name, found, start)
+    fail(kill.name, found, start)
     return outcome
 
 
@@ -168,10 +152,10 @@ def settles(name: str, device: Device, start: Entries):
             found += properties.not_ready(seen)
         if number > BOOTS_TO_SETTLE:
             found += properties.changed_by_a_settled_boot(properties.Judged(seen))
-        if found:
-            fail(f"boot {number} after the kill", found, start)
+        fail(f"boot {number} after the kill", found, start)
 
 
+@pytest.mark.cases("name, kill", kills)
 def test_a_kill(name, kill, count):
     usual = CHOSEN[name]()
     for _ in range(BOOTS_TO_SETTLE + 1):
@@ -192,6 +176,7 @@ def test_a_kill(name, kill, count):
             count(f"kills leave {window}")
 
 
+@pytest.mark.cases("name, first, second", pairs)
 def test_two_kills(name, first, second):
     device = CHOSEN[name]()
     namespace.build(device)

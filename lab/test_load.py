@@ -22,7 +22,6 @@ from lab.device import Device, Node, decoded
 from lab.devices import activation
 from lab.paths import (ICUTZ, LEGACY_ICUTZ, LOCALTIME, RECORD, SYSTEM_ICU,
                        SYSTEM_ZONEINFO, TZ_LATEST, ZONEINFO, update_path)
-from lab.seen import Seen
 from lab.trial import entry_differences, fail, log_differences
 
 UPDATE = update_path("2024a.1.0")
@@ -89,8 +88,7 @@ class Load:
         namespace.build(device)
         outcome = model.boot(device)
         booted = measured_boot()
-        seen = Seen({}, {}, booted.ending, booted.log)
-        self.finish(what, booted, log_differences(outcome, seen) +
+        self.finish(what, booted, log_differences(outcome, booted) +
                     entry_differences(device, namespace.look()), most_kib)
 
     def finish(self, what, booted, found, most_kib=USUAL_KIB):
@@ -100,8 +98,7 @@ class Load:
         print(f"{booted.milliseconds:9.1f} ms {booted.kib:8} KiB  {what}")
         if not 0 < booted.kib <= most_kib:
             found.append(f"takes {booted.kib} KiB, of at most {most_kib}")
-        if found:
-            fail(what, found, {})
+        fail(what, found, {})
 
     def grow(self, what, make, size, bytes_each):
         """Boots with an eighth of a size and with all of it, each unit of which may
@@ -260,7 +257,7 @@ def test_a_link_to_a_device(load, path, target):
     device.put(path, Node("device"))
     outcome = model.boot(device)
     booted = measured_boot()
-    found = log_differences(outcome, Seen({}, {}, booted.ending, booted.log))
+    found = log_differences(outcome, booted)
     if os.readlink(path) != target:
         found.append(f"{path} is {os.readlink(path)}")
     load.finish(f"{path}: a link to {target}", booted, found)

@@ -11,6 +11,7 @@ lines of up to BUFSIZ bytes, 8192 with the GNU C library; a longer one takes sev
 """
 
 import fcntl
+import functools
 import itertools
 import os
 from errno import EAGAIN, EINTR, EIO, ENOSPC, errorcode
@@ -41,34 +42,15 @@ def pipe_that_takes_no_more():
         return writer
 
 
-def file_without_space():
-    return os.open("/dev/full", os.O_WRONLY)
-
-
-def file_to_read():
-    return os.open("/dev/null", os.O_RDONLY)
-
-
-def closed(*descriptors):
-    def at_0_1_2():
-        null = os.open("/dev/null", os.O_RDWR)
-        return {number: None if number in descriptors else null for number in range(3)}
-    at_0_1_2.__name__ = "closed " + " and ".join(map(str, descriptors))
-    return at_0_1_2
-
-
-def standard_error(make):
-    def at_0_1_2():
-        null = os.open("/dev/null", os.O_RDWR)
-        return {0: null, 1: null, 2: make()}
-    at_0_1_2.__name__ = make.__name__.replace("_", " ")
-    return at_0_1_2
-
-
-LOST_LOGS = [standard_error(make) for make in (
-    file_without_space, pipe_without_reader, file_to_read, pipe_that_takes_no_more)]
-LOST_LOGS += [closed(*descriptors) for number in (1, 2, 3)
-              for descriptors in itertools.combinations(range(3), number)]
+LOST_LOGS = {
+    "file without space": lambda: {2: os.open("/dev/full", os.O_WRONLY)},
+    "pipe without reader": lambda: {2: pipe_without_reader()},
+    "file to read": lambda: {2: os.open("/dev/null", os.O_RDONLY)},
+    "pipe that takes no more": lambda: {2: pipe_that_takes_no_more()},
+}
+LOST_LOGS |= {
+    "closed " + " and ".join(map(str, closed)): functools.partial(dict.fromkeys, closed)
+    for number in (1, 2, 3) for closed in itertools.combinations(range(3), number)}
 
 TAKEN = 5  # bytes, of a line of which only a part is taken
 
@@ -97,23 +79,22 @@ def disturbances(name):
                boot.failing(call.call, EIO, f"{call.number}+"), later, printed[:1])
 
 
-def pytest_generate_tests(metafunc):
-    if "hit" in metafunc.fixturenames:
-        table = [(name, *rest) for name in CHOSEN for rest in disturbances(name)]
-        metafunc.parametrize("name, what, options, hit, left", table,
-                             ids=[f"{name}: {what}" for name, what, *_ in table])
+def with_names(_):
+    return [pytest.param(name, what, *rest, id=f"{name}: {what}")
+            for name in CHOSEN for what, *rest in disturbances(name)]
 
 
-@pytest.mark.parametrize("descriptors", LOST_LOGS, ids=lambda make: make.__name__)
+@pytest.mark.parametrize("log", LOST_LOGS)
 @pytest.mark.parametrize("name", CHOSEN)
-def test_a_lost_log(name, descriptors):
+def test_a_lost_log(name, log):
     device = CHOSEN[name]()
     namespace.build(device)
     before = namespace.look()
     outcome = model.boot(device)
-    at_start = descriptors()
+    null = os.open("/dev/null", os.O_RDWR)
+    at_start = {0: null, 1: null, 2: null} | LOST_LOGS[log]()
     ending = boot.ending_of(boot.spawn([boot.PROGRAM], at_start))
-    for descriptor in set(at_start.values()) - {None}:
+    for descriptor in {null, *at_start.values()} - {None}:
         os.close(descriptor)
     after = namespace.look()
     found = entry_differences(device, after)
@@ -121,8 +102,7 @@ def test_a_lost_log(name, descriptors):
         found.append(f"ended with {ending}, expected {outcome.ending}")
     found += [f"a line landed in {path}" for path, here in after.items()
               if "marlin" in here.text or "terminate" in here.text]
-    if found:
-        fail(descriptors.__name__, found, before)
+    fail(log, found, before)
 
 
 @pytest.mark.parametrize("name", CHOSEN)
@@ -146,6 +126,7 @@ def test_lines_in_one_write_each(name, count):
         fail("write by write", [repr(writes)], before)
 
 
+@pytest.mark.cases("name, what, options, hit, left", with_names)
 def test_a_log_that_fails_in_the_middle(name, what, options, hit, left):
     """The error texts of the lines that are left may have become those of the log's own
     failure."""
@@ -167,5 +148,4 @@ def test_a_log_that_fails_in_the_middle(name, what, options, hit, left):
     if (printed[:len(left)] != left or
             len(printed) > len(left) and outcome.ending != "abort"):
         found.append(f"printed {booted.log!r}, expected {left}")
-    if found:
-        fail(what, found, before)
+    fail(what, found, before)

@@ -2,12 +2,13 @@
 """What make-system and make-update make, what they refuse, and that the boot program
 takes it."""
 
-import importlib.util
+import functools
 import io
 import itertools
 import json
 import os
 import random
+import re
 import shlex
 import shutil
 import signal
@@ -23,19 +24,15 @@ import pytest
 
 from lab import boot, model, releases
 from lab.carriers import namespace
-from lab.device import Device, decoded
+from lab.device import Device
 from lab.paths import (DOWNLOADS, ICUTZ, RECORD, SYSTEM_ICU, SYSTEM_ZONEINFO, ZONEINFO,
                        update_path)
-from lab.places import PROJECT
-from lab.seen import as_device
+from tools import make_data
 
 LISBON = ["Europe/Lisbon", "Portugal"]
 SINCE = "2025-06-01"
-
-
-@pytest.fixture(scope="session")
-def names():
-    return releases.names()
+NAMES = releases.names()
+VERSION = f"{NAMES.update}.1.0"
 
 
 @pytest.fixture
@@ -46,36 +43,45 @@ def tmp_path():
 
 
 @pytest.fixture
-def place(tmp_path, names):
+def place(tmp_path):
     """A directory with what make-update is given: rules, ICU data, a system."""
-    source = releases.TARGET / names.update
+    source = releases.TARGET / NAMES.update
     (tmp_path / "rules").mkdir()
     shutil.copy(source / "tzdata.zi", tmp_path / "rules")
     shutil.copytree(source / "icu", tmp_path / "icu")
-    shutil.copytree(system_of(names.system, names.icu), tmp_path / "system")
+    have_system(tmp_path, NAMES.system)
     (tmp_path / "out").mkdir()
     return tmp_path
 
 
-SYSTEMS = {}
-
-
-def system_of(release: str, schema: str) -> Path:
+@functools.cache
+def system_of(release: str) -> Path:
     """A system's data, made once by this worker."""
-    if (release, schema) not in SYSTEMS:
-        place = Path(f"/tmp/systems/{release}.{schema}")
-        place.parent.mkdir(exist_ok=True)
-        releases.make_system(release, schema, place)
-        SYSTEMS[release, schema] = place
-    return SYSTEMS[release, schema]
+    place = Path(f"/tmp/systems/{release}")
+    place.parent.mkdir(exist_ok=True)
+    releases.make_system(release, NAMES.icu, place)
+    return place
+
+
+def have_system(place: Path, release: str):
+    shutil.rmtree(place / "system", ignore_errors=True)
+    shutil.copytree(system_of(release), place / "system")
+
+
+def make_update(place: Path, **options) -> list[str]:
+    """The command for what is there; options replace its own."""
+    return releases.tool("make-update", **{
+        "rules": place / "rules", "icu": place / "icu", "system": place / "system",
+        "out": place / "out", "since": SINCE, **options})
 
 
 def update(place: Path, *more: str, environment=None, **options):
-    """Runs make-update on what is there; options replace its own."""
-    options = {"rules": place / "rules", "icu": place / "icu",
-               "system": place / "system", "out": place / "out",
-               "since": SINCE} | options
-    return ran([*releases.tool("make-update", **options), *more], environment)
+    return ran([*make_update(place, **options), *more], environment)
+
+
+def system(place: Path, *more: str, schema=NAMES.icu):
+    return ran([*releases.tool("make-system", rules=place / "rules", icu=place / "icu",
+                               schema=schema, out=place / "out/new"), *more])
 
 
 def ran(command: list[str], environment=None) -> subprocess.CompletedProcess:
@@ -100,35 +106,30 @@ def refused(done: subprocess.CompletedProcess, words: str, status=1):
 
 def tree(root: Path) -> dict[str, tuple]:
     """Everything below a directory: kind and mode, and content."""
-    found = {}
-    for folder, folders, files in os.walk(root):
-        for name in [*folders, *files, "."]:
-            path = Path(folder, name)
-            status = path.lstat()
-            found[str(path.relative_to(root))] = (
-                oct(status.st_mode), path.read_bytes() if name in files else b"")
-    return found
+    return {str(path.relative_to(root)): (
+                oct(path.lstat().st_mode), path.read_bytes() if path.is_file() else b"")
+            for path in [root, *root.rglob("*")]}
 
 
 # --- What is made -----------------------------------------------------------------
 
 
-def test_an_update(place, names):
+def test_an_update(place):
     facts = made(update(place, "--json"))
     assert facts == {
-        "version": f"{names.update}.1.0", "schema": names.icu,
-        "system": f"{names.system}.1.0", "years": 10, "since": SINCE,
-        "directory": f"{place}/out/{names.update}.1.0",
+        "version": VERSION, "schema": NAMES.icu,
+        "system": f"{NAMES.system}.1.0", "years": 10, "since": SINCE,
+        "directory": f"{place}/out/{NAMES.update}.1.0",
         "changed": LISBON, "added": [], "removed": []}
-    assert os.listdir(place / "out") == [f"{names.update}.1.0"]
-    found = tree(place / "out" / f"{names.update}.1.0")
+    assert os.listdir(place / "out") == [VERSION]
+    found = tree(place / "out" / VERSION)
     assert set(os.listdir(facts["directory"])) == {"zoneinfo", "icutz"}
-    assert found["zoneinfo/+VERSION"][1] == f"{names.update}\n".encode()
+    assert found["zoneinfo/+VERSION"][1] == f"{NAMES.update}\n".encode()
     assert set(os.listdir(f"{facts['directory']}/icutz")) == {
-        f"icutz{names.icu}.dat", *releases.RESOURCES}
+        f"icutz{NAMES.icu}.dat", *releases.RESOURCES}
     # As the icu-devtools that made it read it again.
     listed = ran(["/usr/sbin/icupkg", "-l",
-                  f"{facts['directory']}/icutz/icutz{names.icu}.dat"])
+                  f"{facts['directory']}/icutz/icutz{NAMES.icu}.dat"])
     assert listed.stdout.split() == list(releases.RESOURCES)
     for name in releases.RESOURCES:
         assert found[f"icutz/{name}"][1] == (place / "icu" / name).read_bytes()
@@ -136,29 +137,27 @@ def test_an_update(place, names):
     assert {mode for mode, _ in found.values()} == {"0o40755", "0o100644"}
 
 
-def test_what_people_are_told(place, names):
+def test_what_people_are_told(place):
     done = update(place)
     assert done.stdout == (
-        f"{place}/out/{names.update}.1.0: {names.update}.1.0 for systems with "
-        f"{names.system}.1.0 and the ICU schema {names.icu}\n"
+        f"{place}/out/{NAMES.update}.1.0: {NAMES.update}.1.0 for systems with "
+        f"{NAMES.system}.1.0 and the ICU schema {NAMES.icu}\n"
         f"zones that differ from the system's from {SINCE} on: 2\n"
         "  Europe/Lisbon\n  Portugal\n"
         "zones that are new: none\nzones that are gone: none\n")
 
 
-def test_a_system(place, names):
-    out = place / "made"
-    facts = made(ran([*releases.tool(
-        "make-system", rules=place / "rules", icu=place / "icu", schema=names.icu,
-        out=out), "--json"]))
-    assert facts == {"version": f"{names.update}.1.0", "schema": names.icu,
+def test_a_system(place):
+    out = place / "out/new"
+    facts = made(system(place, "--json"))
+    assert facts == {"version": VERSION, "schema": NAMES.icu,
                      "directory": str(out)}
     assert set(os.listdir(out)) == {"zoneinfo.default", "icu"}
-    assert (out / "icu/icutzformat.txt").read_text() == f"{names.icu}\n"
-    assert (out / "zoneinfo.default/+VERSION").read_text() == f"{names.update}\n"
+    assert (out / "icu/icutzformat.txt").read_text() == f"{NAMES.icu}\n"
+    assert (out / "zoneinfo.default/+VERSION").read_text() == f"{NAMES.update}\n"
     made(update(place, "--json"))
     assert tree(out / "zoneinfo.default") == tree(
-        place / "out" / f"{names.update}.1.0/zoneinfo")
+        place / "out" / f"{NAMES.update}.1.0/zoneinfo")
 
 
 def test_the_same_bytes(place, monkeypatch):
@@ -169,10 +168,8 @@ def test_the_same_bytes(place, monkeypatch):
     other = place / "other"
     for part in ("icu", "system", "rules"):
         for path in sorted((place / part).rglob("*"), reverse=True):
-            copy = other / path.relative_to(place)
-            if path.is_dir():
-                copy.mkdir(parents=True, exist_ok=True)
-            else:
+            if path.is_file():
+                copy = other / path.relative_to(place)
                 copy.parent.mkdir(parents=True, exist_ok=True)
                 shutil.copyfile(path, copy)
                 os.utime(copy, (1, 1))
@@ -192,21 +189,23 @@ def test_times_that_are_asked_for(place):
     assert {path.stat().st_mtime for path in (place / "out").rglob("*")} == {86400}
 
 
-def archived(place: Path, *members: tuple[str, bytes]) -> Path:
-    archive = place / "rules.tar.gz"
-    with tarfile.open(archive, "w:gz") as tar:
-        for name, content in members:
+def archived(place: Path, *members: tuple, form="gz") -> Path:
+    """Members are names and contents; a third word is another kind than a file."""
+    archive = place / f"rules.tar.{form}"
+    with tarfile.open(archive, f"w:{form}") as tar:
+        for name, content, *kind in members:
             info = tarfile.TarInfo(name)
-            info.size = len(content)
+            info.size, info.linkname = len(content), "/etc/passwd"
+            info.type = kind[0] if kind else tarfile.REGTYPE
             tar.addfile(info, io.BytesIO(content))
     return archive
 
 
 @pytest.mark.parametrize("form", ["file", "archive", "archive with a directory",
                                   "sources", "archive of sources"])
-def test_forms_of_rules(place, form, names):
+def test_forms_of_rules(place, form):
     text = (place / "rules/tzdata.zi").read_bytes()
-    sources = [("africa", text), ("version", f"{names.update}\n".encode()),
+    sources = [("africa", text), ("version", f"{NAMES.update}\n".encode()),
                ("zone.tab", b"#\n"), ("Makefile", b"all:\n\tfalse\n"),
                *((name, b"# nothing\n") for name in
                  "antarctica asia australasia europe northamerica southamerica "
@@ -228,12 +227,11 @@ def test_forms_of_rules(place, form, names):
     assert table == form.endswith("sources")
 
 
-def test_another_byte_order(place, names):
-    for name in releases.RESOURCES:
-        releases.output("/usr/sbin/icupkg", "-tb", place / "icu" / name)
+def test_another_byte_order(place):
+    other_order(*releases.RESOURCES)(place)
     refused(update(place), "the byte order 'b', and the system's schema is "
-                           f"{names.icu}; take the files for 'l'")
-    schema = f"{names.icu[:-1]}b"
+                           f"{NAMES.icu}; take the files for 'l'")
+    schema = f"{NAMES.icu[:-1]}b"
     (place / "system/icu/icutzformat.txt").write_text(schema)
     facts = made(update(place, "--json"))
     pack = Path(facts["directory"], f"icutz/icutz{schema}.dat").read_bytes()
@@ -243,13 +241,12 @@ def test_another_byte_order(place, names):
 
 @pytest.mark.parametrize("revision", ["0.0", "1", "1.0", "1.9",
                                       "2147483647.2147483647"])
-def test_revisions(place, names, revision):
+def test_revisions(place, revision):
     """The system's own revision is 1.0."""
     facts = made(update(place, "--json", revision=revision))
-    assert facts["version"] == f"{names.update}.{revision}"
-    shutil.rmtree(place / "out" / facts["version"])
-    shutil.rmtree(place / "system")
-    shutil.copytree(system_of(names.update, names.icu), place / "system")
+    assert facts["version"] == f"{NAMES.update}.{revision}"
+    shutil.rmtree(facts["directory"])
+    have_system(place, NAMES.update)
     done = update(place, "--json", revision=revision)
     if revision in ("0.0", "1", "1.0"):
         refused(done, "is not newer than the system's")
@@ -267,7 +264,7 @@ def offsets(root: Path, name: str) -> list:
             .astimezone(zone).utcoffset() for month in range(8, 60) for day in (2, 17)]
 
 
-def test_zones_that_differ(place, names):
+def test_zones_that_differ(place):
     """Compared with what another reader of zone files sees twice a month."""
     facts = made(update(place, "--json"))
     old, new = place / "system/zoneinfo.default", Path(facts["directory"], "zoneinfo")
@@ -279,11 +276,8 @@ def test_zones_that_differ(place, names):
 
 
 def test_zones_come_and_go(place):
-    rules = place / "rules/tzdata.zi"
-    text = rules.read_text()
-    assert text.count("\nL Europe/Lisbon Portugal\n") == 1
-    rules.write_text(text.replace("\nL Europe/Lisbon Portugal\n",
-                                  "\nL Europe/Lisbon Lusitania\n"))
+    edit("rules/tzdata.zi", "\nL Europe/Lisbon Portugal\n",
+         "\nL Europe/Lisbon Lusitania\n")(place)
     facts = made(update(place, "--json"))
     assert facts["changed"] == ["Europe/Lisbon"]
     assert facts["added"] == ["Lusitania"]
@@ -292,13 +286,11 @@ def test_zones_come_and_go(place):
 
 def test_a_past_change(place):
     """Cairo's local mean time differs, and nothing after 1900."""
-    rules = place / "rules/tzdata.zi"
-    text = rules.read_text()
-    assert "\nZ Africa/Cairo 2:5:9 - LMT" in text
-    rules.write_text(text.replace("\nZ Africa/Cairo 2:5:9", "\nZ Africa/Cairo 2:5:8"))
-    assert made(update(place, "--json"))["changed"] == LISBON
-    shutil.rmtree(place / "out")
-    (place / "out").mkdir()
+    edit("rules/tzdata.zi", "\nZ Africa/Cairo 2:5:9 - LMT",
+         "\nZ Africa/Cairo 2:5:8 - LMT")(place)
+    facts = made(update(place, "--json"))
+    assert facts["changed"] == LISBON
+    shutil.rmtree(facts["directory"])
     assert made(update(place, "--json", since="1899-01-01"))["changed"][:2] == [
         "Africa/Cairo", "Egypt"]
 
@@ -308,7 +300,7 @@ def test_a_system_compiled_otherwise(place):
     compiled = place / "system/zoneinfo.default"
     for folder in (compiled, compiled / "right", compiled / "posix"):
         releases.output("/usr/sbin/zic", "-b", "fat", "-d", folder,
-                        releases.TARGET / releases.names().system / "tzdata.zi")
+                        releases.TARGET / NAMES.system / "tzdata.zi")
     shutil.copy(compiled / "America/New_York", compiled / "posixrules")
     facts = made(update(place, "--json"))
     assert (facts["changed"], facts["removed"]) == (LISBON, [])
@@ -323,28 +315,26 @@ def device_with(place: Path, version: str) -> Device:
     for source, target in ((place / "system/zoneinfo.default", SYSTEM_ZONEINFO),
                            (place / "system/icu", SYSTEM_ICU),
                            (place / "out" / version, update_path(version))):
-        entries = {}
-        namespace.look_below(decoded(os.fsencode(source)), entries)
-        device.put(target, as_device(entries).find(str(source)))
+        device.put(target, namespace.description_of(source))
     device.point_links_at(None)
     device.choose_zone("Europe/Lisbon")
     device.announce(version)
     return device
 
 
-def test_the_boot_program_takes_it(place, names):
+def test_the_boot_program_takes_it(place):
     version = made(update(place, "--json"))["version"]
     namespace.build(device_with(place, version))
     assert boot.boot() == ("exit 0", "")
     assert os.readlink(ZONEINFO) == f"{DOWNLOADS}{version}/zoneinfo"
     assert os.readlink(ICUTZ) == f"{DOWNLOADS}{version}/icutz"
-    assert Path(RECORD).read_text() == f"{names.system}.1.0_{version}"
+    assert Path(RECORD).read_text() == f"{NAMES.system}.1.0_{version}"
 
 
-def test_the_boot_program_refuses_another_schema(place, names):
-    (place / "system/icu/icutzformat.txt").write_text(names.other_icu)
+def test_the_boot_program_refuses_another_schema(place):
+    (place / "system/icu/icutzformat.txt").write_text(NAMES.other_icu)
     version = made(update(place, "--json"))["version"]
-    (place / "system/icu/icutzformat.txt").write_text(names.icu)
+    (place / "system/icu/icutzformat.txt").write_text(NAMES.icu)
     namespace.build(device_with(place, version))
     assert "not compatible or older version" in boot.boot().log
     assert os.readlink(ZONEINFO) == SYSTEM_ZONEINFO
@@ -352,10 +342,6 @@ def test_the_boot_program_refuses_another_schema(place, names):
 
 def test_versions():
     """Texts are versions, and newer than others, as in the model of a boot."""
-    spec = importlib.util.spec_from_file_location(
-        "make_data", PROJECT / "tools/make_data.py")
-    make_data = importlib.util.module_from_spec(spec)
-    spec.loader.exec_module(make_data)
     numbers = ["", "0", "1", "9", "10", "010", "2147483647", "2147483648"]
     texts = [year + letters + "".join(f".{number}" for number in more)
              for year in numbers for letters in ("", "a", "az", "b", "A", "a b")
@@ -383,32 +369,32 @@ def test_versions():
 
 
 def edit(part: str, old: str, new: str):
-    def change(place, names):
+    def change(place):
         path = place / part
         text = path.read_text()
-        assert old in text
-        path.write_text(text.replace(old, new, 1))
+        assert text.count(old) == 1
+        path.write_text(text.replace(old, new))
     return change
 
 
 def write(part: str, content: bytes):
-    return lambda place, names: (place / part).write_bytes(content)
+    return lambda place: (place / part).write_bytes(content)
 
 
 def append(text: str):
-    return lambda place, names: (place / "rules/tzdata.zi").open("a").write(text)
+    return lambda place: (place / "rules/tzdata.zi").open("a").write(text)
 
 
 def instead(part: str, make):
     """Something else in place of a file."""
-    def change(place, names):
+    def change(place):
         (place / part).unlink()
         make(place / part)
     return change
 
 
 def damaged(part: str, at: int, content: bytes):
-    def change(place, names):
+    def change(place):
         raw = bytearray((place / part).read_bytes())
         raw[at:at + len(content)] = content
         (place / part).write_bytes(raw)
@@ -416,22 +402,17 @@ def damaged(part: str, at: int, content: bytes):
 
 
 def other_order(*parts: str):
-    return lambda place, names: [
+    return lambda place: [
         releases.output("/usr/sbin/icupkg", "-tb", place / "icu" / part)
         for part in parts]
 
 
-def other_release(place, names):
-    shutil.copy(releases.TARGET / names.refused / "icu/zoneinfo64.res", place / "icu")
+def other_release(place):
+    shutil.copy(releases.TARGET / NAMES.refused / "icu/zoneinfo64.res", place / "icu")
 
 
-def older(place, names):
-    shutil.rmtree(place / "system")
-    shutil.copytree(system_of(names.upgrade, names.icu), place / "system")
-
-
-def no_release_in_icu(place, names):
-    text = releases.icu_text(place / "icu", names.update, None)
+def no_release_in_icu(place):
+    text = releases.icu_text(place / "icu", NAMES.update, None)
     source = place / "zoneinfo64.txt"
     source.write_text(text.replace("TZVersion", "NoVersion"))
     releases.output("genrb", "-q", "-d", place / "icu", source)
@@ -445,7 +426,8 @@ def sparse(path: Path):
 BIG = "icu/zoneinfo64.res"
 REFUSALS = {
     "other releases": (other_release, "take both from one release"),
-    "older than the system": (older, "is not newer than the system's"),
+    "older than the system": (lambda place: have_system(place, NAMES.upgrade),
+                              "is not newer than the system's"),
     "byte order": (other_order(*releases.RESOURCES), "the byte order 'b'"),
     "two byte orders": (other_order("metaZones.res"), "differ in byte order"),
     "character set": (damaged(BIG, 9, b"\1"), "differ in byte order"),
@@ -458,7 +440,7 @@ REFUSALS = {
                            "is not an ICU schema"),
     "system's release": (write("system/zoneinfo.default/+VERSION", b"2024a.1.0\n"),
                          "is not a release"),
-    "no system's release": (lambda place, names: (
+    "no system's release": (lambda place: (
         place / "system/zoneinfo.default/+VERSION").unlink(), "No such file"),
     "no version line": (edit("rules/tzdata.zi", "# version ", "# vers "),
                         "has no '# version'"),
@@ -469,8 +451,8 @@ REFUSALS = {
     "large year": (edit("rules/tzdata.zi", "# version 20", "# version 999999999920"),
                    "is not a version"),
     "empty rules": (write("rules/tzdata.zi", b""), "has no '# version'"),
-    "no zones": (lambda place, names: (place / "rules/tzdata.zi").write_text(
-        f"# version {names.update}\n"), "have no zone"),
+    "no zones": (lambda place: (place / "rules/tzdata.zi").write_text(
+        f"# version {NAMES.update}\n"), "have no zone"),
     "syntax": (append("Q what\n"), "zic: \"tzdata.zi\", line "),
     "zone twice": (append("Z Europe/Lisbon 0 - X\n"), "zic: "),
     "zone outside": (append("Z ../../evil 0 - X\n"), "'..'"),
@@ -482,11 +464,11 @@ REFUSALS = {
     "link to nothing": (append("L Missing/Zone Alias\n"), "a link without its target"),
     "rules FIFO": (instead("rules/tzdata.zi", os.mkfifo), "holds neither"),
     "huge rules": (instead("rules/tzdata.zi", sparse), "more than 16777216"),
-    "no rules": (lambda place, names: shutil.rmtree(place / "rules"), "No such file"),
-    "no resource": (lambda place, names: (place / BIG).unlink(), "No such file"),
+    "no rules": (lambda place: shutil.rmtree(place / "rules"), "No such file"),
+    "no resource": (lambda place: (place / BIG).unlink(), "No such file"),
     "empty resource": (write(BIG, b""), "is not an ICU resource file"),
     "text for a resource": (write(BIG, b"zoneinfo64{}\n" * 9), "is not an ICU"),
-    "cut resource": (lambda place, names: os.truncate(place / BIG, 5000), "is damaged"),
+    "cut resource": (lambda place: os.truncate(place / BIG, 5000), "is damaged"),
     "resource FIFO": (instead(BIG, os.mkfifo), "is not a regular file"),
     "resource directory": (instead(BIG, os.mkdir), "is not a regular file"),
     "huge resource": (instead(BIG, sparse), "more than 16777216"),
@@ -494,20 +476,22 @@ REFUSALS = {
     "device": (instead(BIG, lambda path: path.symlink_to("/dev/zero")),
                "is not a regular file"),
     "no TZVersion": (no_release_in_icu, "has no TZVersion"),
-    "no out": (lambda place, names: (place / "out").rmdir(), "make it first"),
-    "out is a file": (lambda place, names: ((place / "out").rmdir(), (
+    "out has it already": (lambda place: (place / "out" / VERSION).mkdir(),
+                           "is there already"),
+    "no out": (lambda place: (place / "out").rmdir(), "make it first"),
+    "out is a file": (lambda place: ((place / "out").rmdir(), (
         place / "out").write_text("")), "make it first"),
-    "read-only out": (lambda place, names: (place / "out").chmod(0o555),
+    "read-only out": (lambda place: (place / "out").chmod(0o555),
                       "Permission denied"),
-    "secret rules": (lambda place, names: (place / "rules/tzdata.zi").chmod(0),
+    "secret rules": (lambda place: (place / "rules/tzdata.zi").chmod(0),
                      "Permission denied"),
 }
 
 
 @pytest.mark.parametrize("kind", REFUSALS)
-def test_refusals(place, names, kind):
+def test_refusals(place, kind):
     change, words = REFUSALS[kind]
-    change(place, names)
+    change(place)
     before = set(place.rglob("*"))
     temporary = set(os.listdir("/tmp"))
     done = update(place)
@@ -518,28 +502,20 @@ def test_refusals(place, names, kind):
     assert set(os.listdir("/tmp")) == temporary
 
 
-@pytest.mark.parametrize("kind", [kind for kind in REFUSALS
-                                  if "system" not in kind and "out" not in kind
-                                  and kind not in ("format of resources",)])
-def test_refusals_of_a_system(place, names, kind):
+@pytest.mark.parametrize("kind", [kind for kind in REFUSALS if not re.search(
+    "system|out|format of resources", kind)])
+def test_refusals_of_a_system(place, kind):
     change, words = REFUSALS[kind]
-    change(place, names)
-    refused(ran(releases.tool(
-        "make-system", rules=place / "rules", icu=place / "icu", schema=names.icu,
-        out=place / "out/new")), words)
+    change(place)
+    refused(system(place), words)
     assert os.listdir(place / "out") == []
 
 
-def test_what_is_there_stays(place, names):
+def test_what_is_there_stays(place):
     made(update(place, "--json"))
     before = tree(place)
     refused(update(place), "is there already; remove it, or choose another")
     assert tree(place) == before
-
-
-def test_an_empty_directory_is_not_taken_over(place, names):
-    (place / "out" / f"{names.update}.1.0").mkdir()
-    refused(update(place), "is there already")
 
 
 @pytest.mark.parametrize("words", [
@@ -551,18 +527,23 @@ def test_bad_use(place, words):
     assert os.listdir(place / "out") == []
 
 
-def test_a_revision_that_is_too_large(place):
-    refused(update(place, revision="2147483648.0"), "is not a version")
+@pytest.mark.parametrize("how, words", [
+    ({"revision": "2147483648.0"}, "is not a version"),
+    ({"revision": "1" * 5000}, "is not a version"),
+    ({"environment": {"SOURCE_DATE_EPOCH": "9" * 20}},
+     "SOURCE_DATE_EPOCH is too large"),
+    ({"rules": "a\n\x1b[2Jb"}, r"a\n\x1b[2Jb")])
+def test_what_no_machine_has(place, how, words):
+    refused(update(place, **how), words)
+    assert os.listdir(place / "out") == []
 
 
 @pytest.mark.parametrize("schema", ["", "72", "l", "72x", "44b", "../72l", "72l\n"])
 def test_bad_schemas(place, schema):
-    refused(ran(releases.tool(
-        "make-system", rules=place / "rules", icu=place / "icu", schema=schema,
-        out=place / "out/new")), "schema")
+    refused(system(place, schema=schema), "schema")
 
 
-def test_an_archive_that_leads_out(place, names):
+def test_an_archive_that_leads_out(place):
     """Only the content of known names is taken from it, never their place."""
     text = (place / "rules/tzdata.zi").read_bytes()
     archive = archived(place, ("../../../evil", b"x"), ("/tmp/evil", b"x"),
@@ -572,87 +553,50 @@ def test_an_archive_that_leads_out(place, names):
     assert not Path("/tmp/evil").exists() and not (place / "tzdata.zi").exists()
 
 
-@pytest.mark.parametrize("kind", ["twice", "a link", "a directory", "cut", "no archive",
-                                  "nothing"])
+ARCHIVES = {
+    "twice": ([("tzdata.zi", b""), ("a/tzdata.zi", b"")], "holds tzdata.zi twice"),
+    "a link": ([("tzdata.zi", b"", tarfile.SYMTYPE)], "holds neither"),
+    "a directory": ([("tzdata.zi", b"", tarfile.DIRTYPE)], "holds neither"),
+    "nothing": ([("README", b"")], "holds neither"),
+    # Small, and much too large when they are read.
+    "a large member": ([("README", bytes(17 << 20))], "far too large"),
+    "many members": ([("README", bytes(10 << 20))] * 30, "far too large"),
+}
+
+
+@pytest.mark.parametrize("kind", ARCHIVES)
 def test_archives_that_are_refused(place, kind):
+    members, words = ARCHIVES[kind]
+    refused(update(place, rules=archived(place, *members)), words)
+    assert os.listdir(place / "out") == []
+
+
+DAMAGES = {
+    "cut": ("gz", lambda raw: raw[:2000]),
+    "no archive": ("gz", lambda raw: os.urandom(5000)),
+    # It stands behind all that is read.
+    "checksum": ("gz", lambda raw: raw[:-8] + bytes(4) + raw[-4:]),
+    "another kind": ("xz", lambda raw: raw[:2000] + bytes(9) + raw[2009:]),
+}
+
+
+@pytest.mark.parametrize("kind", DAMAGES)
+def test_archives_that_are_damaged(place, kind):
+    form, damage = DAMAGES[kind]
     text = (place / "rules/tzdata.zi").read_bytes()
-    if kind == "twice":
-        archive = archived(place, ("tzdata.zi", text), ("a/tzdata.zi", text))
-    elif kind == "cut":
-        archive = archived(place, ("tzdata.zi", text))
-        os.truncate(archive, 2000)
-    elif kind == "no archive":
-        archive = place / "rules.tar"
-        archive.write_bytes(os.urandom(5000))
-    elif kind == "nothing":
-        archive = archived(place, ("README", b""))
-    else:
-        archive = place / "rules.tar"
-        with tarfile.open(archive, "w") as tar:
-            info = tarfile.TarInfo("tzdata.zi")
-            info.type = tarfile.SYMTYPE if kind == "a link" else tarfile.DIRTYPE
-            info.linkname = "/etc/passwd"
-            tar.addfile(info)
-    refused(update(place, rules=archive), str(archive))
-    assert os.listdir(place / "out") == []
-
-
-@pytest.mark.parametrize("members, megabytes", [(1, 17), (30, 10)])
-def test_an_archive_that_grows(place, members, megabytes):
-    """Small, and much too large when it is read."""
-    archive = place / "rules.tar.gz"
-    with (tarfile.open(archive, "w:gz", compresslevel=1) as tar,
-          open("/dev/zero", "rb") as zeros):
-        for _ in range(members):
-            info = tarfile.TarInfo("README")
-            info.size = megabytes << 20
-            tar.addfile(info, zeros)
-    refused(update(place, rules=archive), "far too large")
-
-
-def test_an_archive_with_a_wrong_checksum(place):
-    """It is behind all that is read from it."""
-    archive = place / "rules.tar.gz"
-    with tarfile.open(archive, "w:gz") as tar:
-        tar.add(place / "rules", "rules")
-    raw = bytearray(archive.read_bytes())
-    raw[-8] ^= 1
-    archive.write_bytes(raw)
+    archive = archived(place, ("tzdata.zi", text), form=form)
+    archive.write_bytes(damage(archive.read_bytes()))
     refused(update(place, rules=archive), "cannot be read as an archive")
     assert os.listdir(place / "out") == []
-
-
-def test_a_damaged_archive_of_another_kind(place):
-    archive = place / "rules.tar.xz"
-    with tarfile.open(archive, "w:xz") as tar:
-        tar.add(place / "rules", "rules")
-    raw = bytearray(archive.read_bytes())
-    raw[len(raw) // 2] ^= 255
-    archive.write_bytes(raw)
-    refused(update(place, rules=archive), "cannot be read as an archive")
 
 
 @pytest.mark.parametrize("output", ["/dev/full", None])
-def test_an_update_that_cannot_be_told(place, names, output):
+def test_an_update_that_cannot_be_told(place, output):
     """It is made all the same, and the line says so."""
-    command = shlex.join(map(str, releases.tool(
-        "make-update", rules=place / "rules", icu=place / "icu",
-        system=place / "system", out=place / "out")))
+    command = shlex.join(make_update(place))
     done = ran(["/bin/sh", "-c", f"{command} >{output or '&-'}"])
     refused(done, "is made, but standard output fails")
-    assert os.listdir(place / "out") == [f"{names.update}.1.0"]
-
-
-def test_numbers_that_no_machine_has(place):
-    refused(update(place, "--revision", "1" * 5000), "is not a version")
-    refused(update(place, environment={"SOURCE_DATE_EPOCH": "9" * 20}),
-            "SOURCE_DATE_EPOCH is too large")
-    assert os.listdir(place / "out") == []
-
-
-def test_a_name_with_a_newline(place):
-    odd = place / "a\n\x1b[2Jb"
-    refused(update(place, rules=odd), r"a\n\x1b[2Jb")
+    assert os.listdir(place / "out") == [VERSION]
 
 
 @pytest.mark.parametrize("seed", range(20))
@@ -704,21 +648,15 @@ def test_failing_tools(place, fake, tool, script):
 
 def test_a_file_that_cannot_be_written(place):
     """As on a full disk, in the middle of the tree."""
-    command = releases.tool(
-        "make-update", rules=place / "rules", icu=place / "icu",
-        system=place / "system", out=place / "out")
-    done = ran(["/usr/bin/prlimit", "--fsize=100000", *command])
-    refused(done, "")
+    refused(ran(["/usr/bin/prlimit", "--fsize=100000", *make_update(place)]), "")
     assert os.listdir(place / "out") == []
 
 
 @pytest.mark.parametrize("number", [signal.SIGTERM, signal.SIGINT, signal.SIGHUP])
 def test_an_interrupted_program_leaves_nothing(place, fake, number):
     hung = subprocess.Popen(
-        releases.tool("make-update", rules=place / "rules", icu=place / "icu",
-                      system=place / "system", out=place / "out"),
-        env={**os.environ, **fake(zdump=f"touch {place}/begun; exec sleep 60")},
-        stderr=subprocess.PIPE)
+        make_update(place), stderr=subprocess.PIPE,
+        env={**os.environ, **fake(zdump=f"touch {place}/begun; exec sleep 60")})
     for _ in range(400):
         if (place / "begun").exists():
             break

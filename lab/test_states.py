@@ -6,6 +6,7 @@ even an inode, except for the link that a last resort makes every time."""
 import itertools
 import random
 
+import pytest
 from hypothesis import given
 from hypothesis import strategies as st
 
@@ -17,20 +18,16 @@ from lab.trial import fail, trial
 BLOCK = 250  # states a test
 
 
-def pytest_generate_tests(metafunc):
-    if "states" not in metafunc.fixturenames:
-        return
-    option = metafunc.config.getoption
+def blocks(option):
     if option("state"):
         seed, _, number = option("state").partition("/")
-        blocks = [range(int(number), int(number) + 1)]
+        wanted = range(int(number), int(number) + 1)
     else:
         seed = option("seed")
-        count = option("states") or (20_000 if option("quick") else 100_000)
-        blocks = [range(first, min(first + BLOCK, count))
-                  for first in range(0, count, BLOCK)]
-    metafunc.parametrize("seed, states", [(seed, block) for block in blocks],
-                         ids=[f"{seed}/{block.start}" for block in blocks])
+        wanted = range(option("states") or (20_000 if option("quick") else 100_000))
+    for start in range(0, len(wanted), BLOCK):
+        block = wanted[start:start + BLOCK]
+        yield pytest.param(seed, block, id=f"{seed}/{block.start}")
 
 
 def most_boots(lines: str) -> int:
@@ -65,12 +62,12 @@ def settle(device: Device, tell: str, count):
             found += properties.changed_by_a_settled_boot(judged)
         elif turn > most_boots(judged.lines):
             found.append(f"has not settled after {turn - 1} boots")
-        if found:
-            fail(what, found, seen.before)
+        fail(what, found, seen.before)
         if contents == last:
             return
 
 
+@pytest.mark.cases("seed, states", blocks)
 def test_states(seed, states, count):
     for number in states:
         count("states")

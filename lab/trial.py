@@ -18,9 +18,11 @@ from lab.seen import Call, Entries, Seen, as_device
 
 
 def fail(what: str, found: list[str], before: Entries):
-    """Ends the test: `found` is what is wrong, `before` the device at the start."""
-    pytest.fail("\n  ".join([what, *found]) + "\nThe device at the start:\n" +
-                as_device(before).in_words(), pytrace=False)
+    """Ends the test if anything is wrong, which is `found`; `before` is the device at
+    the start."""
+    if found:
+        pytest.fail("\n  ".join([what, *found]) + "\nThe device at the start:\n" +
+                    as_device(before).in_words(), pytrace=False)
 
 
 @functools.cache
@@ -50,8 +52,7 @@ def trial(device: Device, condition: Condition | None = None,
     if condition is not None:
         found += call_differences(outcome, calls)
         tell = condition.name
-    if found:
-        fail(tell, found, before)
+    fail(tell, found, before)
     return outcome, seen
 
 
@@ -111,7 +112,7 @@ def touched(device: Device, nodes: dict[str, Node], outcome: model.Outcome,
             and path in seen.before and path in seen.after and path in changed]
 
 
-def log_differences(outcome: model.Outcome, seen: Seen) -> list[str]:
+def log_differences(outcome: model.Outcome, seen: Seen | boot.Booted) -> list[str]:
     """Where the printed lines or the ending are not what the model says."""
     found = []
     if seen.ending != outcome.ending:

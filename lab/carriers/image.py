@@ -15,7 +15,6 @@ import re
 import stat
 import subprocess
 import tempfile
-from collections.abc import Iterator
 from pathlib import Path
 
 from lab.carriers.namespace import build_below
@@ -60,14 +59,8 @@ def build(image: Path, root: Node, megabytes: int, *options: str, owner=0):
         run("mke2fs", "-q", "-t", "ext4", "-b", "4096", "-m", "0",
             "-E", "root_owner=0:0,lazy_itable_init=0,lazy_journal_init=0",
             *options, "-d", staging, image, f"{megabytes}M")
-    debugfs(image, *(f'sif "{path}" uid {owner}' for path in paths_below("", root)),
-            write=True)
-
-
-def paths_below(path: str, node: Node) -> Iterator[str]:
-    for name, child in (node.entries or {}).items():
-        yield f"{path}/{name}"
-        yield from paths_below(f"{path}/{name}", child)
+    _, *paths = (path for path, _ in root.everything(""))
+    debugfs(image, *(f'sif "{path}" uid {owner}' for path in paths), write=True)
 
 
 # --- Looking -----------------------------------------------------------------------

@@ -5,10 +5,11 @@
 import functools
 import os
 import stat
+from pathlib import Path
 
 from lab.device import Device, Node, decoded, encoded
 from lab.paths import PLACES
-from lab.seen import Entries, Entry, kind_and_mode
+from lab.seen import Entries, Entry, as_device, kind_and_mode
 
 INSIDE = "MARLIN_PRIVATE_DEVICE"  # in the environment of what runs there
 
@@ -134,3 +135,10 @@ def look_below(path: str, entries: Entries):
             look_below(path + "/" + name, entries)
     if locked:
         os.chmod(raw, mode)
+
+
+def description_of(path: Path) -> Node:
+    """Of what stands anywhere on this machine."""
+    entries, source = {}, decoded(os.fsencode(path))
+    look_below(source, entries)
+    return as_device(entries).find(source)

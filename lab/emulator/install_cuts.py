@@ -10,16 +10,15 @@ model does.
 """
 
 import collections
-import random
 import re
 
 from lab.carriers import image
 from lab.device import Device, sound_device
-from lab.emulator import power_log
 from lab.emulator.machine import Console, Machine, zones
 from lab.emulator.power_cuts import Victim, check_recovery, insist
-from lab.paths import DOWNLOADS, TIMEZONE, TZ_LATEST
-from lab.seen import Entries, as_device
+from lab.install import announced, below, icu_data, names
+from lab.paths import DOWNLOADS, TIMEZONE
+from lab.seen import Entries
 
 TEMPLATE = "/usr/share/template"
 NUMBERED = ("/zoneinfo/+VERSION", "/icutz/icutz44l.dat")  # end with the set's number
@@ -58,20 +57,13 @@ done
 """
 
 
-def icu_data() -> str:
-    """As large as such data may be, with a header that says what the name says."""
-    header = bytearray(32)
-    header[0], header[2], header[3] = 32, 0xda, 0x27
-    return header.decode("latin-1") + "ICU data\n" * 20_000
-
-
 def installing_device() -> Device:
     """With an update on its system partition, and a place for the account's own."""
     device = sound_device()
     for zone in ZONES:
         device.file(f"{TEMPLATE}/zoneinfo/{zone}", zones("U24A")["Europe/Paris"])
     device.file(f"{TEMPLATE}/zoneinfo/+VERSION", "2024a\n")
-    device.file(f"{TEMPLATE}/icutz/icutz44l.dat", icu_data())
+    device.file(f"{TEMPLATE}/icutz/icutz44l.dat", icu_data("ICU data\n" * 20_000))
     device.directory(DOWNLOADS)
     device.directory(TIMEZONE, 0o1775)
     return device
@@ -89,35 +81,20 @@ class Installer(Victim):
     longest = 6
 
     def make_disk(self):
-        device = installing_device()
-        self.machine.build(device, "-J", "size=4", megabytes=32)
+        self.machine.build(installing_device(), "-J", "size=4", megabytes=32)
         give_to_account(self.machine)
-        self.template = {
-            path.removeprefix(TEMPLATE): (node.kind, node.mode, node.text)
-            for path, node in device.everything() if path.startswith(TEMPLATE + "/")}
         self.found = self.machine.look()
+        self.template = below(self.found, TEMPLATE)
         self.number, self.allowed = 0, {None}
 
     def cut(self) -> tuple[str, int]:
         """What was going on, and how many blocks were lost."""
-        log = self.machine.directory / "log"
-        console = self.run_until_cut(self.number, log)
-        lost = power_log.cut_power(self.machine.var, log.read_bytes(),
-                                   self.random.choice((0, 0.5, 1)), self.random)
-        before, self.found = self.found, self.look_after_cut()
-        check_recovery(console, before)
+        console, lost = self.cut_power(self.number)
         insist([f"the console did not say: {text}" for text in (
             "prune 0 ended with status 0", "hidden: 0") if text not in console.said])
         doing = self.follow(console)
-        self.check(as_device(self.found))
+        self.check(self.found)
         return doing, lost
-
-    def look_after_cut(self) -> Entries:
-        found = self.machine.directory / "found.img"
-        found.write_bytes(self.machine.var.read_bytes())
-        image.replay_journal(found)
-        image.check(found)
-        return self.machine.look(found)
 
     def follow(self, console: Console) -> str:
         """Learns from what the device said which announcements there can be, and what
@@ -140,40 +117,35 @@ class Installer(Victim):
                     self.allowed = {after[what]}
         return doing
 
-    def check(self, device: Device):
+    def check(self, entries: Entries):
         """What a cut left."""
-        announced = device.find(TZ_LATEST)
-        text = announced and announced.text
+        text = announced(entries)
         wanted = {number and f"{DOWNLOADS}2024a.1.{number}" for number in self.allowed}
         if text not in wanted:
             raise RuntimeError(f"announced is {text}, not one of {wanted}")
         self.allowed = {text and int(text.rpartition(".")[2])}
-        names = device.find(DOWNLOADS).entries.keys()
-        sets = {name for name in names if not name.startswith(".")}
+        sets = {name for name in names(entries) if not name.startswith(".")}
         if text and text.removeprefix(DOWNLOADS) not in sets:
             raise RuntimeError(f"{text} is announced and missing")
         for name in sets:
-            self.check_set(device, name)
+            self.check_set(entries, name)
 
-    def check_set(self, device: Device, name: str):
+    def check_set(self, entries: Entries, name: str):
         start, number = DOWNLOADS + name, name.rpartition(".")[2]
-        here = {path.removeprefix(start): (node.kind, node.mode, node.text)
-                for path, node in device.everything() if path.startswith(start + "/")}
+        here = below(entries, start)
         wanted = {path: (kind, mode, text + f"{number}\n" * (path in NUMBERED))
                   for path, (kind, mode, text) in self.template.items()}
         insist([f"{name}{path} is not as it was in the update"
                 for path in sorted(here.keys() | wanted.keys())
                 if here.get(path) != wanted.get(path)])
-        if device.find(start).mode != 0o755:
+        if entries[start].mode != 0o755:
             raise RuntimeError(f"{start} is not open to all")
 
 
 def run(count: int, seed: int | None = None):
     """Raises RuntimeError when a device is not as it has to be after a power cut."""
-    seed = random.randrange(10**6) if seed is None else seed
-    print(f"seed {seed}", flush=True)
     totals, victim = collections.Counter(), Installer(seed)
-    try:
+    with victim.telling():
         for number in range(1, count + 1):
             told = victim.allowed
             doing, lost = victim.cut()
@@ -183,9 +155,6 @@ def run(count: int, seed: int | None = None):
                   f"announced is {changed} as before", flush=True)
         check_recovery(victim.machine.boot(), victim.found)
         image.check(victim.machine.var)
-    except RuntimeError as reason:
-        print(Console(victim.machine.console).text[-6000:])
-        raise RuntimeError(f"with seed {seed}: {reason}") from reason
     during = ", ".join(f"{totals[what]} during {what}" for what in
                        ("install", "prune", "withdraw", "boot", "nothing"))
     print(f"\n{count} power cuts, {victim.number} installations: {during}; "

@@ -27,6 +27,17 @@ GUEST = Path(__file__).parent / "guest"
 MODULES = ("drivers/virtio/virtio_ring", "drivers/virtio/virtio",
            "drivers/virtio/virtio_mmio", "drivers/block/virtio_blk",
            "fs/overlayfs/overlay")
+# What fills the disk of "/var", in the language of the device's shell.
+NO_BLOCK = """
+dd if=/dev/zero of=/var/filler bs=65536 2>/dev/null
+dd if=/dev/zero of=/var/filler2 bs=4096 2>/dev/null
+"""
+NO_INODE = """
+mkdir /var/filler
+i=0
+while touch /var/filler/$i 2>/dev/null; do i=$((i + 1)); done
+"""
+NO_FILLER = "rm -rf /var/filler*\n"
 LINKS = (ZONEINFO, ICUTZ, LOCALTIME, TZ_LATEST)
 
 
@@ -120,6 +131,8 @@ class Console:
         self.lines = [(float(at), text) for at, text in matches]
         self.said = [text.removeprefix("device: ") for _, text in self.lines
                      if text.startswith("device: ")]
+        self.told = [text.removeprefix("told ") for text in self.said
+                     if text.startswith("told ")]  # by a program on the device
 
     def failure(self, what: str) -> RuntimeError:
         return RuntimeError(f"{what}:\n{self.text[-6000:]}")

@@ -10,11 +10,11 @@ links of two sets; each that a cut left is booted without the mend as well, on a
 """
 
 import collections
+import contextlib
 import random
 import re
 import shutil
 import time
-from pathlib import Path
 
 from lab import model, properties
 from lab.carriers import image
@@ -23,7 +23,7 @@ from lab.emulator import power_log
 from lab.emulator.machine import LINKS, Console, Machine, shown_links
 from lab.paths import (FORMER_ZONEINFO, ICUTZ, LEGACY_ICUTZ, LOCALTIME, RECORD,
                        TZ_LATEST, ZONEINFO, update_path)
-from lab.seen import Entries, Seen, as_device
+from lab.seen import Entries, as_device
 from lab.trial import log_differences
 
 UPDATES = 150  # 2024a.1.1 and so on, each newer than the one before
@@ -117,7 +117,7 @@ def check_recovery(console: Console, entries: Entries, mend=False):
     device = as_device(entries)
     if mend:
         mended(device)
-    insist(log_differences(model.boot(device), Seen({}, {}, *console.booted())))
+    insist(log_differences(model.boot(device), console.booted()))
     insist([f"after the pass not: {text}" for text in shown_links(device)
             if text not in console.said])
     _, zone = console.find("reader sees zone ")
@@ -144,8 +144,10 @@ class Victim:
     loop = LOOP
     longest = 1.5  # seconds until the cut
 
-    def __init__(self, seed: int, mend=False):
-        self.random, self.mend = random.Random(seed), mend
+    def __init__(self, seed: int | None, mend=False):
+        self.seed = random.randrange(10**6) if seed is None else seed
+        print(f"seed {self.seed}", flush=True)
+        self.random, self.mend = random.Random(self.seed), mend
         self.machine = Machine(self.name + "-mended" * mend)
         self.make_disk()
 
@@ -158,10 +160,12 @@ class Victim:
         self.machine.build(device, "-N", "2048", "-J", "size=4", megabytes=24)
         self.start = self.found = self.machine.look()
 
-    def run_until_cut(self, first: int, log: Path) -> Console:
+    def cut_power(self, first: int) -> tuple[Console, int]:
         """Boots, lets the loop run for a while, and kills the emulator, which logs what
-        the device asks of its disk and changes only a copy of it."""
-        machine, scratch = self.machine, self.machine.directory / "scratch.img"
+        the device asks of its disk and changes only a copy of it. What the device said,
+        and how many blocks were lost."""
+        machine, log = self.machine, self.machine.directory / "log"
+        scratch = self.machine.directory / "scratch.img"
         shutil.copyfile(machine.var, scratch)
         log.write_bytes(b"")
         mounted, syncs = self.random.choice(OTHERS)
@@ -178,7 +182,29 @@ class Victim:
         finally:
             emulator.kill()
             emulator.wait()
-        return Console(machine.console)
+        lost = power_log.cut_power(machine.var, log.read_bytes(),
+                                   self.random.choice((0, 0.5, 1)), self.random)
+        console = Console(machine.console)
+        before, self.found = self.found, self.look_after_cut()
+        check_recovery(console, before, self.mend)
+        return console, lost
+
+    def look_after_cut(self) -> Entries:
+        """The disk as a boot would find it."""
+        found = self.machine.directory / "found.img"
+        shutil.copyfile(self.machine.var, found)
+        image.replay_journal(found)
+        image.check(found)
+        return self.machine.look(found)
+
+    @contextlib.contextmanager
+    def telling(self):
+        """Has a failure tell what was said last, and the seed."""
+        try:
+            yield
+        except RuntimeError as reason:
+            print(Console(self.machine.console).text[-6000:])
+            raise RuntimeError(f"with seed {self.seed}: {reason}") from reason
 
     def cut(self) -> tuple[bool, int]:
         """One cut, and what it left. Whether it was inside the pass, and how many
@@ -188,12 +214,12 @@ class Victim:
         if first > UPDATES - 60:
             self.make_disk()
             first = 1
-        log = self.machine.directory / "log"
-        console = self.run_until_cut(first, log)
-        lost = power_log.cut_power(self.machine.var, log.read_bytes(),
-                                   self.random.choice((0, 0.5, 1)), self.random)
-        before, self.found = self.found, self.look_after_cut()
-        check_recovery(console, before, self.mend)
+        console, lost = self.cut_power(first)
+        insist(properties.data_changes(
+            *({path: here for path, here in looked.items() if path not in OF_THE_LOOP}
+              for looked in (self.start, self.found))))
+        insist([f"{path} is not a link" for path in LINKS
+                if path in self.found and self.found[path].kind != "link"])
         return within_pass(console), lost
 
     def stays_mixed_without_mend(self) -> bool:
@@ -206,20 +232,6 @@ class Victim:
         device = as_device(self.found)
         model.boot(device)
         return "MIXED" in described(device)
-
-    def look_after_cut(self) -> Entries:
-        """The disk as a boot would find it, after all checks that need no boot."""
-        found = self.machine.directory / "found.img"
-        shutil.copyfile(self.machine.var, found)
-        image.replay_journal(found)
-        image.check(found)
-        entries = self.machine.look(found)
-        insist(properties.data_changes(
-            *({path: here for path, here in looked.items() if path not in OF_THE_LOOP}
-              for looked in (self.start, entries))))
-        insist([f"{path} is not a link" for path in LINKS
-                if path in entries and entries[path].kind != "link"])
-        return entries
 
 
 def run_cuts(count: int, victim: Victim, table, totals):
@@ -264,14 +276,10 @@ def print_table(table, totals):
 
 def run(count: int, seed: int | None = None, mend=False):
     """Raises RuntimeError when a device is not as it has to be after a power cut."""
-    seed = random.randrange(10**6) if seed is None else seed
-    print(f"seed {seed}", flush=True)
     table, totals = collections.Counter(), collections.Counter()
     victim = Victim(seed, mend)
     try:
-        run_cuts(count, victim, table, totals)
-    except RuntimeError as reason:
-        print(Console(victim.machine.console).text[-6000:])
-        raise RuntimeError(f"with seed {seed}: {reason}") from reason
+        with victim.telling():
+            run_cuts(count, victim, table, totals)
     finally:
         print_table(table, totals)

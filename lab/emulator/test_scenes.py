@@ -15,7 +15,8 @@ import pytest
 from lab import lines
 from lab.carriers import image
 from lab.device import Device, Node, sound_device
-from lab.emulator.machine import Machine, shown_links
+from lab.emulator.machine import (NO_BLOCK, NO_FILLER, NO_INODE, Machine,
+                                  shown_links)
 from lab.paths import (DEFAULT_ZONE, ICUTZ, LEGACY_ICUTZ, LOCALTIME, OLD_ICU,
                        RECORD, SYSTEM_ZONEINFO, TIMEZONE, ZONEINFO, update_path)
 from lab.seen import Seen
@@ -78,8 +79,7 @@ class Scene:
         if reader:
             found += [f"the device did not say: {text}" for text in shown
                       if text not in console.said]
-        if found:
-            fail(f"boot {self.boots}", found, before)
+        fail(f"boot {self.boots}", found, before)
         if "var=" not in how.get("options", ""):
             image.check(machine.var)
 
@@ -174,25 +174,21 @@ def test_no_directory(scene):
 def test_disk_without_a_free_block(scene):
     """Links fit into their inodes; only the record finds no room."""
     device = scene.on(updated())
-    scene.boot(reader="S23CP", then=lambda: device.announce(UPDATE),
-               script="dd if=/dev/zero of=/var/filler bs=65536 2>/dev/null\n"
-                      "dd if=/dev/zero of=/var/filler2 bs=4096 2>/dev/null\n")
+    scene.boot(reader="S23CP", then=lambda: device.announce(UPDATE), script=NO_BLOCK)
     activate(device)
     device.file(RECORD, "")
-    scene.boot(reader="U24AP", script="rm /var/filler /var/filler2\n")
+    scene.boot(reader="U24AP", script=NO_FILLER)
     scene.boot(REFUSED, reader="U24AP")
 
 
 def test_disk_without_a_free_inode(scene):
     device = scene.on(updated(), "-N", "64")
-    scene.boot(reader="S23CP", then=lambda: device.announce(UPDATE),
-               script="mkdir /var/filler\ni=0\n"
-                      "while touch /var/filler/$i 2>/dev/null; do i=$((i + 1)); done\n")
+    scene.boot(reader="S23CP", then=lambda: device.announce(UPDATE), script=NO_INODE)
     # The old zoneinfo link's inode serves the new one; for icutz there is none.
     device.point_links_at(None)
     scene.boot((lines.CREATE_SYMLINK % (ICUTZ, update_path(UPDATE) + "/icutz"),
                 errno.ENOSPC), (lines.NO_DATA, errno.ENOSPC),
-               reader="S23CP", script="rm -r /var/filler\n")
+               reader="S23CP", script=NO_FILLER)
     activate(device)
     scene.boot(reader="U24AP")
 

@@ -19,13 +19,12 @@ import pytest
 from lab import boot, releases
 from lab.carriers import namespace
 from lab.demo import data
-from lab.device import Device, decoded
+from lab.device import Device
 from lab.paths import (ICUTZ, LOCALTIME, SYSTEM_ICU, SYSTEM_ZONEINFO, TZ_LATEST,
                        ZONEINFO, update_path)
 from lab.places import PROJECT
 from lab.readers.programs import (FILES, LINKS, PSQL, READERS, READY, UNPACKED, ZONE,
                                   Reader, debian, server)
-from lab.seen import as_device
 
 DOCUMENT = PROJECT / "docs/readers.md"
 SECONDS = 10
@@ -46,18 +45,11 @@ ENVIRONMENT = {"PATH": "/usr/bin:/bin:/usr/sbin", "LC_ALL": "C.UTF-8",
 # --- The device -------------------------------------------------------------------
 
 
-def bring(device: Device, source: Path, target: str):
-    source = decoded(os.fsencode(source))
-    entries = {}
-    namespace.look_below(source, entries)
-    device.put(target, as_device(entries).find(source))
-
-
 def device_with(system: str, links: tuple[str, ...], update: str | None) -> Device:
     """A device with a system partition's data and both updates; one is in use."""
     device = Device()
-    bring(device, data.TARGET / system / "zoneinfo", SYSTEM_ZONEINFO)
-    bring(device, data.TARGET / system / "icu", SYSTEM_ICU)
+    for name, place in (("zoneinfo", SYSTEM_ZONEINFO), ("icu", SYSTEM_ICU)):
+        device.put(place, namespace.description_of(data.TARGET / system / name))
     Path("/etc/localtime").unlink(missing_ok=True)
     os.symlink(LOCALTIME, "/etc/localtime")
     for name in links:
@@ -68,8 +60,8 @@ def device_with(system: str, links: tuple[str, ...], update: str | None) -> Devi
         else:
             device.link(link, target)
     for update_set in ("update", "refused"):
-        bring(device, data.TARGET / update_set,
-              update_path(getattr(data.names(), update_set)))
+        device.put(update_path(getattr(data.names(), update_set)),
+                   namespace.description_of(data.TARGET / update_set))
     device.point_links_at(update)
     device.choose_zone(ZONE)
     # Packages that are only unpacked look for their files here.
