@@ -66,7 +66,7 @@ KNOWN = set("""
     SyslogLevelPrefix LimitAS LimitCORE User UMask CapabilityBoundingSet NoNewPrivileges
     ProtectSystem ReadWritePaths ReadOnlyPaths InaccessiblePaths DevicePolicy
     MemoryDenyWriteExecute SystemCallArchitectures SystemCallErrorNumber
-    SystemCallFilter KeyringMode ProtectHome ProtectProc
+    SystemCallFilter KeyringMode ProtectHome ProtectProc BindReadOnlyPaths
     ProtectControlGroups ProtectKernelLogs ProtectKernelModules ProtectKernelTunables
     PrivateMounts PrivateNetwork IPAddressDeny RestrictAddressFamilies
     LockPersonality RestrictNamespaces RestrictRealtime RestrictSUIDSGID
@@ -379,7 +379,7 @@ def confinement(place: Path, unit: str, visible="") -> Path:
     except that one of the hidden paths may be visible."""
     lists = {"ALLOWED_CALLS": values(unit, "SystemCallFilter"),
              "WRITABLE_PATHS": values(unit, "ReadWritePaths"),
-             "READ_ONLY_PATHS": values(unit, "ReadOnlyPaths"),
+             "READ_ONLY_PATHS": values(unit, "(?:Bind)?ReadOnlyPaths"),
              "HIDDEN_PATHS": [path for path in values(unit, "InaccessiblePaths")
                               if path != visible]}
     [limit] = values(unit, "LimitAS")

@@ -2,6 +2,7 @@
 //
 // Tries, in marlin's place, what the boot unit forbids, and prints what came of
 // it: a test that confines nothing would pass whatever the program does.
+// Without restrictions all files can be opened, and no call is refused.
 #define _GNU_SOURCE
 #include <errno.h>
 #include <fcntl.h>
@@ -27,15 +28,12 @@ static const char* const new_files[] = {
     "/dev/shm/entry",
     "/etc/entry",
     "/home/entry",
-    "/proc/entry",
     "/root/entry",
     "/run/entry",
     "/run/lock/entry",
     "/run/systemd/entry",
     "/run/systemd/system/entry.service",
     "/run/user/entry",
-    "/sys/entry",
-    "/sys/fs/cgroup/entry",
     "/tmp/entry",
     "/usr/entry",
     "/usr/libexec/entry",
@@ -56,27 +54,15 @@ static const char* const kernel_files[] = {
     "/proc/sysrq-trigger",
     "/sys/fs/cgroup/cgroup.subtree_control",
     "/sys/fs/cgroup/system.slice/cgroup.procs",
-    "/sys/kernel/uevent_helper",
     "/sys/power/state",
 };
 
 static const char* const secrets[] = {
-    "/dev/console",
-    "/dev/kmsg",
-    "/dev/mem",
-    "/dev/nvme0",
-    "/dev/nvme0n1",
-    "/dev/nvme0n2",
-    "/dev/port",
-    "/dev/rtc0",
-    "/dev/tty1",
-    "/dev/ttyS0",
-    "/etc/shadow",
-    "/proc/1/environ",
-    "/proc/1/root/etc/shadow",
-    "/proc/kcore",
-    "/proc/kmsg",
-    "/root/secret",
+    "/dev/console", "/dev/kmsg",       "/dev/mem",
+    "/dev/nvme0",   "/dev/nvme0n1",    "/dev/nvme0n2",
+    "/dev/rtc0",    "/dev/tty1",       "/dev/ttyS0",
+    "/etc/shadow",  "/proc/1/environ", "/proc/1/root/etc/shadow",
+    "/proc/kcore",  "/proc/kmsg",      "/root/secret",
     "/run/secret",
 };
 
@@ -124,7 +110,7 @@ static void print_limits(void) {
 // With arguments that would fail anyway, but for another reason.
 static void make_calls(void) {
   tell("call", "socket", socket(AF_UNIX, SOCK_STREAM, 0));
-  tell("call", "link", link("/usr/share/icu", "/var/db/entry"));
+  tell("call", "link", link("/usr/share/icu/icutzformat.txt", "/var/db/entry"));
   tell("call", "rename", rename("/var/db/none", "/var/db/entry"));
   tell("call", "mkdir", mkdir("/var/db/entry", 0755));
   tell("call", "mknod", mknod("/var/db/entry", S_IFIFO | 0600, 0));

@@ -18,6 +18,7 @@ from lab.systems.parts import AMD64, Processor, make_image, room
 
 SECONDS = 600  # a boot that takes longer hangs
 UNIT = "marlin.service"
+STARTING = "7d4958e842da4a758f6c1cdc7b36dcc5"  # the journal's message of this kind
 
 
 @dataclass
@@ -42,6 +43,10 @@ class Seen:
         """The journal's entries with these fields."""
         return [entry for entry in self.journal
                 if all(entry.get(name) == value for name, value in fields.items())]
+
+    def started(self) -> list[dict]:
+        """The journal's entries for each start of the unit."""
+        return self.said_by(MESSAGE_ID=STARTING, UNIT=UNIT)
 
     def failed(self) -> list[str]:
         """The units that failed."""

@@ -29,7 +29,10 @@ def test_no_directory():
     said = [message(entry) for entry in seen.said_by(UNIT=UNIT)]
     fail(seen, [] if any("/var/db/timezone" in text for text in said) else
          [f"the journal names no directory: {said}"])
-    assert seen.links == {} and seen.failed() == []
+    assert seen.links == {} and seen.failed() == [] and not seen.started()
+    assert seen.units[UNIT]["ActiveState"] == "inactive"
+    assert seen.at("sysinit.target", "ActiveEnter")
+    assert seen.text("reader") == "12:00 UTC\n"
 
 
 FILL = """[Unit]

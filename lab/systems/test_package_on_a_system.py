@@ -6,13 +6,14 @@ import pytest
 
 from lab.paths import ZONEINFO
 from lab.systems.machine import UNIT, System, message
-from lab.systems.scene import STARTING, device, fail, insist, linked
+from lab.systems.scene import device, fail, insist, linked
 
 pytestmark = pytest.mark.rest
 NEWER = """
 cd /run
 dpkg-deb -R /usr/lib/lab/marlin_*.deb newer
 sed -i 's/^Version: .*/Version: 99/' newer/DEBIAN/control
+sed -i 's/^Description=.*/&, Newer/' newer/usr/lib/systemd/system/marlin.service
 dpkg-deb -b newer newer.deb
 """
 AFTER = "find / -xdev -path '*marlin*' -not -path '*/lab/*' >/run/lab/seen/left\n"
@@ -32,6 +33,8 @@ def test_a_package_comes_and_goes():
         dpkg -i newer.deb
         dpkg -s marlin | grep '^Version: 99$'
         systemctl daemon-reload
+        systemctl show -p Description {UNIT} | grep 'Links, Newer$'
+        systemctl isolate lab.target
         {tell} >/run/lab/seen/after
         systemctl start {UNIT} || echo refused to start
         systemctl stop {UNIT} || echo refused to stop
@@ -39,21 +42,27 @@ def test_a_package_comes_and_goes():
     insist(seen, (), device())
     told = seen.text("then")
     assert told.endswith("ended with status 0\n"), told
-    assert "refused to stop" in told and states(seen, "before") == states(seen, "after")
+    assert "refused to start" in told and "refused to stop" in told
+    assert states(seen, "before") == states(seen, "after")
 
     seen = system.boot(f"set -e; systemctl unmask {UNIT}; dpkg -r marlin")
     assert seen.units[UNIT]["LoadState"] == "masked"
     fail(seen, not_run(seen))
 
-    seen = system.boot(f"set -e; dpkg -P marlin; {AFTER}")
+    seen = system.boot(f"set -e; dpkg -P marlin; {AFTER}"
+                       f"dpkg -i /usr/lib/lab/marlin_*.deb; systemctl daemon-reload\n"
+                       f"systemctl start tmp.mount || :; {tell} >/run/lab/seen/new")
     assert seen.units[UNIT]["LoadState"] == "not-found"
     assert seen.links.get(ZONEINFO) and seen.text("reader") == "13:00 WEST\n"
     fail(seen, not_run(seen) + [f"left behind: {path}" for path in
                                 states(seen, "left")])
+    assert states(seen, "new") == ["inactive"], "installed, and run at once"
+
+    insist(system.boot(), (), device())
 
 
 def not_run(seen) -> list[str]:
     """What tells that the program was started, or that its absence did harm."""
-    return ([message(entry) for entry in seen.said_by(MESSAGE_ID=STARTING, UNIT=UNIT)] +
+    return ([message(entry) for entry in seen.started()] +
             [message(entry) for entry in seen.said_by(SYSLOG_IDENTIFIER="marlin")] +
             [f"failed: {unit}" for unit in seen.failed()])
