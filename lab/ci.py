@@ -94,10 +94,6 @@ def demonstration():
     run("diff", "lab/demo/facts", "-", words=facts.stdout)
 
 
-def device():
-    run("scripts/device", "--tests")
-
-
 def door(*words: str):
     return lambda: run("scripts/" + words[0], *words[1:])
 
@@ -118,7 +114,8 @@ STAGES = {
                 door("package")),
     "arm64": ("arm64: build without a warning, all tests under qemu-user",
               door("test", "arm64-dev")),
-    "device": ("an emulated device: sequences of boots, power cuts", device),
+    "device": ("an emulated device: sequences of boots, power cuts",
+               door("device", "--tests")),
     "systems": ("real systems boot with the package: the unit holds",
                 door("device", "--systems", "--quick")),
     "proofs": ("the proofs, in short", door("prove", "--quick")),
@@ -128,11 +125,8 @@ STAGES = {
 def main():
     table = [f"  {name:12} {about}\n" for name, (about, _) in STAGES.items()]
     options = Options(__doc__.format(stages="".join(table)))
-    options.add_argument("stages", nargs="*", metavar="STAGE")
-    chosen = options.parse_args().stages or list(STAGES)
-    for name in chosen:
-        if name not in STAGES:
-            options.error(f"'{name}' is not a stage")
+    options.add_names("stages", STAGES)
+    chosen = options.parse_args().stages
     times = []
     for name in chosen:
         about, stage = STAGES[name]

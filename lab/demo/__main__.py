@@ -18,20 +18,14 @@ import sys
 
 from lab import boot
 from lab.demo import data
-from lab.doors import build_program, locked, need, say
+from lab.doors import Options, build_program, locked, need, say
 from lab.places import PROJECT
 
 
 def main() -> int:
-    match sys.argv[1:]:
-        case ["--help"]:
-            print(__doc__.strip())
-            return 0
-        case [] | ["--facts"]:
-            pass
-        case _:
-            print("demo: only --facts is understood; see --help", file=sys.stderr)
-            return 2
+    options = Options(__doc__)
+    options.add_argument("--facts", action="store_true")
+    options.parse_args()
     os.chdir(PROJECT)
     need("private-device")
     if status := subprocess.call(["scripts/private-device", "--probe"]):
