@@ -16,7 +16,7 @@ import subprocess
 import time
 from pathlib import Path
 
-from lab.doors import Options, configure, need, stop
+from lab.doors import Options, configure, need, pytest, stop
 from lab.places import BUILD, PROJECT
 
 LONGEST_DOOR = 40  # lines; more of them are logic, which belongs into lab/
@@ -82,8 +82,7 @@ def check_python():
 
 def first_contact():
     need("build", "private-device", "test", "pytest")
-    run("/usr/bin/python3", "-B", "-m", "pytest", "-c", "lab/pytest.ini",
-        f"--rootdir={PROJECT}", "lab/test_first_contact.py")
+    run(*pytest("lab/test_first_contact.py"))
 
 
 def demonstration():

@@ -137,6 +137,20 @@ def build(preset: str, *options: str, folder: Path | None = None,
     return folder
 
 
+def pytest(*arguments: str) -> list[str]:
+    """The command that runs tests of lab/."""
+    return ["/usr/bin/python3", "-B", "-m", "pytest", "-c", "lab/pytest.ini",
+            f"--rootdir={PROJECT}", *arguments]
+
+
+def unprivileged() -> list[str]:
+    """What to put before a command that asks marlin-status on a private device: root
+    has no capability there, and may then not have the namespaces that any other user
+    may have."""
+    other = "bwrap --unshare-user --uid 1000 --gid 1000 --dev-bind / /"
+    return other.split() if os.geteuid() == 0 else []
+
+
 def build_program():
     """Brings the release program up to date, unless MARLIN names another."""
     if "MARLIN" not in os.environ:
