@@ -4,7 +4,7 @@
 Breaks the program on purpose and shows which breaks no test notices. Mutants of
 driver/, dataset/ and support/ are made by rule, in one place at a time: an operator, a
 constant, a text, a name, a condition, a statement; and by hand, each to break a
-sentence of what the program must do: mutants_by_hand.py. Every one is built in a copy
+sentence of what the program must do: mutants_by_hand.txt. Every one is built in a copy
 of the project and the test programs run against it, the one named after its folder
 first, slow tests last, up to the first failure; one that hangs is killed too. Survivors
 are printed.
@@ -34,7 +34,6 @@ from pathlib import Path
 from typing import NamedTuple
 
 from lab.doors import Options, locked, need, number
-from lab.mutants_by_hand import MUTANTS
 from lab.places import BUILD, PROJECT
 
 PLACE = BUILD / "mutants"
@@ -214,10 +213,21 @@ def by_rule() -> Iterator[Mutant]:
                          f"{file}: {change}")
 
 
+def edits(body: str) -> Iterator[tuple[str, str, str]]:
+    """(file, before, after) of each edit of a mutant by hand."""
+    def lines(sign: str, edit: str) -> str:
+        return "\n".join(line[2:] for line in edit.splitlines() if line[0] == sign)
+
+    for edit in re.split(r"^  ", body, flags=re.M)[1:]:
+        yield edit.partition("\n")[0], lines("-", edit), lines("+", edit)
+
+
 def by_hand() -> Iterator[Mutant]:
-    for name, edits, sentence in MUTANTS:
+    listed = Path(__file__).with_name("mutants_by_hand.txt").read_text()
+    for name, sentence, body in re.findall(
+            r"^([A-Za-z0-9][\w-]*): (.*)\n((?:[-+ ].*\n|[-+]\n)+)", listed, re.M):
         texts = {}
-        for file, before, after in edits:
+        for file, before, after in edits(body):
             text = texts.get(file) or (PROJECT / file).read_text()
             if text.count(before) != 1:
                 sys.exit(f"mutants: by hand: {name}: found {text.count(before)} times, "
