@@ -41,7 +41,10 @@ def usual():
 
 
 def terabyte():
-    unpack(activation())
+    device = activation()
+    # Without a line end, so that all of it is one word.
+    device.file(f"{update_path('2024a.1.0')}/zoneinfo/+VERSION", "2024a")
+    unpack(device)
     os.truncate(f"{HOSTILE}/zoneinfo/+VERSION", 1 << 40)
 
 
