@@ -16,7 +16,7 @@ import subprocess
 import time
 from pathlib import Path
 
-from lab.doors import Options, configure, need, stop
+from lab.doors import Options, configure, need, pytest, stop
 from lab.places import BUILD, PROJECT
 
 LONGEST_DOOR = 40  # lines; more of them are logic, which belongs into lab/
@@ -82,8 +82,7 @@ def check_python():
 
 def first_contact():
     need("build", "private-device", "test", "pytest")
-    run("/usr/bin/python3", "-B", "-m", "pytest", "-c", "lab/pytest.ini",
-        f"--rootdir={PROJECT}", "lab/test_first_contact.py")
+    run(*pytest("lab/test_first_contact.py"))
 
 
 def demonstration():
@@ -92,10 +91,6 @@ def demonstration():
     if facts.returncode:
         stop(1, "scripts/demo --facts fails")
     run("diff", "lab/demo/facts", "-", words=facts.stdout)
-
-
-def device():
-    run("scripts/device", "--tests")
 
 
 def door(*words: str):
@@ -118,7 +113,8 @@ STAGES = {
                 door("package")),
     "arm64": ("arm64: build without a warning, all tests under qemu-user",
               door("test", "arm64-dev")),
-    "device": ("an emulated device: sequences of boots, power cuts", device),
+    "device": ("an emulated device: sequences of boots, power cuts",
+               door("device", "--tests")),
     "systems": ("real systems boot with the package: the unit holds",
                 door("device", "--systems", "--quick")),
     "proofs": ("the proofs, in short", door("prove", "--quick")),
@@ -128,11 +124,8 @@ STAGES = {
 def main():
     table = [f"  {name:12} {about}\n" for name, (about, _) in STAGES.items()]
     options = Options(__doc__.format(stages="".join(table)))
-    options.add_argument("stages", nargs="*", metavar="STAGE")
-    chosen = options.parse_args().stages or list(STAGES)
-    for name in chosen:
-        if name not in STAGES:
-            options.error(f"'{name}' is not a stage")
+    options.add_names("stages", STAGES)
+    chosen = options.parse_args().stages
     times = []
     for name in chosen:
         about, stage = STAGES[name]

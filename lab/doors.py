@@ -10,7 +10,7 @@ import re
 import signal
 import subprocess
 import sys
-from collections.abc import Iterator
+from collections.abc import Iterable, Iterator
 from pathlib import Path
 
 from lab.places import BUILD, PROJECT, shown
@@ -46,8 +46,25 @@ class Options(argparse.ArgumentParser):
     def format_help(self):
         return self.text or super().format_help()
 
+    def add_names(self, title: str, names: Iterable[str]):
+        """Any of these names, in any number; without one, all of them."""
+        def known(text: str) -> str:
+            if text not in names:
+                raise argparse.ArgumentTypeError(f"{text!r} is none of " +
+                                                 ", ".join(names))
+            return text
+
+        self.add_argument(title, nargs="*", type=known, default=list(names))
+
     def error(self, message):
         self.exit(2, f"{Path(self.prog).name}: {message}; see --help\n")
+
+
+def number(text: str) -> int:
+    """What an option that needs a number makes of its text."""
+    if not re.fullmatch("[1-9][0-9]{0,5}", text):
+        raise argparse.ArgumentTypeError("it needs a number from 1 to 999999")
+    return int(text)
 
 
 def need(*purposes: str):
@@ -118,6 +135,20 @@ def build(preset: str, *options: str, folder: Path | None = None,
     else:
         quietly(folder / "build.log", *command)
     return folder
+
+
+def pytest(*arguments: str) -> list[str]:
+    """The command that runs tests of lab/."""
+    return ["/usr/bin/python3", "-B", "-m", "pytest", "-c", "lab/pytest.ini",
+            f"--rootdir={PROJECT}", *arguments]
+
+
+def unprivileged() -> list[str]:
+    """What to put before a command that asks marlin-status on a private device: root
+    has no capability there, and may then not have the namespaces that any other user
+    may have."""
+    other = "bwrap --unshare-user --uid 1000 --gid 1000 --dev-bind / /"
+    return other.split() if os.geteuid() == 0 else []
 
 
 def build_program():

@@ -1,21 +1,22 @@
 # SPDX-License-Identifier: BSD-2-Clause
-"""Runs the fuzz targets in tests/fuzz with their engine, and keeps their seeds.
+"""usage: lab.fuzz [--seconds N] [--keep] [TARGET...]
 
-Two at a time, each from its seeds and from what earlier runs added to them in
-build/fuzz/corpus. An input that breaks a property is left in build/fuzz/findings.
+Runs the fuzz targets in tests/fuzz, or some of them, with their engine: two at a time,
+each from its seeds and from what earlier runs added to them in build/fuzz/corpus. An
+input that breaks a property is left in build/fuzz/findings.
+
+  --seconds N   how long each target runs (default 60)
+  --keep        add to the seeds what reaches more than they do
 
 Exit status: 0 without a finding, 1 with one, 2 for bad use.
 """
 
-import argparse
 import re
 import shutil
-import subprocess
-import sys
 from concurrent.futures import ThreadPoolExecutor
 from pathlib import Path
 
-from lab.doors import build, need
+from lab.doors import Options, build, need, number, quietly, say, show_end, stop
 from lab.places import BUILD, PROJECT
 
 PLACE = BUILD / "fuzz"
@@ -30,25 +31,14 @@ FORMAT = (r"# One seed a line, between the outer quotes. \\ and \n as in C; any 
 
 
 def escaped(seed: bytes) -> str:
-    def as_text(byte: int) -> str:
-        if byte == ord("\\"):
-            return r"\\"
-        if byte == ord("\n"):
-            return r"\n"
-        return chr(byte) if 0x20 <= byte < 0x7F else f"\\x{byte:02x}"
-
-    return f'"{"".join(map(as_text, seed))}"'
+    text = seed.decode("latin-1").replace("\\", r"\\").replace("\n", r"\n")
+    return '"' + re.sub("[^ -~]", lambda byte: f"\\x{ord(byte[0]):02x}", text) + '"'
 
 
 def unescaped(line: str) -> bytes:
     if not re.fullmatch(r'"([ -\[\]-~]|\\\\|\\n|\\x[0-9a-f]{2})*"', line):
         raise ValueError(f"not a seed: {line}")
-
-    def as_byte(match: re.Match[str]) -> str:
-        escape = match[0]
-        return {r"\\": "\\", r"\n": "\n"}.get(escape) or chr(int(escape[2:], 16))
-
-    return re.sub(r"\\(\\|n|x..)", as_byte, line[1:-1]).encode("latin-1")
+    return line[1:-1].encode("ascii").decode("unicode_escape").encode("latin-1")
 
 
 def seeds_file(target: str) -> Path:
@@ -70,18 +60,18 @@ def unpack_seeds(target: str) -> Path:
     directory = PLACE / "seeds" / target
     shutil.rmtree(directory, ignore_errors=True)
     directory.mkdir(parents=True)
-    for number, seed in enumerate(read_seeds(target)):
-        (directory / f"{number:04}").write_bytes(seed)
+    for index, seed in enumerate(read_seeds(target)):
+        (directory / f"{index:04}").write_bytes(seed)
     return directory
 
 
 def run_engine(target: str, *arguments: str | Path) -> tuple[bool, str]:
-    """Whether the engine ends without a finding, and its output, kept as a log."""
-    ended = subprocess.run(
-        [PLACE / f"tests/fuzz/fuzz_{target}", *arguments], text=True, errors="replace",
-        stdout=subprocess.PIPE, stderr=subprocess.STDOUT)
-    (PLACE / "log" / target).write_text(ended.stdout)
-    return ended.returncode == 0, ended.stdout
+    """Whether the engine ends without a finding, and its output."""
+    log = PLACE / "log" / target
+    status = quietly(log, PLACE / f"tests/fuzz/fuzz_{target}", *arguments, check=False)
+    if status:
+        show_end(log)
+    return status == 0, log.read_text(errors="replace")
 
 
 def fuzz(target: str, seconds: int) -> tuple[bool, int]:
@@ -97,44 +87,28 @@ def fuzz(target: str, seconds: int) -> tuple[bool, int]:
     if clean:
         print(f"fuzz: {target}: no finding in {runs} runs, {seconds} s", flush=True)
     else:
-        last_lines = "\n".join(output.splitlines()[-60:])
-        print(f"{last_lines}\nfuzz: {target}: a finding, in {PLACE}/findings",
-              file=sys.stderr, flush=True)
+        say(f"fuzz: {target}: a finding, in {PLACE}/findings")
     return clean, runs
 
 
 def keep(target: str) -> None:
     """Adds to the seeds what reaches more than they do."""
     directory = unpack_seeds(target)
-    merged, output = run_engine(target, "-merge=1", directory,
-                                PLACE / "corpus" / target)
+    merged, _ = run_engine(target, "-merge=1", directory, PLACE / "corpus" / target)
     if not merged:
-        sys.exit(f"{output}fuzz: {target}: the seeds cannot be merged")
+        stop(1, f"{target}: the seeds cannot be merged")
     seeds = {path.read_bytes() for path in directory.iterdir()}
     write_seeds(target, seeds)
     print(f"fuzz: {target}: {len(seeds)} seeds, {sum(map(len, seeds))} bytes")
 
 
 def main() -> int:
-    def number_of_seconds(text: str) -> int:
-        if not re.fullmatch("[1-9][0-9]{0,5}", text):
-            raise argparse.ArgumentTypeError("it needs a number from 1 to 999999")
-        return int(text)
-
-    parser = argparse.ArgumentParser(
-        "fuzz", description=__doc__,
-        formatter_class=argparse.RawDescriptionHelpFormatter)
-    parser.add_argument("--seconds", type=number_of_seconds, default=60, metavar="N",
-                        help="how long each target runs (default: 60)")
-    parser.add_argument("--keep", action="store_true",
-                        help="add to the seeds what reaches more than they do")
-    parser.add_argument("targets", nargs="*", metavar="TARGET",
-                        help=f"{', '.join(TARGETS)}; default: all")
-    arguments = parser.parse_args()
-    targets = arguments.targets or TARGETS
-    for target in targets:
-        if target not in TARGETS:
-            parser.error(f"there is no target {target}")
+    options = Options(__doc__)
+    options.add_argument("--seconds", type=number, default=60)
+    options.add_argument("--keep", action="store_true")
+    options.add_names("targets", TARGETS)
+    arguments = options.parse_args()
+    targets = arguments.targets
 
     for directory in ("findings", "log"):
         (PLACE / directory).mkdir(parents=True, exist_ok=True)
@@ -154,4 +128,4 @@ def main() -> int:
 
 
 if __name__ == "__main__":
-    sys.exit(main())
+    raise SystemExit(main())

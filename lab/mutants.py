@@ -1,27 +1,29 @@
 # SPDX-License-Identifier: BSD-2-Clause
-"""Breaks the program on purpose and shows which breaks no test notices.
+"""usage: lab.mutants [--quick N [--seed S]] [--only TEXT] [--list]
 
-Mutants of driver/, dataset/ and support/ are made by rule, in one place at a time: an
-operator, a constant, a text, a name, a condition, a statement; and by hand, each to
-break a sentence of what the program must do: mutants_by_hand.py. Every one is built in
-a copy of the project and the test programs run against it, the one named after its
-folder first, slow tests last, up to the first failure; one that hangs is killed too.
-Survivors are printed.
+Breaks the program on purpose and shows which breaks no test notices. Mutants of
+driver/, dataset/ and support/ are made by rule, in one place at a time: an operator, a
+constant, a text, a name, a condition, a statement; and by hand, each to break a
+sentence of what the program must do: mutants_by_hand.txt. Every one is built in a copy
+of the project and the test programs run against it, the one named after its folder
+first, slow tests last, up to the first failure; one that hangs is killed too. Survivors
+are printed.
 
 Those that change nothing that anybody could notice are listed, with a reason each, in
 mutants_equivalent.txt. Exit status: 0 when there is no other, 1 when there is, 2 for
 bad use. The copies, up to one for each processor, and their builds are in
 build/mutants.
+
+  --quick N     only N mutants, chosen at random
+  --seed S      of that choice (default 1)
+  --only TEXT   only mutants with TEXT in their line of output
+  --list        prints the mutants, builds nothing
 """
 
-import argparse
-import fcntl
 import os
 import queue
 import random
 import re
-import shutil
-import signal
 import subprocess
 import sys
 import time
@@ -31,7 +33,7 @@ from concurrent.futures import ThreadPoolExecutor
 from pathlib import Path
 from typing import NamedTuple
 
-from lab.mutants_by_hand import MUTANTS
+from lab.doors import Options, locked, need, number
 from lab.places import BUILD, PROJECT
 
 PLACE = BUILD / "mutants"
@@ -211,10 +213,21 @@ def by_rule() -> Iterator[Mutant]:
                          f"{file}: {change}")
 
 
+def edits(body: str) -> Iterator[tuple[str, str, str]]:
+    """(file, before, after) of each edit of a mutant by hand."""
+    def lines(sign: str, edit: str) -> str:
+        return "\n".join(line[2:] for line in edit.splitlines() if line[0] == sign)
+
+    for edit in re.split(r"^  ", body, flags=re.M)[1:]:
+        yield edit.partition("\n")[0], lines("-", edit), lines("+", edit)
+
+
 def by_hand() -> Iterator[Mutant]:
-    for name, edits, sentence in MUTANTS:
+    listed = Path(__file__).with_name("mutants_by_hand.txt").read_text()
+    for name, sentence, body in re.findall(
+            r"^([A-Za-z0-9][\w-]*): (.*)\n((?:[-+ ].*\n|[-+]\n)+)", listed, re.M):
         texts = {}
-        for file, before, after in edits:
+        for file, before, after in edits(body):
             text = texts.get(file) or (PROJECT / file).read_text()
             if text.count(before) != 1:
                 sys.exit(f"mutants: by hand: {name}: found {text.count(before)} times, "
@@ -244,27 +257,16 @@ def reasons() -> dict[str, str]:
 
 
 def run(seconds: int, *command, file_size="unlimited") -> tuple[bool, str]:
-    """Whether a command succeeds within this time, and its output."""
-    limits = (f"trap '' XFSZ; ulimit -f {file_size} -t {seconds} -v 4194304; "
-              'exec "$@"')  # what a mutant could take from the machine
-    process = subprocess.Popen(
-        ["bash", "-c", limits, "bash", *command], stdin=subprocess.DEVNULL,
-        stdout=subprocess.PIPE, stderr=subprocess.STDOUT, start_new_session=True)
-    try:
-        # Ten times as long by the clock, for a machine that has more to do.
-        output = process.communicate(timeout=10 * seconds)[0]
-        return process.returncode == 0, output.decode(errors="replace")
-    except subprocess.TimeoutExpired:
-        os.killpg(process.pid, signal.SIGKILL)
-        process.communicate()
-        return False, "it hangs"
-
-
-def files_of(root: Path) -> set[Path]:
-    """The project's, without what is built and without its history."""
-    return {path.relative_to(root) for top in root.iterdir()
-            if top.name not in ("build", ".git")
-            for path in (top, *top.rglob("*")) if path.is_file()}
+    """Whether a command succeeds within this time, and its output. Limited is what a
+    mutant could take from the machine."""
+    limits = ["env", "--ignore-signal=XFSZ",
+              # Ten times as long by the clock, for a machine that has more to do.
+              "timeout", "--signal=KILL", str(10 * seconds),
+              "prlimit", f"--fsize={file_size}", f"--cpu={seconds}", f"--as={4 << 30}"]
+    done = subprocess.run([*limits, *command], text=True, errors="replace",
+                          stdin=subprocess.DEVNULL, stdout=subprocess.PIPE,
+                          stderr=subprocess.STDOUT)
+    return done.returncode == 0, done.stdout
 
 
 class Tree:
@@ -273,7 +275,10 @@ class Tree:
     def __init__(self, number: int):
         """Builds and tests the copy as it is; finds each program's slow tests."""
         self.root = PLACE / f"tree{number}"
-        self.bring_up_to_date()
+        # What is the same keeps its time, and so its objects.
+        subprocess.run(["rsync", "-rlp", "--checksum", "--delete", "--mkpath",
+                        "--exclude=/build", "--exclude=/.git",
+                        f"{PROJECT}/", f"{self.root}/"], check=True)
         if not (self.root / "build/build.ninja").exists():
             subprocess.run(
                 ["cmake", "-S", self.root, "-B", self.root / "build", "-G", "Ninja",
@@ -302,28 +307,16 @@ class Tree:
         if not self.slow or not self.test_imports():
             sys.exit("mutants: no test program was built, or the imports fail as is")
 
-    def bring_up_to_date(self):
-        """What is the same keeps its time, and so its objects."""
-        self.root.mkdir(parents=True, exist_ok=True)
-        wanted = files_of(PROJECT)
-        for file in files_of(self.root) - wanted:
-            (self.root / file).unlink()
-        for file in wanted:
-            source, target = PROJECT / file, self.root / file
-            target.parent.mkdir(parents=True, exist_ok=True)
-            if not target.exists() or target.read_bytes() != source.read_bytes():
-                shutil.copy(source, target)
-
     def build(self, target: str):
         return run(900, "ninja", "-C", self.root / "build", "-j2", target)
 
     def run_tests(self, program: str, *options: str, slow=False):
         seconds, sign, file_size = {
             None: (90, "-", "unlimited"),  # all of them
-            False: (30, "-", 1 << 18), True: (90, "", "unlimited")}[slow]
+            False: (30, "-", 256 << 20), True: (90, "", "unlimited")}[slow]
         return run(seconds, self.root / "build/tests" / program, *options,
                    f"--gtest_filter={sign}{':'.join(self.slow[program])}",
-                   file_size=file_size)  # in blocks of 1 kB
+                   file_size=file_size)
 
     def test_imports(self) -> bool:
         """The test that is not in a program."""
@@ -383,42 +376,38 @@ def figures(counts: Counter) -> str:
             f"{counts['survivor']} unexplained survivors")
 
 
-def main(argv: list[str]) -> int:
-    parser = argparse.ArgumentParser(
-        prog="mutants", description=__doc__,
-        formatter_class=argparse.RawTextHelpFormatter)
-    parser.add_argument("--quick", type=int, metavar="N",
-                        help="only N mutants, chosen at random")
-    parser.add_argument("--seed", type=int, default=1, metavar="S",
-                        help="of that choice (default 1)")
-    parser.add_argument("--only", default="", metavar="TEXT",
-                        help="only mutants with TEXT in their line of output")
-    parser.add_argument("--list", action="store_true",
-                        help="print the mutants, build nothing")
-    options = parser.parse_args(argv)
+def main() -> int:
+    parser = Options(__doc__)
+    parser.add_argument("--quick", type=number)
+    parser.add_argument("--seed", type=int, default=1)
+    parser.add_argument("--only", default="")
+    parser.add_argument("--list", action="store_true")
+    options = parser.parse_args()
+    need("build", "private-device", "test", "mutants")
 
-    PLACE.mkdir(parents=True, exist_ok=True)
-    lock = open(PLACE / "lock", "w", encoding="ascii")
-    try:
-        fcntl.flock(lock, fcntl.LOCK_EX | fcntl.LOCK_NB)
-    except BlockingIOError:
-        sys.exit("mutants: another run is under way")
     mutants, equivalent = [*by_rule(), *by_hand()], reasons()
     for key in equivalent.keys() - {mutant.key for mutant in mutants}:
         sys.exit(f"mutants: explained, but there is none: {key}")
     mutants = [mutant for mutant in mutants if options.only in mutant.shown]
     if options.quick and options.quick < len(mutants):
-        mutants = [mutants[number] for number in sorted(
+        mutants = [mutants[index] for index in sorted(
             random.Random(options.seed).sample(range(len(mutants)), options.quick))]
     if options.list:
         print(*(mutant.shown for mutant in mutants), sep="\n")
         return 0
 
+    with locked(PLACE):
+        return judge(mutants, equivalent,
+                     f", seed {options.seed}" if options.quick else "")
+
+
+def judge(mutants: list[Mutant], equivalent: dict[str, str], chosen: str) -> int:
+    """Tries all of them and tells their fates."""
     wanted = min(os.cpu_count() or 1, 1 + len(mutants) // 100)
     trees = [Tree(number) for number in range(wanted)]
     begun, wrong = time.monotonic(), False
     counts = {"by rule": Counter(), "by hand": Counter()}
-    for number, (mutant, fate) in enumerate(fates(trees, mutants), 1):
+    for done, (mutant, fate) in enumerate(fates(trees, mutants), 1):
         explained = mutant.key in equivalent
         if fate == "survivor" and explained:
             fate = "equivalent"
@@ -429,14 +418,13 @@ def main(argv: list[str]) -> int:
         wrong |= fate == "survivor" or explained and fate != "equivalent"
         counts[mutant.kind][fate] += 1
         if sys.stderr.isatty():
-            print(f"\r{number} of {len(mutants)} ", end="", file=sys.stderr)
+            print(f"\r{done} of {len(mutants)} ", end="", file=sys.stderr)
     for kind, some in counts.items():
         print(f"{kind}: {figures(some)}")
-    chosen = f", seed {options.seed}" if options.quick else ""
     print(f"mutants: {figures(sum(counts.values(), Counter()))}; "
           f"{time.monotonic() - begun:.0f} s{chosen}")
     return int(wrong)
 
 
 if __name__ == "__main__":
-    sys.exit(main(sys.argv[1:]))
+    sys.exit(main())

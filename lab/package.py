@@ -10,7 +10,7 @@ Exit status: 0 when all checks passed, another when one failed, 2 for bad use.
 
 import subprocess
 
-from lab.doors import Options, need
+from lab.doors import Options, need, pytest
 from lab.places import PROJECT
 
 
@@ -21,9 +21,8 @@ def main() -> int:
     need("build", "private-device", "test", "pytest", "package", "arm64")
     presets = [chosen] if chosen else ["release", "arm64-release"]
     return subprocess.call(
-        ["/usr/bin/python3", "-B", "-m", "pytest", "-c", "lab/pytest.ini",
-         f"--rootdir={PROJECT}", "-v", *(f"--preset={name}" for name in presets),
-         "lab/test_package.py"], cwd=PROJECT)
+        pytest("-v", *(f"--preset={name}" for name in presets), "lab/test_package.py"),
+        cwd=PROJECT)
 
 
 if __name__ == "__main__":

@@ -31,7 +31,7 @@ import subprocess
 import time
 
 from lab import releases
-from lab.doors import Options, build_program, need, stop
+from lab.doors import Options, build_program, need, pytest, stop, unprivileged
 from lab.places import BUILD, PROJECT
 
 PYTHON = ["/usr/bin/python3", "-B", "-m"]
@@ -58,16 +58,10 @@ OTHERS = {  # the whole, and with --quick
 def trials(name: str, *arguments: str) -> list[str]:
     """The command that runs tests in workers, each on a private device of its own."""
     workers = min(os.cpu_count() or 1, 8)
-    command = [
-        *PYTHON, "pytest", "-c", "lab/pytest.ini", f"--rootdir={PROJECT}", "-q",
-        "--tx", f"{workers}*popen//python=lab/worker", "--dist", "load",
-        "--maxfail", "10", f"--junit-xml={BUILD}/prove/{name}.xml", *arguments]
-    if os.geteuid() == 0 and "lab/test_status.py" in " ".join(arguments):
-        # On a private device root has no capability, and may then not have the
-        # namespaces that any other user may have.
-        other = "bwrap --unshare-user --uid 1000 --gid 1000 --dev-bind / /"
-        return other.split() + command
-    return command
+    asks = "lab/test_status.py" in " ".join(arguments)
+    return [*(unprivileged() if asks else []), *pytest(
+        "-q", "--tx", f"{workers}*popen//python=lab/worker", "--dist", "load",
+        "--maxfail", "10", f"--junit-xml={BUILD}/prove/{name}.xml", *arguments)]
 
 
 def prove(name: str, command: list[str]) -> tuple[bool, str]:

@@ -29,11 +29,10 @@ LEAK = """int main() {
 
 
 def sanitized(reports: str):
-    quote = '"' if "'" in reports else "'"
     options = (
         "detect_leaks=1:detect_stack_use_after_return=1:check_initialization_order=1:"
         "strict_init_order=1:strict_string_checks=1:print_stacktrace=1:"
-        f"log_path={quote}{reports}{quote}")
+        f"log_path='{reports}'")
     return {"ASAN_OPTIONS": options, "UBSAN_OPTIONS": options}, []
 
 

@@ -20,6 +20,7 @@ from typing import NamedTuple
 
 import pytest
 
+from lab import doors
 from lab.places import BUILD, PROJECT
 
 WORK = BUILD / "packaging"
@@ -271,9 +272,8 @@ def boot(test: str, program: Path):
     """Runs a test of lab/package_boots.py on a private device, with this program."""
     in_user_namespace(
         1000, "scripts/private-device", "/usr/bin/env", f"MARLIN={program}",
-        "/usr/bin/python3", "-B", "-m", "pytest", "-c", "lab/pytest.ini",
-        f"--rootdir={PROJECT}", "-q", "-p", "no:cacheprovider",
-        f"lab/package_boots.py::{test}", cwd=PROJECT)
+        *doors.pytest("-q", "-p", "no:cacheprovider", f"lab/package_boots.py::{test}"),
+        cwd=PROJECT)
 
 
 @pytest.fixture(scope="module")

@@ -18,6 +18,7 @@ from pathlib import Path
 PROJECT = Path(__file__).resolve().parents[1]
 sys.path.insert(0, str(PROJECT))
 from lab import lines  # noqa: E402
+from lab.doors import Options  # noqa: E402
 
 os.chdir(PROJECT)
 PRODUCT = [path for folder in ("driver", "dataset", "support")
@@ -202,19 +203,14 @@ CHECKS = {check.__name__: check
           for check in (source_rules, deliberate, documents, manual_pages)}
 
 
-def main(names: list[str]) -> int:
-    if names == ["--help"]:
-        print(__doc__.strip())
-        return 0
-    for name in names:
-        if name not in CHECKS:
-            print(f"checks: there is no check {name}; see --help", file=sys.stderr)
-            return 2
-    failures = [f"{name}: {failure}" for name in names or CHECKS
+def main() -> int:
+    options = Options(__doc__)
+    options.add_names("checks", CHECKS)
+    failures = [f"{name}: {failure}" for name in options.parse_args().checks
                 for failure in CHECKS[name]()]
     print(*failures, sep="\n", end="\n" if failures else "", file=sys.stderr)
     return 1 if failures else 0
 
 
 if __name__ == "__main__":
-    sys.exit(main(sys.argv[1:]))
+    sys.exit(main())

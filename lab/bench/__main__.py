@@ -36,16 +36,16 @@ import subprocess
 import sys
 import tempfile
 import time
-from collections.abc import Iterator
+from collections.abc import Iterable, Iterator
 from pathlib import Path
 
 from lab import releases
 from lab.bench.measure import SCENES
 from lab.bench.status import rows as status_rows
-from lab.doors import Options, need
+from lab.doors import Options, build, need, number
 from lab.places import BUILD
 
-BUILDS = f"{BUILD}/bench"
+BUILDS = BUILD / "bench"
 PROGRAMS = f"{BUILDS}/static/lab/bench"
 FLOOR = f"{PROGRAMS}/floor_SCENE"
 BASELINE = Path("lab/bench/baseline.txt")
@@ -64,17 +64,15 @@ def run(*command: str, **options) -> str:
 
 def built(name: str, *arguments: str, targets=("marlin",)) -> str:
     """The release build with something changed, stripped."""
-    directory = f"{BUILDS}/{name}"
-    run("cmake", "--preset", "release", "-B", directory, *arguments)
-    run("cmake", "--build", directory, "--target", *targets)
-    run("strip", "-o", f"{directory}.stripped", f"{directory}/marlin")
-    return f"{directory}.stripped"
+    folder = build("release", *arguments, folder=BUILDS / name, targets=targets)
+    run("strip", "-o", f"{folder}.stripped", f"{folder}/marlin")
+    return f"{folder}.stripped"
 
 
 def built_static(*targets: str) -> str:
     """The program as it ships; and what else is measured, with these targets."""
     return built("static", "-DMARLIN_BENCH=ON", "-DCMAKE_C_COMPILER=gcc", targets=(
-        "marlin", "peak", *(f"floor_{scene}" for scene in SCENES), *targets))
+        "marlin", *(f"floor_{scene}" for scene in SCENES), *targets))
 
 
 def measured(job: str, *arguments: str):
@@ -86,19 +84,15 @@ def size_of(program: str) -> int:
     return os.path.getsize(program.replace("SCENE", "quiet"))
 
 
-def print_table(columns: str, rows: list, words=1):
+def print_table(columns: str, rows: Iterable, words=1):
     """The first columns are words, all others are numbers."""
+    from tabulate import tabulate  # Only main() makes sure that it is there.
     titles = columns.split(", ")
-    rules = ["---"] * words + ["---:"] * (len(titles) - words)
-    rows = [titles, rules, *([str(cell) for cell in row] for row in rows)]
-    widths = [max(map(len, column)) for column in zip(*rows)]
-    for row in rows:
-        print("|", " | ".join(
-            f"{cell:{'<' if index < words else '>'}{width}}"
-            for index, (cell, width) in enumerate(zip(row, widths))), "|")
+    sides = ["left"] * words + ["right"] * (len(titles) - words)
+    print(tabulate(rows, titles, "pipe", disable_numparse=True, colalign=sides))
 
 
-def table(rounds: str):
+def table(rounds: int):
     programs = {
         "floor": FLOOR,
         "marlin, static": built_static(),
@@ -108,7 +102,7 @@ def table(rounds: str):
             "-DCMAKE_EXE_LINKER_FLAGS=-static-libstdc++ -static-libgcc"),
         "shell script": "lab/bench/boot"}
     counts = measured("counts", *programs.values())
-    walls = measured("wall", rounds, *programs.values())
+    walls = measured("wall", str(rounds), *programs.values())
     rows = []
     for scene in SCENES:
         least = counts[scene][0][0]
@@ -336,20 +330,18 @@ def companions():
 
 def status():
     built_static("marlin-status")
-    print_table("Device, Milliseconds, MB, Exit status", list(status_rows()))
+    print_table("Device, Milliseconds, MB, Exit status", status_rows())
 
 
 def main():
     parser = Options(__doc__)
-    parser.add_argument("--rounds", default="11")
+    parser.add_argument("--rounds", type=number, default=11)
     jobs = parser.add_mutually_exclusive_group()
     for job in (check, record, growth, hardening, parsers, companions, status,
                 making):
         jobs.add_argument(f"--{job.__name__}", dest="job", action="store_const",
                           const=job, default=table)
     options = parser.parse_args()
-    if not re.fullmatch("[1-9][0-9]{0,3}", options.rounds):
-        parser.error("--rounds needs a number")
     name = options.job.__name__
     more = [f"bench-{name}"] if name in ("table", "growth", "parsers") else []
     more += ["demo"] if name == "making" else []

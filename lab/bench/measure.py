@@ -22,6 +22,7 @@ import time
 from collections.abc import Callable, Iterator
 from pathlib import Path
 
+from lab.bench.peak import peak
 from lab.carriers import namespace
 from lab.device import Device, sound_device
 from lab.devices import activation
@@ -31,7 +32,6 @@ from lab.paths import (DOWNLOADS, ICUTZ, LOCALTIME, RECORD, SYSTEM_ZONEINFO, TZ_
 from lab.seen import as_device
 
 ICU = f"{update_path('2024a.1.0')}/icutz"
-PEAK = "build/bench/static/lab/bench/peak"
 # All that the programs get, and this only because the script needs its tools. Each
 # variable more is some 550 instructions more in the C library's start-up.
 ENVIRONMENT = {"PATH": "/usr/bin"}
@@ -65,10 +65,10 @@ def placed(scene: str, programs) -> list[str]:
     return [f"/tmp/{index}/program" for index in range(len(programs))]
 
 
-def run(*command: str, stderr: int | None = subprocess.DEVNULL) -> str:
-    """What a command prints; it must not fail."""
-    return subprocess.run(command, env=ENVIRONMENT, stdout=subprocess.PIPE,
-                          stderr=stderr, text=True, check=True).stdout
+def run(*command: str):
+    """Runs a command, which must not fail."""
+    subprocess.run(command, env=ENVIRONMENT, stdout=subprocess.DEVNULL,
+                   stderr=subprocess.DEVNULL, check=True)
 
 
 def instructions(program: str, restore: Callable) -> int:
@@ -87,7 +87,7 @@ def measured(program: str, restore: Callable) -> tuple[int, int, int]:
     run("strace", "-f", "-qq", "-o", "/tmp/calls", program)
     calls = re.findall(r"^\d+ +[a-z_0-9]+\(", Path("/tmp/calls").read_text(), re.M)
     restore()
-    return counted, len(calls), int(run(PEAK, program, stderr=None))
+    return counted, len(calls), peak(program, env=ENVIRONMENT)[0]
 
 
 def counts(*programs: str) -> dict[str, list]:
@@ -204,7 +204,7 @@ def companions(marlin: str, install: str, mend: str) -> dict:
     restore()
     return {"bytes": sum(len(text) for path, text in device.contents().items()
                          if path.startswith(SOURCE)),
-            "install": [min(times), int(run(PEAK, install, SOURCE, stderr=None))],
+            "install": [min(times), peak(install, SOURCE, env=ENVIRONMENT)[0]],
             "quiet": [measured(command, functools.partial(
                 namespace.build, in_use("2024a.1.0")))
                 for command in placed("quiet", [marlin, mend])]}

@@ -18,20 +18,14 @@ import sys
 
 from lab import boot
 from lab.demo import data
-from lab.doors import build_program, locked, need, say
+from lab.doors import Options, build_program, locked, need, say, unprivileged
 from lab.places import PROJECT
 
 
 def main() -> int:
-    match sys.argv[1:]:
-        case ["--help"]:
-            print(__doc__.strip())
-            return 0
-        case [] | ["--facts"]:
-            pass
-        case _:
-            print("demo: only --facts is understood; see --help", file=sys.stderr)
-            return 2
+    options = Options(__doc__)
+    options.add_argument("--facts", action="store_true")
+    options.parse_args()
     os.chdir(PROJECT)
     need("private-device")
     if status := subprocess.call(["scripts/private-device", "--probe"]):
@@ -43,12 +37,9 @@ def main() -> int:
         say("Preparing the real time-zone data (about 5 s)")
         data.prepare()
     os.environ["MARLIN"] = boot.PROGRAM
-    # Root may not ask marlin-status there; see lab/prove.py.
-    other = ["bwrap", "--unshare-user", "--uid", "1000", "--gid", "1000",
-             "--dev-bind", "/", "/"] if os.geteuid() == 0 else []
     command = [
-        *other, "scripts/private-device", "--readable", os.path.dirname(boot.PROGRAM),
-        "--readable", str(data.TARGET),
+        *unprivileged(), "scripts/private-device", "--readable", str(data.TARGET),
+        "--readable", os.path.dirname(boot.PROGRAM),
         "/usr/bin/python3", "-B", "-m", "lab.demo.story", *sys.argv[1:]]
     os.execvp(command[0], command)
 
