@@ -119,7 +119,7 @@ TEST_F(IcuWalk, ThatCannotBeStartedIsReportedAndThrown) {
   for (const int error : {ENOMEM, EMFILE, EIO, EINVAL}) {
     walk.open_error = error;
     const std::string reason = std::strerror(error);
-    EXPECT_THAT(printed_before_throwing(error, [error] { schema(); }),
+    EXPECT_THAT(printed_before_throwing(error, [] { schema(); }),
                 lines(failure("tz_icu::initialize: fts_open of "
                               "/var/db/timezone/tz/2024a.1.0/icutz failed, " +
                                   reason,

@@ -43,8 +43,8 @@ std::string update(const std::string& version);
 
 // --- Building a device -----------------------------------------------------
 
-// A file keeps its inode, and a directory what is in it. Anything else that is
-// there is removed first.
+// Each removes whatever else is there. A file that is made anew keeps its
+// inode, and a directory what is in it.
 void make_directory(const std::string& path, mode_t mode = 0755);
 void make_file(const std::string& path, const std::string& content = {},
                mode_t mode = 0644);
