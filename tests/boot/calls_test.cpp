@@ -1,92 +1,24 @@
 // SPDX-License-Identifier: BSD-2-Clause
 //
-// In which order a boot looks at and changes the links, and what it never does:
-// rename, sync.
-#include <algorithm>
-
+// Every call of a boot, in order: no lock, no umask, no rename, no sync, no
+// second fcntl, nothing on standard output, no look at the environment or the
+// locale.
 #include "tests/device/device.h"
 
 using namespace device;
 
 namespace {
 
-class Calls : public DeviceTest {
+class Calls : public SoundDeviceTest {
  protected:
   void SetUp() override {
-    DeviceTest::SetUp();
     if (emulated()) GTEST_SKIP() << "strace would show the emulator's calls";
-    install_system("2023c", "44l");
-    point_links_at_system();
+    SoundDeviceTest::SetUp();
   }
-
-  // "call path" for every call on the device; on some processors a call is the
-  // variant of it that takes a directory.
-  static std::vector<std::string> of_a_boot() {
-    const outcome booted = run(
-        {"/usr/bin/strace", "-qq", "-o", trace, "-E",
-         "ASAN_OPTIONS=detect_leaks=0", "-e",
-         "trace=?access,faccessat,?readlink,readlinkat,?unlink,unlinkat,?rmdir,"
-         "?symlink,symlinkat,?link,linkat,?rename,?renameat,renameat2,?mkdir,"
-         "mkdirat,fsync,fdatasync,sync,syncfs,sync_file_range",
-         MARLIN_PROGRAM});
-    EXPECT_EQ(booted.exit_status, 0);
-    std::vector<std::string> calls;
-    for (const auto& line : outcome{0, 0, file_at(trace)}.lines()) {
-      std::string call = line.substr(0, line.find('('));
-      if (call.ends_with("at")) call.resize(call.size() - 2);
-      // readlink("path", "target"...), symlink("target", "path"), call("path")
-      const auto end = call == "readlink" ? line.find('"', line.find('"') + 1)
-                                          : line.rfind('"');
-      if (end == std::string::npos) {
-        calls.push_back(call);  // such as sync()
-        continue;
-      }
-      const auto begin = line.rfind('"', end - 1) + 1;
-      const std::string path = line.substr(begin, end - begin);
-      if (path.starts_with("/var/db/") || path.starts_with("/usr/share/"))
-        calls.push_back(call + " " + path);
-    }
-    return calls;
-  }
-
-  static inline const std::string trace = "/var/db/trace";
 };
 
-using ::testing::ElementsAre;
-
-TEST_F(Calls, OfAnActivationRemoveAndCreateEveryLinkInOrder) {
-  install_update("2024a.1.0", "44l");
-  announce("2024a.1.0");
-  point_localtime_at("/usr/share/zoneinfo/Europe/Paris");
-  EXPECT_THAT(
-      of_a_boot(),
-      ElementsAre("access /var/db/icutz", "access /var/db/icutz",
-                  "unlink /var/db/icu", "readlink /var/db/timezone/tz_latest",
-                  "readlink /var/db/timezone/zoneinfo",
-                  "unlink /var/db/timezone/zoneinfo",
-                  "symlink /var/db/timezone/zoneinfo",
-                  "unlink /var/db/timezone/icutz", "unlink /var/db/icutz",
-                  "symlink /var/db/timezone/icutz",
-                  "readlink /var/db/timezone/localtime",
-                  "access /var/db/timezone/zoneinfo/Europe/Paris",
-                  "unlink /var/db/timezone/localtime",
-                  "symlink /var/db/timezone/localtime"));
-}
-
-TEST_F(Calls, OfAMigrationTestTheLegacyLinkAnewBeforeItIsRemoved) {
-  make_link(legacy_icutz, "/usr/share/icu");
-  EXPECT_THAT(
-      of_a_boot(),
-      ElementsAre("access /var/db/icutz", "access /var/db/timezone/icutz",
-                  "readlink /var/db/icutz", "symlink /var/db/timezone/icutz",
-                  "access /var/db/icutz", "unlink /var/db/icutz",
-                  "unlink /var/db/icu", "readlink /var/db/timezone/tz_latest",
-                  "readlink /var/db/timezone/zoneinfo",
-                  "readlink /var/db/timezone/localtime"));
-}
-
-// --- The whole list of a boot's calls: no lock, no umask, no sync, no second
-// fcntl, nothing on standard output, no look at the environment or the locale.
+using ::testing::Contains;
+using ::testing::EndsWith;
 
 class WholeListOfCalls : public Calls {
  protected:
@@ -100,20 +32,16 @@ class WholeListOfCalls : public Calls {
   // library's choice of variants undone: "call path", or "call number" where
   // the first argument is a descriptor.
   static std::string of_a_boot() {
-    const outcome booted = run({"/usr/bin/strace", "-qq", "-o", trace, "-E",
-                                "ASAN_OPTIONS=detect_leaks=0", MARLIN_PROGRAM},
-                               [] {
-                                 ::setenv("LC_ALL", "de_DE.UTF-8", 1);
-                                 ::setenv("TZ", "Europe/Paris", 1);
-                               });
-    EXPECT_EQ(booted.exit_status, 0);
+    const auto booted = trace({}, {MARLIN_PROGRAM}, [] {
+      ::setenv("LC_ALL", "de_DE.UTF-8", 1);
+      ::setenv("TZ", "Europe/Paris", 1);
+    });
     std::string calls;
-    for (const auto& line : outcome{0, 0, file_at(trace)}.lines()) {
+    for (const auto& line : booted.calls) {
       if (line.find("SIGPIPE, {sa_handler=SIG_IGN") != std::string::npos)
         calls.clear();
       calls += plain(line);
     }
-    wipe(trace);
     return calls;
   }
 
@@ -138,14 +66,15 @@ class WholeListOfCalls : public Calls {
       "close 4\n"
       "fchdir 3\n"
       "close 3\n";
+  const std::string reads_the_links = "unlink /var/db/icu\n" +
+                                      reads_the_system +
+                                      "readlink /var/db/timezone/tz_latest\n"
+                                      "readlink /var/db/timezone/zoneinfo\n";
   const std::string start =
       "rt_sigaction\n"
       "access /var/db/icutz\n"
-      "access /var/db/icutz\n"
-      "unlink /var/db/icu\n" +
-      reads_the_system +
-      "readlink /var/db/timezone/tz_latest\n"
-      "readlink /var/db/timezone/zoneinfo\n";
+      "access /var/db/icutz\n" +
+      reads_the_links;
   const std::string relinks_zoneinfo =
       "unlink /var/db/timezone/zoneinfo\n"
       "symlink /var/db/timezone/zoneinfo\n"
@@ -185,15 +114,27 @@ TEST_F(WholeListOfCalls, OfABootWithNothingToDo) {
   EXPECT_EQ(of_a_boot(), start + reads_the_system + end);
 }
 
+// The legacy link is tested anew before it is removed.
+TEST_F(WholeListOfCalls, OfAMigration) {
+  make_link(legacy_icutz, "/usr/share/icu");
+  EXPECT_EQ(of_a_boot(),
+            "rt_sigaction\n"
+            "access /var/db/icutz\n"
+            "access /var/db/timezone/icutz\n"
+            "readlink /var/db/icutz\n"
+            "symlink /var/db/timezone/icutz\n"
+            "access /var/db/icutz\n"
+            "unlink /var/db/icutz\n" +
+                reads_the_links + reads_the_system + end);
+}
+
 TEST_F(WholeListOfCalls, OfABootWithAnUpdateInUse) {
-  install_update("2024a.1.0", "44l");
-  point_links_at_update("2024a.1.0");
+  install_and_use("2024a.1.0", "44l");
   EXPECT_EQ(of_a_boot(), start + reads_an_update + end);
 }
 
 TEST_F(WholeListOfCalls, OfAnActivation) {
-  install_update("2024a.1.0", "44l");
-  announce("2024a.1.0");
+  install_and_announce("2024a.1.0", "44l");
   EXPECT_EQ(of_a_boot(), start + reads_the_system + reads_an_update +
                              relinks_zoneinfo +
                              "symlink /var/db/timezone/icutz\n"
@@ -205,8 +146,7 @@ TEST_F(WholeListOfCalls, OfAnActivation) {
 }
 
 TEST_F(WholeListOfCalls, OfAReset) {
-  install_update("2024a.1.0", "44l");
-  point_links_at_update("2024a.1.0");
+  install_and_use("2024a.1.0", "44l");
   install_system("2025a", "44l");
   EXPECT_EQ(of_a_boot(), start + reads_an_update + "write 2\n" +
                              reads_the_system + relinks_zoneinfo + end);
@@ -225,41 +165,28 @@ TEST_F(WholeListOfCalls, OfACorrectionOfTheLocalTime) {
 
 // Where stat(2) fails open(2) has to tell.
 TEST_F(Calls, ThatCannotTellAFileFromADeviceOpenIt) {
-  install_update("2024a.1.0", "44l");
-  announce("2024a.1.0");
-  const outcome booted =
-      run({"/usr/bin/strace", "-qq", "-o", trace, "-E",
-           "ASAN_OPTIONS=detect_leaks=0", "-P", record, "-P",
-           system_tree + "/+VERSION", "-e",
-           "inject=?fstat,?fstat64,?newfstatat,?fstatat64,?statx:error=EIO",
-           MARLIN_PROGRAM});
-  EXPECT_EQ(booted.exit_status, 0);
+  install_and_announce("2024a.1.0", "44l");
+  const auto booted =
+      trace({"-P", record, "-P", system_tree + "/+VERSION", "-e",
+             "inject=?fstat,?fstat64,?newfstatat,?fstatat64,?statx:error=EIO"});
   EXPECT_EQ(booted.log, "");
   EXPECT_EQ(file_at(record), "2023c.1.0_2024a.1.0");
-  const auto traced = outcome{0, 0, file_at(trace)}.lines();
-  EXPECT_EQ(std::count_if(traced.begin(), traced.end(),
-                          [](const std::string& line) {
-                            return line.ends_with("(INJECTED)");
-                          }),
-            3);  // the system's word is read twice: it is also the current
+  // The system's word is read twice: it is also the current one.
+  EXPECT_THAT(booted.calls, Contains(EndsWith("(INJECTED)")).Times(3));
 }
 
 // What was only said to be written is missing from the record.
 TEST_F(Calls, OfAShortWriteGoOnBehindWhatWasTaken) {
-  install_update("2024a.1.0", "44l");
-  announce("2024a.1.0");
+  install_and_announce("2024a.1.0", "44l");
   const auto boot_with_first_write_taking = [](const std::string& bytes) {
-    const outcome booted =
-        run({"/usr/bin/strace", "-qq", "-o", trace, "-E",
-             "ASAN_OPTIONS=detect_leaks=0", "-P", record, "-e",
-             "inject=write:retval=" + bytes + ":when=1", MARLIN_PROGRAM});
-    EXPECT_EQ(booted.exit_status, 0);
-    EXPECT_EQ(booted.log, "");
+    point_links_at_system();
+    EXPECT_EQ(
+        trace({"-P", record, "-e", "inject=write:retval=" + bytes + ":when=1"})
+            .log,
+        "");
   };
   boot_with_first_write_taking("1");
   EXPECT_EQ(file_at(record), "023c.1.0_2024a.1.0");
-
-  point_links_at_system();
   boot_with_first_write_taking("0");
   EXPECT_EQ(file_at(record), "");
 }

@@ -26,10 +26,8 @@ class Log : public DeviceTest {
 
     const outcome booted = run({MARLIN_PROGRAM}, in_the_child);
     EXPECT_EQ(booted.exit_status, 0);
-    EXPECT_EQ(booted.signal, 0);
     EXPECT_EQ(booted.log, "");
-    EXPECT_EQ(link_at(zoneinfo), update("2024a.1.0") + "/zoneinfo");
-    EXPECT_EQ(link_at(icutz), update("2024a.1.0") + "/icutz");
+    expect_links_at_update("2024a.1.0");
     EXPECT_EQ(link_at(local_time), default_localtime);
     EXPECT_EQ(file_at(record), "2023c.1.0_2024a.1.0");
     EXPECT_EQ(file_at(system_tree + "/+VERSION"), "2023c\n");

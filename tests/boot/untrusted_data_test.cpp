@@ -9,25 +9,25 @@
 #include "tests/device/device.h"
 
 using namespace device;
+using ::testing::ElementsAre;
+using ::testing::HasSubstr;
+using ::testing::IsEmpty;
+using ::testing::SizeIs;
 
 namespace {
 
-class UntrustedData : public DeviceTest {
+class UntrustedData : public SoundDeviceTest {
  protected:
   void SetUp() override {
-    DeviceTest::SetUp();
-    install_system("2023c", "44l");
-    install_update("2024a.1.0", "44l");
-    point_links_at_system();
-    announce("2024a.1.0");
+    SoundDeviceTest::SetUp();
+    install_and_announce("2024a.1.0", "44l");
   }
 
   // An update's own "+VERSION" decides nothing, whatever it holds.
   static void expect_activation() {
-    const outcome booted = boot();
-    EXPECT_EQ(booted.exit_status, 0);
-    EXPECT_EQ(booted.log, "");
-    EXPECT_EQ(link_at(zoneinfo), update("2024a.1.0") + "/zoneinfo");
+    point_links_at_system();
+    boot_prints(no_lines());
+    expect_links_at_update("2024a.1.0");
   }
 
   const std::string version_file = update("2024a.1.0") + "/zoneinfo/+VERSION";
@@ -37,7 +37,6 @@ TEST_F(UntrustedData, OfAnyContentInAVersionFileIsHarmless) {
   for (const std::string& content :
        {std::string(), std::string(70'000, '\0'), std::string("%s%n%s\n"),
         std::string(1u << 20, '9'), std::string("\xff\xfe\x80")}) {
-    point_links_at_system();
     make_file(version_file, content);
     expect_activation();
   }
@@ -46,43 +45,24 @@ TEST_F(UntrustedData, OfAnyContentInAVersionFileIsHarmless) {
 TEST_F(UntrustedData, OfAnyKindInPlaceOfAVersionFileIsHarmless) {
   wipe(version_file);
   expect_activation();
-
-  point_links_at_system();
   make_directory(version_file);
   expect_activation();
-
-  point_links_at_system();
-  wipe(version_file);
   make_fifo(version_file);
   expect_activation();
-
-  point_links_at_system();
   make_link(version_file, "/dev/zero");
   expect_activation();
-
-  point_links_at_system();
   make_link(version_file, version_file);
   expect_activation();
 }
 
 TEST_F(UntrustedData, OfAFifoInPlaceOfTheFormatFileCountsAsNone) {
-  wipe(system_icu + "/icutzformat.txt");
   make_fifo(system_icu + "/icutzformat.txt");
-  const outcome booted = boot();
-  EXPECT_EQ(booted.exit_status, 0);
-  EXPECT_THAT(booted.lines(),
-              lines(failure("New update not compatible or older version: "
-                            "2024a.1.0 vs. 2023c.1.0",
-                            ENOENT)));
+  boot_prints(lines(refused("2024a.1.0", "2023c.1.0")));
 }
 
 TEST_F(UntrustedData, OfAFifoInPlaceOfTheSystemsVersionCountsAsNone) {
-  wipe(system_tree + "/+VERSION");
   make_fifo(system_tree + "/+VERSION");
-  const auto first =
-      failure("Cannot parse version string .1.0, results.size() = 0", ENOENT);
-  const auto second = failure("Cannot parse version string .1.0", ENOENT);
-  EXPECT_THAT(boot().lines(), lines(first, second, first, second));
+  boot_prints(lines(unparsed(".1.0"), unparsed(".1.0")));
   EXPECT_EQ(file_at(record), ".1.0_2024a.1.0");
 }
 
@@ -94,74 +74,54 @@ TEST_F(UntrustedData, OfAFifoInPlaceOfTheRecordIsLeftAlone) {
 
 // The lines of a boot's trace that open a version, the format or the record.
 std::vector<std::string> opened_by_a_boot() {
-  const std::string trace = "/var/db/trace";
-  EXPECT_EQ(
-      run({"/usr/bin/strace", "-qq", "-o", trace, "-e", "trace=open,openat",
-           "-E", "ASAN_OPTIONS=detect_leaks=0", MARLIN_PROGRAM})
-          .exit_status,
-      0);
   std::vector<std::string> opened;
-  for (const auto& line : outcome{0, 0, file_at(trace)}.lines()) {
+  for (const auto& line : trace({"-e", "trace=open,openat"}).calls) {
     for (const char* name : {"+VERSION", "icutzformat", "TZVersionDiffRecord"})
       if (line.find(name) != std::string::npos) opened.push_back(line);
   }
-  wipe(trace);
   return opened;
 }
 
 TEST_F(UntrustedData, IsOpenedPlainlyWhereItIsAFile) {
   if (emulated()) GTEST_SKIP() << "strace would show the emulator's calls";
-  const auto opened = opened_by_a_boot();
+  const auto read = HasSubstr(", O_RDONLY|O_CLOEXEC) = ");
+  const auto written =
+      HasSubstr(", O_WRONLY|O_CREAT|O_TRUNC|O_CLOEXEC, 0666) = ");
   // Two data sets of the system, the update, the record.
-  EXPECT_EQ(opened.size(), 6u);
-  EXPECT_THAT(opened,
-              ::testing::Each(::testing::AnyOf(
-                  ::testing::HasSubstr(", O_RDONLY|O_CLOEXEC) = "),
-                  ::testing::HasSubstr(
-                      ", O_WRONLY|O_CREAT|O_TRUNC|O_CLOEXEC, 0666) = "))));
+  EXPECT_THAT(opened_by_a_boot(),
+              ElementsAre(read, read, read, read, read, written));
 }
 
 TEST_F(UntrustedData, IsNeverOpenedWhereItIsAFifoASocketOrADevice) {
   if (emulated()) GTEST_SKIP() << "strace would show the emulator's calls";
-  const auto put = [](const std::string& path, const char* device) {
-    wipe(path);
-    make_link(path, device);
-  };
   make_fifo("/var/db/fifo");
   make_socket("/var/db/socket");
   for (const char* device : {"/dev/null", "/dev/zero", "/dev/full", "/dev/tty",
                              "/var/db/fifo", "/var/db/socket"}) {
-    wipe(system_icu);
+    SCOPED_TRACE(device);
     make_file(system_icu + "/icutzformat.txt", "44l");
-    put(system_tree + "/+VERSION", device);
-    put(version_file, device);
-    put(record, device);
+    make_link(system_tree + "/+VERSION", device);
+    make_link(version_file, device);
+    make_link(record, device);
     point_links_at_system();
     // What is left is the format file, once for each of two data sets.
-    EXPECT_EQ(opened_by_a_boot().size(), 2u) << device;
-    EXPECT_EQ(link_at(zoneinfo), update("2024a.1.0") + "/zoneinfo") << device;
-    put(system_icu + "/icutzformat.txt", device);
-    EXPECT_THAT(opened_by_a_boot(), ::testing::IsEmpty()) << device;
+    EXPECT_THAT(opened_by_a_boot(), SizeIs(2));
+    expect_links_at_update("2024a.1.0");
+    make_link(system_icu + "/icutzformat.txt", device);
+    EXPECT_THAT(opened_by_a_boot(), IsEmpty());
   }
 }
 
 TEST_F(UntrustedData, OfA64MebibyteVersionOfTheSystemIsReadWhole) {
   const std::string word(64u << 20, '7');
   make_file(system_tree + "/+VERSION", word);
-  wipe(tz_latest);
   const outcome booted = boot();
   EXPECT_EQ(booted.exit_status, 0);
-  // Two lines for the system's data set and two for the current one.
-  const std::string first =
-      "marlin: Cannot parse version string " + word + ".1.0, results.size()";
-  EXPECT_EQ(booted.log.compare(0, first.size(), first), 0);
+  // Two lines for the system's data set and two for the current one. Not by a
+  // matcher, which would print them.
   EXPECT_EQ(booted.lines().size(), 4u);
-}
-
-TEST_F(UntrustedData, OfA64MebibyteVersionIsRecordedWhole) {
-  const std::string word(64u << 20, 'x');
-  make_file(system_tree + "/+VERSION", word);
-  EXPECT_EQ(boot().exit_status, 0);
+  EXPECT_TRUE(booted.log.starts_with("marlin: Cannot parse version string " +
+                                     word + ".1.0, results.size()"));
   EXPECT_TRUE(file_at(record) == word + ".1.0_2024a.1.0");
 }
 
@@ -179,41 +139,35 @@ TEST_F(UntrustedData, OfAVersionThatDoesNotFitIntoMemoryIsHarmless) {
   });
   EXPECT_EQ(booted.exit_status, 0);
   EXPECT_EQ(booted.log, "");
-  EXPECT_EQ(link_at(zoneinfo), update("2024a.1.0") + "/zoneinfo");
+  expect_links_at_update("2024a.1.0");
   wipe(version_file);
 }
 
 TEST_F(UntrustedData, OfLinkTargetsBeyondTheLimitIsCutAndRejected) {
+  wipe(tz_latest);
   for (const std::size_t size : {1023u, 1024u, 1025u, 4095u}) {
     const std::string target = "/" + std::string(size - 1, 'x');
     point_zoneinfo_at(target);
-    wipe(tz_latest);
-    EXPECT_THAT(
-        boot().lines(),
-        lines(failure("Bad zoneinfo link " + target.substr(0, 1024), ENOENT),
-              failure("Invalid current symlinks; resetting to system partition",
-                      ENOENT)));
-    EXPECT_EQ(link_at(zoneinfo), system_tree);
+    boot_prints(
+        lines(bad_zoneinfo_link(target.substr(0, 1024)), invalid_links()));
+    expect_links_at_system();
   }
 }
 
 TEST_F(UntrustedData, OfAnUpdateNameOf255BytesIsOneVersion) {
   const std::string name = "2024" + std::string(251, 'z');
-  install_update(name, "44l");
-  announce(name);
-  EXPECT_EQ(boot().exit_status, 0);
-  EXPECT_EQ(link_at(zoneinfo), update(name) + "/zoneinfo");
+  install_and_announce(name, "44l");
+  boot_prints(no_lines());
+  expect_links_at_update(name);
   EXPECT_EQ(file_at(record), "2023c.1.0_" + name);
 }
 
 TEST_F(UntrustedData, OfNamesWithNewlinesAndPercentSignsIsPrintedAsItIs) {
   const std::string name = "2024a\n%s%n";
-  install_update(name, "44l");
-  announce(name);
+  install_and_announce(name, "44l");
   EXPECT_THAT(boot().log,
-              ::testing::HasSubstr(
-                  "marlin: Cannot parse version string 2024a\n%s%n: "));
-  EXPECT_EQ(link_at(zoneinfo), system_tree);
+              HasSubstr("marlin: Cannot parse version string 2024a\n%s%n: "));
+  expect_links_at_system();
 }
 
 TEST_F(UntrustedData, OfATreeDeeperThanAWalkCanGoIsNotWalked) {

@@ -55,19 +55,17 @@ TEST_F(Dataset, OfAnEmptyPathIsTheSystemPartitions) {
 
 TEST_F(Dataset, OfAnUpdateIsNamedByItsDirectory) {
   install_update("2024a.1.0", "45b");
-  EXPECT_THAT(printed_by([] {
-                const mln_dataset update("/var/db/timezone/tz/2024a.1.0");
-                EXPECT_EQ(update.path, "/var/db/timezone/tz/2024a.1.0");
-                EXPECT_EQ(update.version_string, "2024a.1.0");
-                EXPECT_TRUE(update.version == mln_version("2024a.1.0"));
-                ASSERT_EQ(update.components.size(), 2u);
-                EXPECT_EQ(zoneinfo_of(update).zoneinfo_path,
-                          "/var/db/timezone/tz/2024a.1.0/zoneinfo");
-                EXPECT_EQ(icu_of(update).icu_path,
-                          "/var/db/timezone/tz/2024a.1.0/icutz");
-                EXPECT_EQ(icu_of(update).schema, "45b");
-              }),
-              no_lines());
+  quietly([] {
+    const mln_dataset update("/var/db/timezone/tz/2024a.1.0");
+    EXPECT_EQ(update.path, "/var/db/timezone/tz/2024a.1.0");
+    EXPECT_EQ(update.version_string, "2024a.1.0");
+    EXPECT_TRUE(update.version == mln_version("2024a.1.0"));
+    ASSERT_EQ(update.components.size(), 2u);
+    EXPECT_EQ(zoneinfo_of(update).zoneinfo_path,
+              "/var/db/timezone/tz/2024a.1.0/zoneinfo");
+    EXPECT_EQ(icu_of(update).icu_path, "/var/db/timezone/tz/2024a.1.0/icutz");
+    EXPECT_EQ(icu_of(update).schema, "45b");
+  });
 }
 
 TEST_F(Dataset, OfAnUpdateReadsItsVersionFileButIsNotNamedByIt) {
@@ -81,87 +79,58 @@ TEST_F(Dataset, OfAnUpdateReadsItsVersionFileButIsNotNamedByIt) {
 TEST_F(Dataset, OfAnUpdateDoesNotNeedAVersionFile) {
   install_update("2024a.1.0", "44l");
   wipe(update("2024a.1.0") + "/zoneinfo");
-  EXPECT_THAT(printed_by([] {
-                const mln_dataset dataset(update("2024a.1.0"));
-                EXPECT_TRUE(dataset.version == mln_version("2024a.1.0"));
-              }),
-              no_lines());
+  quietly([] {
+    const mln_dataset dataset(update("2024a.1.0"));
+    EXPECT_TRUE(dataset.version == mln_version("2024a.1.0"));
+  });
 }
 
-TEST_F(Dataset, OfTheDownloadRootItselfIsRefused) {
-  EXPECT_THAT(printed_by([] {
-                EXPECT_EQ(refusal_of("/var/db/timezone/tz/"), "badpath");
-              }),
-              lines(failure("mln_dataset::create_components: bad path "
-                            "/var/db/timezone/tz/",
-                            ENOENT)));
-}
-
+// The line ends in the error of reading the version file before.
 TEST_F(Dataset, OfAPathOutsideTheDownloadRootIsRefused) {
   for (const std::string path :
        {"/", "x", "tz/2024a.1.0", "var/db/timezone/tz/2024a.1.0",
-        "/var/db/timezone/tz", "/var/db/timezone/tz2/2024a.1.0",
-        "/var/db/Timezone/tz/2024a.1.0", "/VAR/db/timezone/tz/2024a.1.0",
-        "//var/db/timezone/tz/2024a.1.0", "/usr/share/zoneinfo.default",
-        "/var/db/timezone/tz.2024a.1.0", "/var/db/timezone/zoneinfo/%s%n"}) {
-    EXPECT_THAT(
-        printed_by([&] { EXPECT_EQ(refusal_of(path), "badpath"); }),
-        lines(failure("mln_dataset::create_components: bad path " + path,
-                      ENOENT)));
+        "/var/db/timezone/tz", "/var/db/timezone/tz/",
+        "/var/db/timezone/tz2/2024a.1.0", "/var/db/Timezone/tz/2024a.1.0",
+        "/VAR/db/timezone/tz/2024a.1.0", "//var/db/timezone/tz/2024a.1.0",
+        "/usr/share/zoneinfo.default", "/var/db/timezone/tz.2024a.1.0",
+        "/var/db/timezone/zoneinfo/%s%n"}) {
+    const auto build = [&] {
+      errno = 0;
+      EXPECT_EQ(refusal_of(path), "badpath");
+    };
+    EXPECT_THAT(printed_by(build), lines(bad_path(path)));
   }
-}
-
-TEST_F(Dataset, OfARefusedPathHasReadItsVersionFileBefore) {
-  // Only the access time could tell, if the file is there; that the reading
-  // failed tells it too, by the error that it leaves for the refusal's line.
-  EXPECT_THAT(
-      printed_by([] {
-        errno = 0;
-        EXPECT_EQ(refusal_of("/var/db/missing"), "badpath");
-      }),
-      lines(failure("mln_dataset::create_components: bad path /var/db/missing",
-                    ENOENT)));
 }
 
 TEST_F(Dataset, OfTheShortestPathIsAcceptedWithAnUnsetVersion) {
   make_directory("/var/db/timezone/tz/x");
-  EXPECT_THAT(
-      printed_by([] {
-        const mln_dataset dataset("/var/db/timezone/tz/x");
-        EXPECT_EQ(dataset.version_string, "x");
-        EXPECT_TRUE(dataset.version == mln_version());
-        EXPECT_EQ(dataset.components.size(), 2u);
-      }),
-      lines(
-          failure("Cannot parse version string x, results.size() = 0", ENOENT),
-          failure("Cannot parse version string x", ENOENT),
-          failure("No ICU schema found for /var/db/timezone/tz/x", 0)));
+  EXPECT_THAT(printed_by([] {
+                const mln_dataset dataset("/var/db/timezone/tz/x");
+                EXPECT_EQ(dataset.version_string, "x");
+                EXPECT_TRUE(dataset.version == mln_version());
+                EXPECT_EQ(dataset.components.size(), 2u);
+              }),
+              lines(unparsed("x"), no_schema_in("/var/db/timezone/tz/x")));
 }
 
 TEST_F(Dataset, OfAPathWithATrailingSlashKeepsItAndIsOlderThanAll) {
   install_update("2024a.1.0", "44l");
-  EXPECT_THAT(
-      printed_by([] {
-        const mln_dataset dataset("/var/db/timezone/tz/2024a.1.0/");
-        EXPECT_EQ(dataset.path, "/var/db/timezone/tz/2024a.1.0/");
-        EXPECT_EQ(dataset.version_string, "2024a.1.0/");
-        EXPECT_TRUE(mln_dataset() > dataset);
-        EXPECT_EQ(zoneinfo_of(dataset).zoneinfo_path,
-                  "/var/db/timezone/tz/2024a.1.0//zoneinfo");
-      }),
-      lines(
-          failure("Cannot parse version string 2024a.1.0/, results.size() = 0",
-                  ENOENT),
-          failure("Cannot parse version string 2024a.1.0/", ENOENT)));
+  EXPECT_THAT(printed_by([] {
+                const mln_dataset dataset("/var/db/timezone/tz/2024a.1.0/");
+                EXPECT_EQ(dataset.path, "/var/db/timezone/tz/2024a.1.0/");
+                EXPECT_EQ(dataset.version_string, "2024a.1.0/");
+                EXPECT_TRUE(mln_dataset() > dataset);
+                EXPECT_EQ(zoneinfo_of(dataset).zoneinfo_path,
+                          "/var/db/timezone/tz/2024a.1.0//zoneinfo");
+              }),
+              lines(unparsed("2024a.1.0/")));
 }
 
 TEST_F(Dataset, OfADeeperPathKeepsItInItsVersionTextAndIsUnset) {
   install_update("a/b", "44l");
-  printed_by([] {
-    const mln_dataset dataset("/var/db/timezone/tz/a/b");
-    EXPECT_EQ(dataset.version_string, "a/b");
-    EXPECT_TRUE(dataset.version == mln_version());
-  });
+  const mln_dataset dataset("/var/db/timezone/tz/a/b");
+  EXPECT_EQ(dataset.version_string, "a/b");
+  EXPECT_TRUE(dataset.version == mln_version());
 }
 
 TEST_F(Dataset, OfASystemWithoutAVersionFileHasAnUnsetVersion) {
@@ -171,39 +140,21 @@ TEST_F(Dataset, OfASystemWithoutAVersionFileHasAnUnsetVersion) {
                 EXPECT_EQ(system.version_string, ".1.0");
                 EXPECT_TRUE(system.version == mln_version());
               }),
-              lines(failure("Cannot parse version string .1.0, "
-                            "results.size() = 0",
-                            ENOENT),
-                    failure("Cannot parse version string .1.0", ENOENT)));
+              lines(unparsed(".1.0")));
 }
 
 TEST_F(Dataset, OfASystemAlwaysGetsItsTwoNumbers) {
   install_system("2023c.1.0", "44l");
-  printed_by([] {
-    const mln_dataset system;
-    EXPECT_EQ(system.version_string, "2023c.1.0.1.0");
-    EXPECT_TRUE(system.version == mln_version());
-  });
+  const mln_dataset system;
+  EXPECT_EQ(system.version_string, "2023c.1.0.1.0");
+  EXPECT_TRUE(system.version == mln_version());
 }
 
 TEST_F(Dataset, WithANumberThatDoesNotFitThrowsOutOfRange) {
   install_update("2147483648a", "44l");
-  EXPECT_THAT(printed_by([] {
-                EXPECT_THROW(mln_dataset(update("2147483648a")),
-                             std::out_of_range);
-              }),
-              no_lines());
-}
-
-TEST_F(Dataset, PrintsTheParsersLinesBeforeTheIcuComponents) {
-  make_directory(update("odd"));
-  EXPECT_THAT(
-      printed_by([] { mln_dataset dataset(update("odd")); }),
-      lines(failure("Cannot parse version string odd, "
-                    "results.size() = 0",
-                    ENOENT),
-            failure("Cannot parse version string odd", ENOENT),
-            failure("No ICU schema found for /var/db/timezone/tz/odd", 0)));
+  quietly([] {
+    EXPECT_THROW(mln_dataset(update("2147483648a")), std::out_of_range);
+  });
 }
 
 TEST_F(Dataset, IsTheOnlyOwnerOfItsComponents) {
@@ -270,77 +221,41 @@ TEST_F(Dataset, IsCompatibleWithItselfAndWithTheSameSchemaOnly) {
   EXPECT_FALSE(other.compatible_with(system));
 }
 
-TEST_F(Dataset, OfListsOfDifferentLengthsIsNotCompatible) {
-  const mln_dataset system;
-  mln_dataset shorter;
-  shorter.components.pop_back();
-  EXPECT_FALSE(shorter.compatible_with(system));
-  EXPECT_FALSE(system.compatible_with(shorter));
-}
-
 TEST_F(Dataset, AsksItsOwnComponents) {
-  struct scripted final : mln_dataset_component {
-    explicit scripted(bool answer) : answer_(answer) {}
-    bool compatible_schema(const mln_dataset_component&) const override {
-      return answer_;
-    }
-    void activate() const override {}
-    bool answer_;
-  };
-  mln_dataset accepting;
-  mln_dataset refusing;
-  accepting.components = {std::make_shared<scripted>(true)};
-  refusing.components = {std::make_shared<scripted>(false)};
-  EXPECT_TRUE(accepting.compatible_with(refusing));
-  EXPECT_FALSE(refusing.compatible_with(accepting));
+  mln_dataset trees;
+  mln_dataset icu_data;
+  trees.components = {std::make_shared<mln_zoneinfo>()};
+  icu_data.components = {std::make_shared<mln_icu>()};
+  EXPECT_TRUE(trees.compatible_with(icu_data));
+  printed_by([&] { EXPECT_FALSE(icu_data.compatible_with(trees)); });
 }
 
 TEST_F(DatasetActivate, LinksTheZoneinfoTreeThenTheIcuData) {
   install_update("2024a.1.0", "44l");
-  EXPECT_THAT(printed_by([] { mln_dataset(update("2024a.1.0")).activate(); }),
-              no_lines());
-  EXPECT_EQ(link_at(zoneinfo), "/var/db/timezone/tz/2024a.1.0/zoneinfo");
-  EXPECT_EQ(link_at(icutz), "/var/db/timezone/tz/2024a.1.0/icutz");
+  quietly([] { mln_dataset(update("2024a.1.0")).activate(); });
+  expect_links_at_update("2024a.1.0");
 }
 
 TEST_F(DatasetActivate, StopsAtTheFirstComponentThatThrows) {
   install_update("2024a.1.0", "44l");
+  const auto activate = [] { mln_dataset(update("2024a.1.0")).activate(); };
   make_directory(zoneinfo);
   make_link(icutz, "/var/db/old");
-  printed_by([] {
-    EXPECT_EQ(thrown_by([] { mln_dataset(update("2024a.1.0")).activate(); }),
-              EEXIST);
-  });
+  printed_before_throwing(EEXIST, activate);
   EXPECT_EQ(link_at(icutz), "/var/db/old");
-}
 
-TEST_F(DatasetActivate, LeavesWhatIsLinkedByThenLinked) {
-  install_update("2024a.1.0", "44l");
+  wipe(zoneinfo);
   make_directory(icutz);
-  printed_by([] {
-    EXPECT_EQ(thrown_by([] { mln_dataset(update("2024a.1.0")).activate(); }),
-              EEXIST);
-  });
+  printed_before_throwing(EEXIST, activate);
   EXPECT_EQ(link_at(zoneinfo), "/var/db/timezone/tz/2024a.1.0/zoneinfo");
 }
 
-TEST_F(DatasetActivate, OfTheSystemLinksItsTreeAndNoIcuData) {
-  point_links_at_update("2024a.1.0");
-  make_link(legacy_icutz, "/var/db/older");
-  EXPECT_THAT(printed_by([] { mln_dataset().activate(); }), no_lines());
-  EXPECT_EQ(link_at(zoneinfo), "/usr/share/zoneinfo.default");
-  EXPECT_EQ(link_at(icutz), nothing);
-  EXPECT_EQ(link_at(legacy_icutz), nothing);
-}
-
 TEST_F(ResetToSystemPartition, LinksTheSystemTreeAndTouchesNothingElse) {
-  install_update("2024a.1.0", "44l");
-  point_links_at_update("2024a.1.0");
+  install_and_use("2024a.1.0", "44l");
   announce("2024a.1.0");
   point_localtime_at("anything");
-  EXPECT_THAT(printed_by([] { reset_to_system_partition(); }), no_lines());
-  EXPECT_EQ(link_at(zoneinfo), "/usr/share/zoneinfo.default");
-  EXPECT_EQ(link_at(icutz), nothing);
+  quietly(reset_to_system_partition);
+  expect_links_at_system();
   EXPECT_EQ(link_at(tz_latest), update("2024a.1.0"));
   EXPECT_EQ(link_at(local_time), "anything");
   EXPECT_EQ(file_at(record), nothing);
@@ -348,11 +263,7 @@ TEST_F(ResetToSystemPartition, LinksTheSystemTreeAndTouchesNothingElse) {
 
 TEST_F(ResetToSystemPartition, ReadsTheSystemPartitionAnew) {
   wipe(system_tree);
-  EXPECT_THAT(printed_by([] { reset_to_system_partition(); }),
-              lines(failure("Cannot parse version string .1.0, "
-                            "results.size() = 0",
-                            ENOENT),
-                    failure("Cannot parse version string .1.0", ENOENT)));
+  EXPECT_THAT(printed_by(reset_to_system_partition), lines(unparsed(".1.0")));
   EXPECT_EQ(link_at(zoneinfo), "/usr/share/zoneinfo.default");
 }
 
@@ -360,9 +271,7 @@ TEST_F(ResetToSystemPartition, PassesOnWhatActivatingThrows) {
   make_directory(zoneinfo);
   point_localtime_at("anything");
   make_link(icutz, "/var/db/old");
-  printed_by([] {
-    EXPECT_EQ(thrown_by([] { reset_to_system_partition(); }), EEXIST);
-  });
+  printed_before_throwing(EEXIST, reset_to_system_partition);
   EXPECT_EQ(link_at(icutz), "/var/db/old");
 }
 

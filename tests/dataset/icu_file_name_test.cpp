@@ -20,42 +20,17 @@ TEST(IcuFileName, CarriesDigitsAndOneFormatLetter) {
 }
 
 TEST(IcuFileName, OfANearMissCarriesNothing) {
-  for (const char* name : {"",
-                           "icutz",
-                           ".dat",
-                           "icutz.dat",
-                           "icutzl.dat",
-                           "icutz44.dat",
-                           "icutz44L.dat",
-                           "icutz44x.dat",
-                           "icutz44ll.dat",
-                           "icutz44lb.dat",
-                           "icutz4l4.dat",
-                           "icutz44l.dat.bak",
-                           "icutz44l.DAT",
-                           "icutz44ldat",
-                           "icutz44lxdat",
-                           "icutz44l.da",
-                           "icutz44l.datt",
-                           "xicutz44l.dat",
-                           "Icutz44l.dat",
-                           "ICUTZ44l.dat",
-                           "icut44l.dat",
-                           "icutz 44l.dat",
-                           "icutz-44l.dat",
-                           "icutz44l.dat ",
-                           "icutz44l.dat\n",
-                           "icudt44l.dat",
-                           "icutz44a.dat",
-                           "icutz44c.dat",
-                           "icutz44d.dat",
-                           "icutz44f.dat",
-                           "icutz44k.dat",
-                           "icutz44m.dat",
-                           "icutz/4l.dat",
-                           "icutz:4l.dat",
-                           "icutzat",
-                           "icutz4"})
+  for (const std::string schema :
+       {"", "l", "44", "44L", "44x", "44ll", "44lb", "4l4", " 44l", "-44l",
+        "44a", "44c", "44d", "44f", "44k", "44m", "/4l", ":4l"})
+    EXPECT_EQ(icu_schema_in("icutz" + schema + ".dat"), "") << schema;
+  for (const std::string start :
+       {"", "xicutz", "Icutz", "ICUTZ", "icut", "icudt"})
+    EXPECT_EQ(icu_schema_in(start + "44l.dat"), "") << start;
+  for (const std::string end : {"", "dat", "xdat", ".da", ".datt", ".DAT",
+                                ".dat.bak", ".dat ", ".dat\n"})
+    EXPECT_EQ(icu_schema_in("icutz44l" + end), "") << end;
+  for (const char* name : {"", "icutz", ".dat", "icutzat", "icutz4"})
     EXPECT_EQ(icu_schema_in(name), "") << name;
 }
 

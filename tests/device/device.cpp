@@ -47,14 +47,18 @@ std::string target_of(const std::string& path) {
   return target;
 }
 
+long nanoseconds(const timespec& time) {
+  return time.tv_sec * 1'000'000'000 + time.tv_nsec;
+}
+
 void look_below(const std::string& path, snapshot& seen) {
   struct stat status {};
   if (::lstat(path.c_str(), &status) != 0) return;
   std::string content;
   if (S_ISREG(status.st_mode)) content = bytes_of(path);
   if (S_ISLNK(status.st_mode)) content = target_of(path);
-  seen[path] = {status.st_mode, status.st_ino, status.st_mtim, status.st_ctim,
-                content};
+  seen[path] = {status.st_mode, status.st_ino, nanoseconds(status.st_mtim),
+                nanoseconds(status.st_ctim), content};
   if (!S_ISDIR(status.st_mode)) return;
   DIR* const directory = ::opendir(path.c_str());
   if (directory == nullptr) return;
@@ -120,12 +124,14 @@ std::string update(const std::string& version) {
 }
 
 void make_directory(const std::string& path, mode_t mode) {
+  if (!fs::is_directory(fs::symlink_status(path))) wipe(path);
   fs::create_directories(path);
   set_mode(path, mode);
 }
 
 void make_file(const std::string& path, const std::string& content,
                mode_t mode) {
+  if (!fs::is_regular_file(fs::symlink_status(path))) wipe(path);
   fs::create_directories(fs::path(path).parent_path());
   std::ofstream file(path, std::ios::binary);
   file << content;
@@ -135,18 +141,20 @@ void make_file(const std::string& path, const std::string& content,
 }
 
 void make_fifo(const std::string& path) {
+  wipe(path);
   fs::create_directories(fs::path(path).parent_path());
   must(::mkfifo(path.c_str(), 0644) == 0, "make the FIFO " + path);
   ::alarm(30);
 }
 
 void make_socket(const std::string& path) {
+  wipe(path);
   must(::mknod(path.c_str(), S_IFSOCK | 0644, 0) == 0,
        "make the socket " + path);
 }
 
 void make_link(const std::string& path, const std::string& target) {
-  ::unlink(path.c_str());
+  wipe(path);
   must(::symlink(target.c_str(), path.c_str()) == 0, "link " + path);
 }
 
@@ -222,6 +230,17 @@ void announce(const std::string& version) {
   make_link(tz_latest, update(version));
 }
 
+void install_and_announce(const std::string& version,
+                          const std::string& schema) {
+  install_update(version, schema);
+  announce(version);
+}
+
+void install_and_use(const std::string& version, const std::string& schema) {
+  install_update(version, schema);
+  point_links_at_update(version);
+}
+
 void point_links_at_update(const std::string& version) {
   point_zoneinfo_at(update(version) + "/zoneinfo");
   make_link(icutz, update(version) + "/icutz");
@@ -230,7 +249,7 @@ void point_links_at_update(const std::string& version) {
 
 void point_links_at_system() {
   point_zoneinfo_at(system_tree);
-  ::unlink(icutz.c_str());
+  wipe(icutz);
   point_localtime_at(default_localtime);
 }
 
@@ -242,21 +261,10 @@ void point_localtime_at(const std::string& target) {
   make_link(local_time, target);
 }
 
-bool operator==(const entry& left, const entry& right) {
-  const auto same_time = [](const timespec& a, const timespec& b) {
-    return a.tv_sec == b.tv_sec && a.tv_nsec == b.tv_nsec;
-  };
-  return left.mode == right.mode && left.inode == right.inode &&
-         same_time(left.modified, right.modified) &&
-         same_time(left.changed, right.changed) &&
-         left.content == right.content;
-}
-
 void PrintTo(const entry& shown, std::ostream* out) {
   *out << "inode " << shown.inode << ", mode " << std::oct << shown.mode
-       << std::dec << ", changed " << shown.changed.tv_sec << "."
-       << shown.changed.tv_nsec << ", \"" << shown.content.substr(0, 80)
-       << "\"";
+       << std::dec << ", changed " << shown.changed << ", \""
+       << shown.content.substr(0, 80) << "\"";
 }
 
 snapshot look_at(const std::vector<std::string>& paths) {
@@ -286,6 +294,22 @@ std::string link_at(const std::string& path) {
 
 std::string file_at(const std::string& path) {
   return describe(path, S_IFREG, [&] { return bytes_of(path); });
+}
+
+void expect_links_at_system() {
+  EXPECT_EQ(link_at(zoneinfo), "/usr/share/zoneinfo.default");
+  EXPECT_EQ(link_at(icutz), nothing);
+}
+
+void expect_links_at_update(const std::string& version) {
+  EXPECT_EQ(link_at(zoneinfo), "/var/db/timezone/tz/" + version + "/zoneinfo");
+  EXPECT_EQ(link_at(icutz), "/var/db/timezone/tz/" + version + "/icutz");
+}
+
+void expect_nothing_changed_by(const std::function<void()>& act) {
+  const snapshot before = look_at_everything();
+  act();
+  EXPECT_EQ(look_at_everything(), before);
 }
 
 std::vector<std::string> outcome::lines() const {
@@ -324,6 +348,25 @@ outcome run(const std::vector<std::string>& command,
           WIFSIGNALED(status) ? WTERMSIG(status) : 0, printed};
 }
 
+traced_outcome trace(const std::vector<std::string>& options,
+                     const std::vector<std::string>& command,
+                     const std::function<void()>& in_the_child) {
+  const std::string file = "/var/db/trace";
+  std::vector<std::string> words = {"/usr/bin/strace",
+                                    "-qq",
+                                    "-o",
+                                    file,
+                                    "-E",
+                                    "ASAN_OPTIONS=detect_leaks=0"};
+  words.insert(words.end(), options.begin(), options.end());
+  words.insert(words.end(), command.begin(), command.end());
+  const outcome ended = run(words, in_the_child);
+  EXPECT_EQ(ended.exit_status, 0);
+  const outcome traced{0, 0, file_at(file)};
+  wipe(file);
+  return {ended, traced.lines()};
+}
+
 outcome boot() {
   const std::vector<std::string> read_only = {downloads, tz_latest,
                                               "/usr/share"};
@@ -333,6 +376,16 @@ outcome boot() {
       << "a data set, the announcement or the system partition was changed";
   std::cout << result.log.substr(0, 10'000);
   return result;
+}
+
+void boot_prints(const lines_matcher& expected) {
+  const outcome booted = boot();
+  EXPECT_EQ(booted.exit_status, 0);
+  EXPECT_THAT(booted.lines(), expected);
+}
+
+void boot_changes_nothing_and_prints(const lines_matcher& expected) {
+  expect_nothing_changed_by([&] { boot_prints(expected); });
 }
 
 std::vector<std::string> printed_by(const std::function<void()>& act) {
@@ -357,6 +410,11 @@ std::vector<std::string> printed_by(const std::function<void()>& act) {
   return result.lines();
 }
 
+std::vector<std::string> printed_before_throwing(
+    int error, const std::function<void()>& act) {
+  return printed_by([&] { EXPECT_EQ(thrown_by(act), error); });
+}
+
 int thrown_by(const std::function<void()>& act) {
   try {
     act();
@@ -365,17 +423,6 @@ int thrown_by(const std::function<void()>& act) {
   }
   ADD_FAILURE() << "no int was thrown";
   return 0;
-}
-
-::testing::Matcher<std::string> failure(const std::string& text, int error) {
-  return ::testing::StrEq("marlin: " + text + ": " + std::strerror(error));
-}
-
-::testing::Matcher<std::string> warning(const std::string& text) {
-  return ::testing::ResultOf(
-      "the line up to its error text",
-      [](const std::string& line) { return line.substr(0, line.rfind(": ")); },
-      ::testing::StrEq("marlin: " + text));
 }
 
 std::string why_not_private() {
@@ -400,6 +447,12 @@ void DeviceTest::SetUp() {
   empty_directory("/var/db");
   empty_directory("/usr/share");
   make_directory(downloads);
+}
+
+void SoundDeviceTest::SetUp() {
+  DeviceTest::SetUp();
+  install_system("2023c", "44l");
+  point_links_at_system();
 }
 
 void DeviceTest::TearDown() {

@@ -12,8 +12,12 @@
 
 #include <functional>
 #include <map>
+#include <optional>
 #include <string>
+#include <type_traits>
 #include <vector>
+
+#include "tests/device/warnings.h"
 
 namespace device {
 
@@ -39,6 +43,8 @@ std::string update(const std::string& version);
 
 // --- Building a device -----------------------------------------------------
 
+// Each removes whatever else is there. A file that is made anew keeps its
+// inode, and a directory what is in it.
 void make_directory(const std::string& path, mode_t mode = 0755);
 void make_file(const std::string& path, const std::string& content = {},
                mode_t mode = 0644);
@@ -57,9 +63,12 @@ void install_system(const std::string& release, const std::string& format);
 void install_update(const std::string& version, const std::string& schema);
 // What an installer of updates does last.
 void announce(const std::string& version);
+void install_and_announce(const std::string& version,
+                          const std::string& schema);
 // Makes an update, or with no version the system partition, the active set.
 void point_links_at_update(const std::string& version);
 void point_links_at_system();
+void install_and_use(const std::string& version, const std::string& schema);
 void point_zoneinfo_at(const std::string& target);
 void point_localtime_at(const std::string& target);
 
@@ -82,11 +91,11 @@ class lease {
 struct entry {
   mode_t mode;
   ino_t inode;
-  timespec modified;
-  timespec changed;
+  long modified;  // in nanoseconds
+  long changed;
   std::string content;  // of a regular file, or the target of a link
+  bool operator==(const entry&) const = default;
 };
-bool operator==(const entry& left, const entry& right);
 void PrintTo(const entry& shown, std::ostream* out);
 
 using snapshot = std::map<std::string, entry>;
@@ -103,6 +112,12 @@ std::string link_at(const std::string& path);
 // The content of a regular file, or a description of what is there instead.
 std::string file_at(const std::string& path);
 inline const std::string nothing = "(nothing)";
+
+void expect_links_at_system();
+void expect_links_at_update(const std::string& version);
+
+// Expects that `act` changes nothing, down to inodes and times.
+void expect_nothing_changed_by(const std::function<void()>& act);
 
 // --- Booting ---------------------------------------------------------------
 
@@ -121,28 +136,49 @@ bool emulated();
 outcome run(const std::vector<std::string>& command,
             const std::function<void()>& in_the_child = {});
 
+// Runs a program under strace(1) with these options and expects that it exits
+// with status 0.
+struct traced_outcome : outcome {
+  std::vector<std::string> calls;  // the lines of the trace
+};
+traced_outcome trace(const std::vector<std::string>& options,
+                     const std::vector<std::string>& command = {MARLIN_PROGRAM},
+                     const std::function<void()>& in_the_child = {});
+
 // Boots: runs marlin and expects that no data set, no announcement and nothing
 // on the system partition was changed by it.
 outcome boot();
 
-// The lines that `act` prints to standard error in this process.
+using lines_matcher = ::testing::Matcher<std::vector<std::string>>;
+
+// Boots, and expects an exit with status 0 after these lines.
+void boot_prints(const lines_matcher& expected);
+// The same of a boot that changes nothing.
+void boot_changes_nothing_and_prints(const lines_matcher& expected);
+
+// --- Calling its functions in this process -----------------------------------
+
+// The lines that `act` prints to standard error.
 std::vector<std::string> printed_by(const std::function<void()>& act);
+
+// The same of an act that is expected to throw this int at its end.
+std::vector<std::string> printed_before_throwing(
+    int error, const std::function<void()>& act);
 
 // The int that `act` throws; fails the test when it throws none.
 int thrown_by(const std::function<void()>& act);
 
-// --- What is expected of warning lines --------------------------------------
-
-// A line after a call that failed: its error text counts.
-::testing::Matcher<std::string> failure(const std::string& text, int error);
-// A line whose error text is whatever an earlier call left.
-::testing::Matcher<std::string> warning(const std::string& text);
-
-template <typename... Lines>
-auto lines(Lines... expected) {
-  return ::testing::ElementsAre(expected...);
+// The result of `act`, which is expected to print nothing.
+template <typename Act>
+std::invoke_result_t<Act> quietly(const Act& act) {
+  if constexpr (std::is_void_v<std::invoke_result_t<Act>>) {
+    EXPECT_THAT(printed_by(act), no_lines());
+  } else {
+    std::optional<std::invoke_result_t<Act>> result;
+    EXPECT_THAT(printed_by([&] { result = act(); }), no_lines());
+    return *result;
+  }
 }
-inline auto no_lines() { return ::testing::IsEmpty(); }
 
 // Every test that touches the device derives from this. Refuses to touch
 // anything outside of a private device; starts from an empty one that has only
@@ -151,6 +187,12 @@ class DeviceTest : public ::testing::Test {
  protected:
   void SetUp() override;
   void TearDown() override;
+};
+
+// With a sound device: system 2023c with ICU schema 44l, never updated.
+class SoundDeviceTest : public DeviceTest {
+ protected:
+  void SetUp() override;
 };
 
 // Why this process may not touch "/var/db" and "/usr/share"; empty if it may.

@@ -5,30 +5,19 @@ using namespace device;
 
 namespace {
 
-class DataProtection : public DeviceTest {
+class DataProtection : public SoundDeviceTest {
  protected:
-  void SetUp() override {
-    DeviceTest::SetUp();
-    install_system("2023c", "44l");
-    point_links_at_system();
-  }
-
   // The first calls of a boot, as the build for a platform with
   // data-protection classes makes them. Descriptors are numbered the same way
   // in every run. What the shell redirects stays so for the program.
   static std::vector<std::string> first_calls(
       std::size_t count, const std::string& redirections = "",
       const std::string& program = MARLIN_WITH_CLASSES) {
-    const std::string trace = "/var/db/trace";
-    const outcome booted =
-        run({"/usr/bin/strace", "-qq", "-o", trace, "-e",
-             "trace=open,openat,fcntl,fcntl64,close,access,faccessat", "-E",
-             "ASAN_OPTIONS=detect_leaks=0", "/bin/sh", "-c",
-             "exec " + program + " " + redirections});
-    EXPECT_EQ(booted.exit_status, 0);
+    const auto booted =
+        trace({"-e", "trace=open,openat,fcntl,fcntl64,close,access,faccessat"},
+              {"/bin/sh", "-c", "exec " + program + " " + redirections});
     EXPECT_EQ(booted.log, "");
-    std::vector<std::string> calls = outcome{0, 0, file_at(trace)}.lines();
-    wipe(trace);
+    std::vector<std::string> calls = booted.calls;
     while (!calls.empty() &&
            calls.front().find("/var/db/timezone/") == std::string::npos)
       calls.erase(calls.begin());
@@ -42,45 +31,48 @@ using ::testing::ElementsAre;
 using ::testing::HasSubstr;
 using ::testing::StartsWith;
 
+// The result is a descriptor, or "-1" and the name of an error.
+auto opens(const std::string& directory, const std::string& result) {
+  return HasSubstr('"' + directory + "\", O_RDONLY|O_CLOEXEC) = " + result);
+}
+auto asks_for_class_d(const std::string& descriptor) {
+  return AllOf(StartsWith("fcntl(" + descriptor + ", 0x40"),
+               HasSubstr(", 0x4)"));
+}
+auto closes(const std::string& descriptor) {
+  return StartsWith("close(" + descriptor + ")");
+}
+const std::string first = "/var/db/timezone/";
+const std::string second = "/var/db/timezone/tz/";
+const auto looks_at_the_legacy_link = HasSubstr("\"/var/db/icutz\"");
+
 TEST_F(DataProtection, AsksForClassDOnBothDirectoriesBeforeAllElse) {
   if (emulated()) GTEST_SKIP() << "strace would show the emulator's calls";
-  EXPECT_THAT(
-      first_calls(7),
-      ElementsAre(
-          HasSubstr("\"/var/db/timezone/\", O_RDONLY|O_CLOEXEC) = 3"),
-          AllOf(StartsWith("fcntl(3, 0x40"), HasSubstr(", 0x4)")),
-          StartsWith("close(3)"),
-          HasSubstr("\"/var/db/timezone/tz/\", O_RDONLY|O_CLOEXEC) = 3"),
-          AllOf(StartsWith("fcntl(3, 0x40"), HasSubstr(", 0x4)")),
-          StartsWith("close(3)"), HasSubstr("\"/var/db/icutz\"")));
+  EXPECT_THAT(first_calls(7),
+              ElementsAre(opens(first, "3"), asks_for_class_d("3"), closes("3"),
+                          opens(second, "3"), asks_for_class_d("3"),
+                          closes("3"), looks_at_the_legacy_link));
 }
 
 TEST_F(DataProtection, AsksForClassDOnADirectoryThatIsNamed) {
   if (emulated()) GTEST_SKIP() << "strace would show the emulator's calls";
   EXPECT_THAT(
       first_calls(3, downloads, CLASS_D),
-      ElementsAre(HasSubstr("\"" + downloads + "\", O_RDONLY|O_CLOEXEC) = 3"),
-                  AllOf(StartsWith("fcntl(3, 0x40"), HasSubstr(", 0x4)")),
-                  StartsWith("close(3)")));
+      ElementsAre(opens(downloads, "3"), asks_for_class_d("3"), closes("3")));
 }
 
 TEST_F(DataProtection, TakesDescriptorZeroForADescriptor) {
   if (emulated()) GTEST_SKIP() << "strace would show the emulator's calls";
   EXPECT_THAT(
       first_calls(3, "<&-"),
-      ElementsAre(HasSubstr("\"/var/db/timezone/\", O_RDONLY|O_CLOEXEC) = 0"),
-                  StartsWith("fcntl(0, 0x40"), StartsWith("close(0)")));
+      ElementsAre(opens(first, "0"), asks_for_class_d("0"), closes("0")));
 }
 
 TEST_F(DataProtection, IsQuietlyLeftOutForADirectoryThatCannotBeOpened) {
   if (emulated()) GTEST_SKIP() << "strace would show the emulator's calls";
   const auto second_fails = [](const std::string& error) {
-    return ElementsAre(
-        HasSubstr("\"/var/db/timezone/\", O_RDONLY|O_CLOEXEC) = 3"),
-        StartsWith("fcntl(3, 0x40"), StartsWith("close(3)"),
-        HasSubstr("\"/var/db/timezone/tz/\", O_RDONLY|O_CLOEXEC) = -1 " +
-                  error),
-        HasSubstr("\"/var/db/icutz\""));
+    return ElementsAre(opens(first, "3"), asks_for_class_d("3"), closes("3"),
+                       opens(second, "-1 " + error), looks_at_the_legacy_link);
   };
   wipe(downloads);
   EXPECT_THAT(first_calls(5), second_fails("ENOENT"));
@@ -88,16 +80,12 @@ TEST_F(DataProtection, IsQuietlyLeftOutForADirectoryThatCannotBeOpened) {
   make_file(downloads);
   EXPECT_THAT(first_calls(5), second_fails("ENOTDIR"));
 
-  wipe(downloads);
   make_directory(downloads);
   set_mode(timezone_root, 0311);
-  EXPECT_THAT(
-      first_calls(5),
-      ElementsAre(
-          HasSubstr("\"/var/db/timezone/\", O_RDONLY|O_CLOEXEC) = -1 EACCES"),
-          HasSubstr("\"/var/db/timezone/tz/\", O_RDONLY|O_CLOEXEC) = 3"),
-          StartsWith("fcntl(3, 0x40"), StartsWith("close(3)"),
-          HasSubstr("\"/var/db/icutz\"")));
+  EXPECT_THAT(first_calls(5),
+              ElementsAre(opens(first, "-1 EACCES"), opens(second, "3"),
+                          asks_for_class_d("3"), closes("3"),
+                          looks_at_the_legacy_link));
 }
 
 TEST_F(DataProtection, CreatesNoDirectoryAndReportsNone) {

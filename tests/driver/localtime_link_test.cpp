@@ -9,9 +9,6 @@ using namespace device;
 
 namespace {
 
-const std::string resetting =
-    "localtime link invalid; resetting to America/Los_Angeles";
-
 class LocaltimeLinkRepair : public DeviceTest {
  protected:
   void SetUp() override {
@@ -28,19 +25,26 @@ class LocaltimeLinkRepair : public DeviceTest {
   static void leaves_alone(const std::string& target) {
     point_localtime_at(target);
     const auto before = look_at_everything();
-    EXPECT_THAT(printed_by(repair_localtime_link), no_lines());
+    quietly(repair_localtime_link);
     EXPECT_EQ(look_at_everything(), before);
   }
   static void corrects(const std::string& target, const std::string& to) {
     point_localtime_at(target);
     EXPECT_THAT(printed_by(repair_after_an_old_error),
-                lines(failure("Correcting localtime link to " + to, EXDEV)));
+                lines(correcting_localtime(to, EXDEV)));
     EXPECT_EQ(link_at(local_time), to);
+  }
+  static void corrects_and_then_resets(const std::string& target,
+                                       const std::string& to) {
+    point_localtime_at(target);
+    EXPECT_THAT(printed_by(repair_after_an_old_error),
+                lines(correcting_localtime(to, EXDEV), resetting_localtime()));
+    EXPECT_EQ(link_at(local_time), default_localtime);
   }
   static void resets(const std::string& target) {
     point_localtime_at(target);
     EXPECT_THAT(printed_by(repair_after_an_old_error),
-                lines(failure(resetting, EXDEV)));
+                lines(resetting_localtime(EXDEV)));
     EXPECT_EQ(link_at(local_time), default_localtime);
   }
 };
@@ -76,40 +80,24 @@ TEST_F(LocaltimeLinkRepair, LooksForTheCorrectedZoneInTheActiveDataSet) {
 }
 
 TEST_F(LocaltimeLinkRepair, AnnouncesACorrectionThatThenFails) {
-  point_localtime_at("/usr/share/zoneinfo/Mars/Base");
-  EXPECT_THAT(printed_by(repair_after_an_old_error),
-              lines(failure("Correcting localtime link to "
-                            "/var/db/timezone/zoneinfo/Mars/Base",
-                            EXDEV),
-                    failure(resetting, ENOENT)));
-  EXPECT_EQ(link_at(local_time), default_localtime);
+  corrects_and_then_resets("/usr/share/zoneinfo/Mars/Base",
+                           "/var/db/timezone/zoneinfo/Mars/Base");
 }
 
 TEST_F(LocaltimeLinkRepair, CorrectsThePrefixWithoutASeparatorAndThenResets) {
-  point_localtime_at("/usr/share/zoneinfo.default/Europe/Paris");
-  EXPECT_THAT(printed_by(repair_after_an_old_error),
-              lines(failure("Correcting localtime link to "
-                            "/var/db/timezone/zoneinfo.default/Europe/Paris",
-                            EXDEV),
-                    failure(resetting, ENOENT)));
-  EXPECT_EQ(link_at(local_time), default_localtime);
+  corrects_and_then_resets("/usr/share/zoneinfo.default/Europe/Paris",
+                           "/var/db/timezone/zoneinfo.default/Europe/Paris");
 }
 
 TEST_F(LocaltimeLinkRepair, ResetsWhenTheZoneinfoLinkDoesNotWork) {
   point_zoneinfo_at("/var/db/gone");
-  point_localtime_at("/usr/share/zoneinfo/Europe/Paris");
-  EXPECT_THAT(printed_by(repair_after_an_old_error),
-              lines(failure("Correcting localtime link to "
-                            "/var/db/timezone/zoneinfo/Europe/Paris",
-                            EXDEV),
-                    failure(resetting, ENOENT)));
-  EXPECT_EQ(link_at(local_time), default_localtime);
-  EXPECT_THAT(printed_by(repair_localtime_link), no_lines());
+  corrects_and_then_resets("/usr/share/zoneinfo/Europe/Paris",
+                           "/var/db/timezone/zoneinfo/Europe/Paris");
+  quietly(repair_localtime_link);
 }
 
 TEST_F(LocaltimeLinkRepair, ResetsAMissingLink) {
-  EXPECT_THAT(printed_by(repair_localtime_link),
-              lines(failure(resetting, ENOENT)));
+  EXPECT_THAT(printed_by(repair_localtime_link), lines(resetting_localtime()));
   EXPECT_EQ(link_at(local_time), default_localtime);
 }
 
@@ -136,41 +124,32 @@ TEST_F(LocaltimeLinkRepair, ResetsToTheDefaultZoneWhetherOrNotItExists) {
   resets("/elsewhere");
 }
 
-TEST_F(LocaltimeLinkRepair, ReplacesAFile) {
+TEST_F(LocaltimeLinkRepair, ReplacesAFileOrAnEmptyDirectory) {
+  const auto replaces_it = [] {
+    EXPECT_THAT(
+        printed_by(repair_localtime_link),
+        lines(cannot_read(local_time, EINVAL), resetting_localtime(EINVAL)));
+    EXPECT_EQ(link_at(local_time), default_localtime);
+  };
   make_file(local_time, "TZif");
-  EXPECT_THAT(printed_by(repair_localtime_link),
-              lines(failure("read_symlink: /var/db/timezone/localtime", EINVAL),
-                    failure(resetting, EINVAL)));
-  EXPECT_EQ(link_at(local_time), default_localtime);
-}
-
-TEST_F(LocaltimeLinkRepair, ReplacesAnEmptyDirectory) {
+  replaces_it();
   make_directory(local_time);
-  EXPECT_THAT(printed_by(repair_localtime_link),
-              lines(failure("read_symlink: /var/db/timezone/localtime", EINVAL),
-                    failure(resetting, EINVAL)));
-  EXPECT_EQ(link_at(local_time), default_localtime);
+  replaces_it();
 }
 
 TEST_F(LocaltimeLinkRepair, ThrowsWhenADirectoryStandsInTheWay) {
   make_file(local_time + "/file");
   EXPECT_THAT(
-      printed_by([] { EXPECT_EQ(thrown_by(repair_localtime_link), EEXIST); }),
-      lines(failure("read_symlink: /var/db/timezone/localtime", EINVAL),
-            failure(resetting, EINVAL),
-            failure("create_symlink: from /var/db/timezone/localtime to "
-                    "/var/db/timezone/zoneinfo/America/Los_Angeles",
-                    EEXIST)));
+      printed_before_throwing(EEXIST, repair_localtime_link),
+      lines(cannot_read(local_time, EINVAL), resetting_localtime(EINVAL),
+            cannot_link(local_time, default_localtime, EEXIST)));
 }
 
 TEST_F(LocaltimeLinkRepair, ThrowsWithoutATimezoneDirectory) {
   wipe(timezone_root);
-  EXPECT_THAT(
-      printed_by([] { EXPECT_EQ(thrown_by(repair_localtime_link), ENOENT); }),
-      lines(failure(resetting, ENOENT),
-            failure("create_symlink: from /var/db/timezone/localtime to "
-                    "/var/db/timezone/zoneinfo/America/Los_Angeles",
-                    ENOENT)));
+  EXPECT_THAT(printed_before_throwing(ENOENT, repair_localtime_link),
+              lines(resetting_localtime(),
+                    cannot_link(local_time, default_localtime, ENOENT)));
 }
 
 TEST_F(LocaltimeLinkRepair, FallsBackWhenTheCorrectedLinkCannotBeCreated) {
@@ -178,19 +157,11 @@ TEST_F(LocaltimeLinkRepair, FallsBackWhenTheCorrectedLinkCannotBeCreated) {
   // corrected one fails, and so does the default one.
   point_localtime_at("/usr/share/zoneinfo/Europe/Paris");
   set_mode(timezone_root, 0555);
-  EXPECT_THAT(
-      printed_by(
-          [] { EXPECT_EQ(thrown_by(repair_after_an_old_error), EEXIST); }),
-      lines(failure("Correcting localtime link to "
-                    "/var/db/timezone/zoneinfo/Europe/Paris",
-                    EXDEV),
-            failure("create_symlink: from /var/db/timezone/localtime to "
-                    "/var/db/timezone/zoneinfo/Europe/Paris",
-                    EEXIST),
-            failure(resetting, EEXIST),
-            failure("create_symlink: from /var/db/timezone/localtime to "
-                    "/var/db/timezone/zoneinfo/America/Los_Angeles",
-                    EEXIST)));
+  EXPECT_THAT(printed_before_throwing(EEXIST, repair_after_an_old_error),
+              lines(correcting_localtime(zoneinfo + "/Europe/Paris", EXDEV),
+                    cannot_link(local_time, zoneinfo + "/Europe/Paris", EEXIST),
+                    resetting_localtime(EEXIST),
+                    cannot_link(local_time, default_localtime, EEXIST)));
   EXPECT_EQ(link_at(local_time), "/usr/share/zoneinfo/Europe/Paris");
 }
 

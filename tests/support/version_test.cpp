@@ -1,11 +1,7 @@
 // SPDX-License-Identifier: BSD-2-Clause
 #include "support/version.h"
 
-#include <algorithm>
-#include <array>
 #include <cerrno>
-#include <functional>
-#include <random>
 #include <stdexcept>
 
 #include "tests/device/device.h"
@@ -20,13 +16,6 @@ std::string shown(const mln_version& version) {
 }
 
 const std::string unset = "-1||-1|-1";
-
-TEST(VersionFields, StandInTheirOrder) {
-  const mln_version version;
-  const std::array<const void*, 4> fields = {&version.year, &version.letters,
-                                             &version.major, &version.minor};
-  EXPECT_TRUE(std::is_sorted(fields.begin(), fields.end(), std::less<>()));
-}
 
 TEST(VersionParse, FillsFourFields) {
   EXPECT_THAT(printed_by([] {
@@ -47,20 +36,15 @@ TEST(VersionParse, PrintsTwoLinesForAMalformedText) {
                   errno = EIO;
                   version = mln_version(text);
                 }),
-                lines(failure("Cannot parse version string " + text +
-                                  ", results.size() = 0",
-                              EIO),
-                      failure("Cannot parse version string " + text, EIO)));
+                lines(unparsed(text, EIO)));
     EXPECT_EQ(shown(version), unset) << text;
   }
 }
 
 TEST(VersionParse, PrintsATextUpToItsFirstNul) {
   const std::string text("2016a\0b", 7);
-  EXPECT_THAT(
-      printed_by([&] { EXPECT_EQ(shown(mln_version(text)), unset); }),
-      lines(warning("Cannot parse version string 2016a, results.size() = 0"),
-            warning("Cannot parse version string 2016a")));
+  EXPECT_THAT(printed_by([&] { EXPECT_EQ(shown(mln_version(text)), unset); }),
+              lines(unparsed("2016a", any_error)));
 }
 
 TEST(VersionParse, OfAMalformedTextUnsetsAnEarlierValue) {
@@ -121,37 +105,20 @@ void expect_newer(const std::string& newer, const std::string& older) {
 }
 
 TEST(VersionOrder, GoesByYearThenLettersThenMajorThenMinor) {
-  expect_newer("2017a", "2016z.1.9");
-  expect_newer("10000a", "2016z");
-  expect_newer("2016b.0.0", "2016a.9.9");
-  expect_newer("2016a.2.0", "2016a.1.9");
-  expect_newer("2016a.1.1", "2016a.1.0");
-}
-
-TEST(VersionOrder, ComparesNumbersAndNotTexts) {
-  expect_newer("2016a.10", "2016a.9");
-  expect_newer("2016a.1.10", "2016a.1.9");
-  EXPECT_TRUE(mln_version("2016a.01") == mln_version("2016a.1"));
-}
-
-TEST(VersionOrder, TakesAMissingNumberForOlderThanAnyOther) {
-  expect_newer("2016a.0.0", "2016a.0");
-  expect_newer("2016a.0", "2016a");
-  expect_newer("2016a.1.0", "2016a.1");
-  expect_newer("2016a.1", "2016a");
-}
-
-TEST(VersionOrder, ComparesLettersAsTexts) {
-  expect_newer("2016za", "2016z");
-  expect_newer("2016b", "2016az");
-}
-
-TEST(VersionOrder, ComparesLettersOfAnyLengthByTheFirstByteThatDiffers) {
   const std::string many(1500, 'm');
-  expect_newer("2016" + many + "b", "2016" + many + "a");
-  expect_newer("2016" + many + "a", "2016" + many);
-  expect_newer("2016z", "2016" + many);
-  expect_newer("2016" + many + "b.1", "2016" + many + "az.9");
+  const std::vector<std::string> ascending = {
+      // A missing number is older than any other.
+      "0a", "2016a", "2016a.0", "2016a.0.0", "2016a.1", "2016a.1.0",
+      "2016a.1.1",
+      // Numbers are not compared as texts.
+      "2016a.1.9", "2016a.1.10", "2016a.2.0", "2016a.9.9", "2016a.10",
+      // Letters are, by the first byte that differs.
+      "2016az.99", "2016b", "2016b.0.0", "2016" + many, "2016" + many + "a",
+      "2016" + many + "az.9", "2016" + many + "b", "2016" + many + "b.1",
+      "2016z", "2016z.1.9", "2016za", "2017a", "10000a"};
+  for (auto newer = ascending.begin(); newer != ascending.end(); ++newer)
+    for (auto older = ascending.begin(); older != newer; ++older)
+      expect_newer(*newer, *older);
 }
 
 TEST(VersionOrder, ComparesLettersByUnsignedBytes) {
@@ -178,24 +145,10 @@ TEST(VersionOrder, HasAllUnparseableTextsEqual) {
   });
 }
 
-TEST(VersionOrder, SortsEveryListTheSameWay) {
-  const std::vector<std::string> sorted = {
-      "0a",       "2016a",     "2016a.0", "2016a.0.0", "2016a.1", "2016a.1.0",
-      "2016a.10", "2016az.99", "2016b",   "2016z",     "2016za",  "2017a"};
-  std::mt19937 random(1);
-  for (int i = 0; i < 100; ++i) {
-    auto texts = sorted;
-    std::shuffle(texts.begin(), texts.end(), random);
-    std::sort(texts.begin(), texts.end(), [](const auto& a, const auto& b) {
-      return mln_version(b) > mln_version(a);
-    });
-    EXPECT_EQ(texts, sorted);
-  }
-}
-
 TEST(VersionEquality, AsksForAllFourFields) {
   const mln_version version("2016a.1.2");
   EXPECT_TRUE(version == mln_version("2016a.1.2"));
+  EXPECT_TRUE(version == mln_version("2016a.01.002"));
   for (const char* other :
        {"2017a.1.2", "2016b.1.2", "2016a.2.2", "2016a.1.3", "2016a.1"})
     EXPECT_FALSE(version == mln_version(other)) << other;

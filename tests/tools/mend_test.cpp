@@ -14,21 +14,21 @@ class Mend : public DeviceTest {
     install_update("2024a.1.0", "44l");
   }
 
-  static void expect_left_alone() {
-    const snapshot before = look_at_everything();
+  static void expect_end(int status, const std::string& log) {
     const outcome mended = run({MARLIN_MEND});
-    EXPECT_EQ(mended.exit_status, 0);
-    EXPECT_EQ(mended.log, "");
-    EXPECT_EQ(look_at_everything(), before);
+    EXPECT_EQ(mended.exit_status, status);
+    EXPECT_EQ(mended.log, log);
+  }
+
+  static void expect_left_alone() {
+    expect_nothing_changed_by([] { expect_end(0, ""); });
   }
 
   static void expect_mended() {
     snapshot before = look_at_everything();
-    const outcome mended = run({MARLIN_MEND});
-    EXPECT_EQ(mended.exit_status, 0);
-    EXPECT_EQ(mended.log,
-              "marlin-mend: /var/db/timezone/zoneinfo did not fit "
-              "/var/db/timezone/icutz; marlin makes both anew\n");
+    expect_end(0,
+               "marlin-mend: /var/db/timezone/zoneinfo did not fit "
+               "/var/db/timezone/icutz; marlin makes both anew\n");
     before.erase(zoneinfo);
     snapshot after = look_at_everything();
     before.erase(timezone_root);
@@ -55,22 +55,17 @@ TEST_F(Mend, LeavesToMarlinWhatItResetsAnyway) {
   expect_left_alone();
   make_link(icutz, update("2024a.1.0") + "/icutz");
   expect_left_alone();
-  for (const char* target : {"/elsewhere", "/usr/share/zoneinfo.default/", "",
+  for (const char* target : {"/elsewhere", "/usr/share/zoneinfo.default/",
                              "/var/db/timezone/tz", "tz/2024a.1.0/zoneinfo"}) {
-    if (*target == '\0') {
-      wipe(zoneinfo);
-      make_directory(zoneinfo);
-    } else {
-      wipe(zoneinfo);
-      point_zoneinfo_at(target);
-    }
+    point_zoneinfo_at(target);
     expect_left_alone();
   }
+  make_directory(zoneinfo);
+  expect_left_alone();
 }
 
 TEST_F(Mend, LeavesADirectoryInPlaceOfTheIcuLinkAlone) {
   point_links_at_update("2024a.1.0");
-  wipe(icutz);
   make_directory(icutz);
   expect_left_alone();
   point_links_at_system();
@@ -87,8 +82,7 @@ TEST_F(Mend, MendsAnActivationThatWasCutShort) {
     announce("2024a.1.0");
     expect_mended();
     EXPECT_EQ(boot().exit_status, 0);
-    EXPECT_EQ(link_at(zoneinfo), update("2024a.1.0") + "/zoneinfo");
-    EXPECT_EQ(link_at(icutz), update("2024a.1.0") + "/icutz");
+    expect_links_at_update("2024a.1.0");
     EXPECT_EQ(file_at(record), "2023c.1.0_2024a.1.0");
     expect_left_alone();
   }
@@ -99,8 +93,7 @@ TEST_F(Mend, MendsAResetThatWasCutShort) {
   make_link(icutz, update("2024a.1.0") + "/icutz");
   expect_mended();
   EXPECT_EQ(boot().exit_status, 0);
-  EXPECT_EQ(link_at(zoneinfo), system_tree);
-  EXPECT_EQ(link_at(icutz), nothing);
+  expect_links_at_system();
   expect_left_alone();
 }
 
@@ -130,10 +123,8 @@ TEST_F(Mend, TellsThatItCannotRemoveTheLink) {
   point_links_at_system();
   make_link(icutz, update("2024a.1.0") + "/icutz");
   set_mode(timezone_root, 0555);
-  const outcome failed = run({MARLIN_MEND});
-  EXPECT_EQ(failed.exit_status, 1);
-  EXPECT_EQ(
-      failed.log,
+  expect_end(
+      1,
       "marlin-mend: cannot remove /var/db/timezone/zoneinfo, which does not "
       "fit /var/db/timezone/icutz: Permission denied\n");
   set_mode(timezone_root, 0755);

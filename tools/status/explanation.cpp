@@ -73,8 +73,7 @@ constexpr row table[] = {
      "zoneinfo names no data set: a reset to the system partition"},
     {"current", "reset", "changed_by_the_boot", wrong,
      "zoneinfo is reached through a link that the boot has just changed: a "
-     "reset "
-     "to the system partition"},
+     "reset to the system partition"},
     {"current", "reset", "not_a_link", wrong,
      "zoneinfo is not a link: a reset to the system partition"},
     {"current", "reset", "unreadable", wrong,
@@ -88,8 +87,7 @@ constexpr row table[] = {
      "it is %1, older than the system's %2: a reset to the system partition"},
     {"usable", "reset", "changed_by_the_boot", wrong,
      "its data is reached through a link that the boot has just changed: a "
-     "reset "
-     "to the system partition"},
+     "reset to the system partition"},
     {"usable", "reset", "no_version", wrong,
      "its name %1 is no version: a reset to the system partition"},
 
@@ -149,6 +147,30 @@ constexpr row table[] = {
     {"localtime", "failed", "not_made", wrong,
      "the default link cannot be made: %e"},
 };
+
+constexpr bool is_once_in_the_table(const row& one) {
+  return std::count_if(
+             std::begin(table), std::end(table), [&](const row& other) {
+               return other.name == one.name && other.does == one.does &&
+                      other.reason == one.reason;
+             }) == 1;
+}
+static_assert(std::all_of(std::begin(table), std::end(table),
+                          is_once_in_the_table));
+
+// Why a link is reset; `of_its_target`, if it is one that can be read.
+std::string_view flaw_of(const entry& here, std::string_view of_its_target) {
+  switch (here.what) {
+    case entry::kind::none:
+      return "no_link";
+    case entry::kind::link:
+      return of_its_target;
+    case entry::kind::unknown:
+      return "unreadable";
+    default:
+      return "not_a_link";
+  }
+}
 
 std::string schema_of(const dataset_facts& set) {
   return set.schema.empty() ? "no ICU schema" : "ICU schema " + set.schema;
@@ -312,18 +334,10 @@ class account {
       const std::string& path = device_.links.current_path.value();
       return add("current", "read", path.empty() ? "system" : "update", path);
     }
-    switch (device_.links.zoneinfo.what) {
-      case entry::kind::none:
-        return add("current", "reset", "no_link");
-      case entry::kind::link:
-        return add(
-            "current", "reset",
-            device_.links.current_path ? "changed_by_the_boot" : "bad_target");
-      case entry::kind::unknown:
-        return add("current", "reset", "unreadable");
-      default:
-        return add("current", "reset", "not_a_link");
-    }
+    add("current", "reset",
+        flaw_of(device_.links.zoneinfo, device_.links.current_path
+                                            ? "changed_by_the_boot"
+                                            : "bad_target"));
   }
 
   // The data set that the rest of the boot compares with.
@@ -407,16 +421,7 @@ class account {
     if (follows(lines::localtime_invalid, lines::create_failed))
       return add(name, "reset", "not_replaced");
     if (has(lines::correcting)) return add(name, "reset", "zone_unreachable");
-    switch (device_.links.localtime.what) {
-      case entry::kind::none:
-        return add(name, "reset", "no_link");
-      case entry::kind::link:
-        return add(name, "reset", "elsewhere");
-      case entry::kind::unknown:
-        return add(name, "reset", "unreadable");
-      default:
-        return add(name, "reset", "not_a_link");
-    }
+    add(name, "reset", flaw_of(device_.links.localtime, "elsewhere"));
   }
 
   // What no later boot mends either.
@@ -447,12 +452,4 @@ class account {
 explanation explain(const device_facts& device, const rehearsal& boot,
                     const link_facts& after) {
   return account(device, boot, after).told();
-}
-
-std::vector<std::string> all_reasons() {
-  std::vector<std::string> all;
-  for (const auto& known : table)
-    all.push_back(std::string(known.name) + ' ' + std::string(known.does) +
-                  ' ' + std::string(known.reason));
-  return all;
 }

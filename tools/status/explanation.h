@@ -33,6 +33,3 @@ struct explanation {
 // std::bad_alloc only, and std::logic_error if a boot did what is in no table.
 explanation explain(const device_facts& device, const rehearsal& boot,
                     const link_facts& after);
-
-// All steps, doings and reasons that explain() knows, as "STEP DOES REASON".
-std::vector<std::string> all_reasons();

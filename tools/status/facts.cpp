@@ -9,6 +9,7 @@
 #include <algorithm>
 #include <cerrno>
 #include <cstring>
+#include <functional>
 #include <memory>
 #include <new>
 #include <stdexcept>
@@ -190,10 +191,8 @@ void note_unreadable(dataset_facts& facts) {
       schemas.push_back(schema);
   }
   facts.has_several_schemas =
-      !schemas.empty() && !std::all_of(schemas.begin(), schemas.end(),
-                                       [&](const std::string& schema) {
-                                         return schema == schemas.front();
-                                       });
+      std::adjacent_find(schemas.begin(), schemas.end(),
+                         std::not_equal_to<>()) != schemas.end();
 }
 
 // Building it tells; what is kept afterwards is short.

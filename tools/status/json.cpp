@@ -1,4 +1,5 @@
 // SPDX-License-Identifier: BSD-2-Clause
+#include <array>
 #include <cstring>
 #include <nlohmann/json.hpp>
 
@@ -32,20 +33,10 @@ json list_of(const std::vector<std::string>& texts) {
   return list;
 }
 
-const char* name_of(dataset_facts::state ends) {
-  switch (ends) {
-    case dataset_facts::state::built:
-      return "readable";
-    case dataset_facts::state::bad_path:
-      return "elsewhere";
-    case dataset_facts::state::number_too_large:
-      return "number_too_large";
-    case dataset_facts::state::walk_failed:
-      return "walk_failed";
-    case dataset_facts::state::no_memory:
-      break;
-  }
-  return "no_memory";
+std::string name_of(dataset_facts::state ends) {
+  static constexpr std::array names = {
+      "readable", "elsewhere", "number_too_large", "walk_failed", "no_memory"};
+  return names.at(static_cast<std::size_t>(ends));
 }
 
 json object_of(const dataset_facts& set) {
@@ -61,13 +52,17 @@ json object_of(const dataset_facts& set) {
   return object;
 }
 
+json object_or_null(const std::optional<dataset_facts>& set) {
+  return set ? object_of(*set) : json();
+}
+
 json object_of(const link_facts& links) {
   json record = object_of(links.record);
   if (links.record.what == entry::kind::file)
     record["text"] =
         links.record.error == 0 ? json(escaped(links.record.text)) : json();
   return {{"in_use", data_in_use(links)},
-          {"pair", name_of(links.pair)},
+          {"pair", words_for(links.pair).name},
           {"zoneinfo", object_of(links.zoneinfo)},
           {"icutz", object_of(links.icutz)},
           {"localtime", object_of(links.localtime)},
@@ -96,10 +91,8 @@ std::string in_json(const report& told) {
   object["reasons"] = told.why.reasons;
   object["now"] = object_of(told.device.links);
   object["system"] = object_of(told.device.system);
-  object["current"] =
-      told.device.current ? object_of(*told.device.current) : json();
-  object["announced"] =
-      told.device.update ? object_of(*told.device.update) : json();
+  object["current"] = object_or_null(told.device.current);
+  object["announced"] = object_or_null(told.device.update);
   json downloads = json::array();
   for (const auto& found : told.device.downloads)
     downloads.push_back(

@@ -26,20 +26,19 @@ constexpr unsigned longest_wait =
     30;  // seconds, for storage that never answers
 
 constexpr char help[] =
-    "usage: marlin-status [--root DIR] [--json | --check]\n"
-    "\n"
-    "Tells which time-zone data a device uses, and what its next boot will "
-    "do.\n"
-    "Nothing is changed: the boot is run in a throw-away layer over the "
-    "device.\n"
-    "\n"
-    "  --root DIR   the device unpacked or mounted in DIR, not this system\n"
-    "  --json       one JSON object\n"
-    "  --check      only the reasons for a status of 1 or 2\n"
-    "  --version    the version of this program\n"
-    "\n"
-    "Exit status: 0 sound, 1 the next boot changes something on purpose,\n"
-    "2 something is wrong, 64 bad use, 77 it cannot be told here.\n";
+    R"(usage: marlin-status [--root DIR] [--json | --check]
+
+Tells which time-zone data a device uses, and what its next boot will do.
+Nothing is changed: the boot is run in a throw-away layer over the device.
+
+  --root DIR   the device unpacked or mounted in DIR, not this system
+  --json       one JSON object
+  --check      only the reasons for a status of 1 or 2
+  --version    the version of this program
+
+Exit status: 0 sound, 1 the next boot changes something on purpose,
+2 something is wrong, 64 bad use, 77 it cannot be told here.
+)";
 
 enum class form { rows, json, reasons };
 

@@ -11,24 +11,25 @@ namespace {
 constexpr std::size_t label_width = 12;
 constexpr std::size_t most_downloads = 20;
 
+std::string error_text(int error) {
+  return "(" + std::string(std::strerror(error)) + ")";
+}
+
 std::string plain(const entry& here) {
   switch (here.what) {
     case entry::kind::link:
       return "-> " + escaped(here.text);
     case entry::kind::unknown:
-      return std::string("(").append(std::strerror(here.error)).append(")");
+      return error_text(here.error);
     case entry::kind::none:
       return "none";
-    case entry::kind::file:
-      if (here.error != 0)
-        return std::string("(a file: ")
-            .append(std::strerror(here.error))
-            .append(")");
-      return "(a file)";
     case entry::kind::special:
       return "(a FIFO, a socket or a device)";
     default:
-      return std::string("(a ").append(kind_of(here)).append(")");
+      return "(a " + kind_of(here) +
+             (here.error == 0
+                  ? ")"
+                  : ": " + std::string(std::strerror(here.error)) + ")");
   }
 }
 
@@ -51,25 +52,6 @@ std::string version_and_schema(const dataset_facts& set) {
                             : std::string("no version")) +
          (set.schema.empty() ? std::string(", no ICU schema")
                              : ", ICU schema " + escaped(set.schema));
-}
-
-const char* sentence_of(link_pair pair) {
-  switch (pair) {
-    case link_pair::system:
-    case link_pair::update:
-      return "zoneinfo and icutz name the same data";
-    case link_pair::update_without_icu:
-      return "zoneinfo names an update, but there is no link icutz";
-    case link_pair::update_with_other_icu:
-      return "icutz does not name the ICU data of zoneinfo's update";
-    case link_pair::system_with_icu:
-      return "zoneinfo names the system partition, but there is a link icutz";
-    case link_pair::not_the_tree:
-      return "zoneinfo leads into an update, but not to its tree";
-    case link_pair::no_dataset:
-      break;
-  }
-  return "zoneinfo names no data set";
 }
 
 // Not if something else than a link is in the way.
@@ -137,7 +119,7 @@ void add_data(rows& shown, const report& told) {
 
 void add_links(rows& shown, const report& told) {
   const link_facts& links = told.device.links;
-  shown.add("links", sentence_of(links.pair));
+  shown.add("links", words_for(links.pair).sentence);
   if (links.pair != link_pair::system && links.pair != link_pair::update) {
     shown.add("", "zoneinfo " + plain(links.zoneinfo));
     shown.add("", "icutz " + plain(links.icutz));
@@ -183,9 +165,7 @@ void add_downloads(rows& shown, const report& told) {
                   .append(std::to_string(found.size() - most_downloads))
                   .append(" more"));
   if (told.device.downloads_error != 0)
-    shown.add(label, std::string("(")
-                         .append(std::strerror(told.device.downloads_error))
-                         .append(")"));
+    shown.add(label, error_text(told.device.downloads_error));
   else if (found.empty())
     shown.add(label, "none");
 }
@@ -226,17 +206,11 @@ std::string in_rows(const report& told, const look& wanted) {
   add_links(shown, told);
   add_downloads(shown, told);
   add_boot(shown, told);
-  switch (told.why.is) {
-    case verdict::sound:
-      shown.add("status", "sound: the next boot changes nothing");
-      break;
-    case verdict::changes:
-      shown.add("status", "the next boot changes something");
-      break;
-    case verdict::wrong:
-      shown.add("status", "something is wrong");
-      break;
-  }
+  shown.add("status", told.why.is == verdict::sound
+                          ? "sound: the next boot changes nothing"
+                      : told.why.is == verdict::changes
+                          ? "the next boot changes something"
+                          : "something is wrong");
   for (const auto& reason : told.why.reasons) shown.add("", reason);
   return shown.text();
 }

@@ -88,9 +88,11 @@ bool enter_namespaces() {
   return true;
 }
 
-void set_attributes(int tree, unsigned flags, unsigned long attributes) {
+void set_attributes(int tree, unsigned flags, unsigned long attributes,
+                    unsigned long cleared = 0) {
   mount_attr wanted{};
   wanted.attr_set = attributes;
+  wanted.attr_clr = cleared;
   must(::mount_setattr(tree, "", AT_EMPTY_PATH | flags, &wanted, sizeof wanted),
        "mount_setattr");
 }
@@ -100,12 +102,7 @@ void set_attributes(int tree, unsigned flags, unsigned long attributes) {
 void protect(int tree) {
   set_attributes(tree, AT_RECURSIVE, MOUNT_ATTR_RDONLY);
   try {
-    mount_attr wanted{};
-    wanted.attr_set = MOUNT_ATTR_NOATIME;
-    wanted.attr_clr = MOUNT_ATTR__ATIME;
-    must(::mount_setattr(tree, "", AT_EMPTY_PATH | AT_RECURSIVE, &wanted,
-                         sizeof wanted),
-         "mount_setattr");
+    set_attributes(tree, AT_RECURSIVE, MOUNT_ATTR_NOATIME, MOUNT_ATTR__ATIME);
   } catch (const cannot_tell&) {
   }
 }

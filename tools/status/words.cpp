@@ -1,24 +1,14 @@
 // SPDX-License-Identifier: BSD-2-Clause
 #include "tools/status/words.h"
 
+#include <array>
+
 #include "support/paths.h"
 
 std::string kind_of(const entry& here) {
-  switch (here.what) {
-    case entry::kind::none:
-      return "none";
-    case entry::kind::link:
-      return "link";
-    case entry::kind::file:
-      return "file";
-    case entry::kind::directory:
-      return "directory";
-    case entry::kind::special:
-      return "special";
-    case entry::kind::unknown:
-      break;
-  }
-  return "unknown";
+  static constexpr std::array names = {"none",      "link",    "file",
+                                       "directory", "special", "unknown"};
+  return names.at(static_cast<std::size_t>(here.what));
 }
 
 std::string data_in_use(const link_facts& links) {
@@ -26,24 +16,29 @@ std::string data_in_use(const link_facts& links) {
   return links.current_path->empty() ? "system" : "update";
 }
 
-std::string name_of(link_pair pair) {
+pair_words words_for(link_pair pair) {
+  const char* const same = "zoneinfo and icutz name the same data";
   switch (pair) {
     case link_pair::system:
-      return "system";
+      return {"system", same};
     case link_pair::update:
-      return "update";
+      return {"update", same};
     case link_pair::update_without_icu:
-      return "update_without_icu";
+      return {"update_without_icu",
+              "zoneinfo names an update, but there is no link icutz"};
     case link_pair::update_with_other_icu:
-      return "update_with_other_icu";
+      return {"update_with_other_icu",
+              "icutz does not name the ICU data of zoneinfo's update"};
     case link_pair::system_with_icu:
-      return "system_with_icu";
+      return {"system_with_icu",
+              "zoneinfo names the system partition, but there is a link icutz"};
     case link_pair::not_the_tree:
-      return "not_the_tree";
+      return {"not_the_tree",
+              "zoneinfo leads into an update, but not to its tree"};
     case link_pair::no_dataset:
       break;
   }
-  return "no_dataset";
+  return {"no_dataset", "zoneinfo names no data set"};
 }
 
 std::string zone_of(const link_facts& links) {

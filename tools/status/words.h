@@ -14,8 +14,12 @@ std::string kind_of(const entry& here);
 // data set.
 std::string data_in_use(const link_facts& links);
 
-// A name for how the links fit, such as "update_without_icu".
-std::string name_of(link_pair pair);
+// How the links fit: a name, such as "update_without_icu", and a sentence.
+struct pair_words {
+  const char* name;
+  const char* sentence;
+};
+pair_words words_for(link_pair pair);
 
 // The zone that "localtime" names, below the active tree; empty: none.
 std::string zone_of(const link_facts& links);
