@@ -11,6 +11,7 @@ cannot be emulated here.
 """
 
 import argparse
+import os
 import subprocess
 import sys
 
@@ -46,10 +47,15 @@ def main() -> int:
                       help="measures what each restriction of the boot unit costs")
     parser.add_argument("--quick", action="store_true",
                         help="of the systems only those that scripts/ci boots")
+    parser.add_argument("--arm64", action="store_true", help="of --systems and "
+                        "--unit-cost: emulates arm64, not amd64, half a minute and "
+                        "more for each boot; scripts/ci does not")
     parser.add_argument("--seed", type=int, help="of what chance decides in cuts")
     options = parser.parse_args()
     if subprocess.call([PROJECT / "scripts/packages", "pytest"]):
         return 77
+    if options.arm64:
+        os.environ["MARLIN_SYSTEMS"] = "arm64"
     # After the options are understood: these take pytest.
     import pytest
     from lab.emulator import boot_cost, install_cuts, parts, power_cuts, show

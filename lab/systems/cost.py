@@ -13,7 +13,7 @@ from pathlib import Path
 from lab.emulator.boot_cost import COUNTED
 from lab.places import PROJECT
 from lab.systems.machine import System
-from lab.systems.parts import AMD64, Processor, prepare
+from lab.systems.parts import CHOSEN, Processor, prepare
 from lab.systems.scene import device, linked
 
 STARTS = 20
@@ -98,7 +98,7 @@ def variants() -> dict[str, list[str]]:
     }
 
 
-def measure(processor: Processor = AMD64, starts=STARTS, more: Path | None = None):
+def measure(processor: Processor = CHOSEN, starts=STARTS, more: Path | None = None):
     """`more` is another unit to compare with."""
     prepare(processor)
     compared = variants()

@@ -14,7 +14,7 @@ from dataclasses import dataclass
 from pathlib import Path
 
 from lab.carriers import image
-from lab.systems.parts import AMD64, Processor, make_image, room
+from lab.systems.parts import CHOSEN, Processor, make_image, room
 
 SECONDS = 600  # a boot that takes longer hangs
 UNIT = "marlin.service"
@@ -66,7 +66,7 @@ def message(entry: dict) -> str:
 class System:
     """In a directory of its own. `script` and the rest are for make_image."""
 
-    def __init__(self, name: str, script="", processor: Processor = AMD64, **how):
+    def __init__(self, name: str, script="", processor: Processor = CHOSEN, **how):
         self.processor = processor
         self.directory = room(processor.place / "scenes" / name)
         self.root, self.told, self.third = (

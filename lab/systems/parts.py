@@ -4,6 +4,7 @@ as it ships, and the demonstration's real data. The first two are fetched once, 
 folder "build"; each system has a disk of its own."""
 
 import fcntl
+import os
 import shutil
 import subprocess
 import sys
@@ -15,6 +16,7 @@ from lab.demo import data
 from lab.doors import build
 from lab.emulator.parts import Unavailable, fetch
 from lab.places import BUILD, PROJECT
+from lab.systems.foreign import run_with_qemu
 
 WORK = BUILD / "systems"
 GUEST = Path(__file__).parent / "guest"
@@ -32,6 +34,7 @@ class Processor(NamedTuple):
     compiler: str
     qemu: tuple[str, ...]
     console: str
+    packages: tuple[str, ...] = ()  # that this takes beside those of "systems"
 
     @property
     def place(self) -> Path:
@@ -45,11 +48,17 @@ class Processor(NamedTuple):
 
 AMD64 = Processor("amd64", "release", "gcc", (
     "qemu-system-x86_64", "-M", "q35"), "ttyS0")
+ARM64 = Processor("arm64", "arm64-release", "aarch64-linux-gnu-gcc", (
+    "qemu-system-aarch64", "-M", "virt", "-cpu", "cortex-a57"), "ttyAMA0",
+    ("arm64", "device", "systems-arm64"))
+# The one that systems have; scripts/device sets the variable.
+CHOSEN = ARM64 if os.environ.get("MARLIN_SYSTEMS") == ARM64.name else AMD64
 
 
-def prepare(processor=AMD64):
+def prepare(processor=CHOSEN):
     """Builds and fetches what is missing; or raises Unavailable."""
-    if subprocess.call([PROJECT / "scripts/packages", "build", "demo", "systems"]):
+    if subprocess.call([PROJECT / "scripts/packages", "build", "demo", "systems",
+                        *processor.packages]):
         raise Unavailable("packages are missing")
     place = processor.place
     place.mkdir(parents=True, exist_ok=True)
@@ -60,7 +69,7 @@ def prepare(processor=AMD64):
                 tell("Fetching a kernel")
                 fetch(place / "packages", processor.name, "busybox-static")
             if not (place / "root.tar").exists():
-                tell("Making a Debian system, in a minute or two")
+                tell("Making a Debian system, in two minutes or three")
                 make_root(processor)
         except RuntimeError as reason:
             why = str(reason).strip().splitlines()[-1]
@@ -79,9 +88,10 @@ def tell(text: str):
 
 def make_root(processor: Processor):
     made = processor.place / "root.new.tar"
-    run("mmdebstrap", "--quiet", "--variant=essential",
-        f"--architectures={processor.name}", f"--include={ROOT_PACKAGES}",
-        "--aptopt=Acquire::Languages \"none\"", *LEFT_OUT, "bookworm", made)
+    make = run_with_qemu if processor is ARM64 and os.geteuid() == 0 else run
+    make("mmdebstrap", "--quiet", "--variant=essential",
+         f"--architectures={processor.name}", f"--include={ROOT_PACKAGES}",
+         "--aptopt=Acquire::Languages \"none\"", *LEFT_OUT, "bookworm", made)
     made.rename(processor.place / "root.tar")
 
 
@@ -94,7 +104,7 @@ def make_package(processor: Processor):
         cwd=folder)
 
 
-def package(processor=AMD64) -> Path:
+def package(processor=CHOSEN) -> Path:
     [file] = processor.place.glob("marlin_*.deb")
     return file
 
