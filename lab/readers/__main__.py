@@ -45,7 +45,8 @@ def unpack():
         ["apt-get", "-q", "download", f"nodejs={release}", *PACKAGES], cwd=HOME,
         capture_output=True, text=True)
     if fetched.returncode:
-        stop(1, f"cannot fetch the programs: {fetched.stderr.partition(chr(10))[0]}")
+        why, *_ = fetched.stderr.splitlines()
+        stop(1, f"cannot fetch the programs: {why}")
     for package in HOME.glob("*.deb"):
         releases.output("dpkg-deb", "-x", package, UNPACKED)
         package.unlink()
