@@ -13,12 +13,13 @@ from typing import NamedTuple
 from lab.carriers.image import run
 from lab.demo import data
 from lab.doors import build
-from lab.emulator.parts import Unavailable, fetch
+from lab.emulator.parts import Unavailable, fetch, on_path
 from lab.places import BUILD, PROJECT
 
 WORK = BUILD / "systems"
 GUEST = Path(__file__).parent / "guest"
 ROOT_PACKAGES = "apparmor,dbus,systemd,systemd-sysv,tzdata,udev"
+SYSVINIT = "sysvinit-core", "initscripts", "sysv-rc", "insserv", "startpar"
 # Nobody asks these systems anything, and nobody reads on them.
 LEFT_OUT = [word for place in ("doc", "info", "locale", "man", "lintian")
             for word in (f"--dpkgopt=path-exclude=/usr/share/{place}/*",
@@ -51,6 +52,7 @@ def prepare(processor=AMD64):
     """Builds and fetches what is missing; or raises Unavailable."""
     if subprocess.call([PROJECT / "scripts/packages", "build", "demo", "systems"]):
         raise Unavailable("packages are missing")
+    on_path(processor.qemu[0])
     place = processor.place
     place.mkdir(parents=True, exist_ok=True)
     with open(place / "lock", "w", encoding="ascii") as lock:
@@ -59,6 +61,9 @@ def prepare(processor=AMD64):
             if not (place / "packages").is_dir():
                 tell("Fetching a kernel")
                 fetch(place / "packages", processor.name, "busybox-static")
+            if not (place / "sysvinit").is_dir():
+                tell("Fetching SysV init")
+                fetch(place / "sysvinit", processor.name, *SYSVINIT, kernel=False)
             if not (place / "root.tar").exists():
                 tell("Making a Debian system, in a minute or two")
                 make_root(processor)

@@ -39,7 +39,9 @@ def test_a_package_comes_and_goes():
     insist(seen, (), device())
     told = seen.text("then")
     assert told.endswith("ended with status 0\n"), told
-    assert "refused to stop" in told and states(seen, "before") == states(seen, "after")
+    refused = [line for line in told.splitlines() if line.startswith("refused")]
+    assert refused == ["refused to start", "refused to stop"]
+    assert states(seen, "before") == states(seen, "after")
 
     seen = system.boot(f"set -e; systemctl unmask {UNIT}; dpkg -r marlin")
     assert seen.units[UNIT]["LoadState"] == "masked"
