@@ -30,6 +30,7 @@ def prepare():
     """Builds and fetches what is missing; or raises Unavailable."""
     if subprocess.call([PROJECT / "scripts/packages", "build", "arm64", "device"]):
         raise Unavailable("packages are missing")
+    on_path("qemu-system-aarch64")
     WORK.mkdir(parents=True, exist_ok=True)
     with open(WORK / "lock", "w", encoding="ascii") as lock:
         fcntl.flock(lock, fcntl.LOCK_EX)
@@ -39,10 +40,16 @@ def prepare():
             try:
                 fetch(PARTS, "arm64", "busybox-static")
             except RuntimeError as reason:
-                raise Unavailable(f"the parts cannot be fetched: {reason}") from reason
+                why = str(reason).strip().splitlines()[-1]
+                raise Unavailable(f"the parts cannot be fetched: {why}") from reason
 
 
-def fetch(place: Path, architecture: str, *names: str):
+def on_path(program: str):
+    if not shutil.which(program):
+        raise Unavailable(f"{program} is installed and not on the PATH")
+
+
+def fetch(place: Path, architecture: str, *names: str, kernel=True):
     """Unpacks the newest kernel for virtual machines, and these packages. With an index
     and a package database of its own, so that this machine's stay as they are."""
     work = place.with_name("fetched")
@@ -60,11 +67,13 @@ def fetch(place: Path, architecture: str, *names: str):
         return run(tool, "-qq", *options, *words, cwd=work)
 
     apt("apt-get", "update")
-    newest = apt("apt-cache", "depends", f"linux-image-cloud-{architecture}")
-    kernel = re.search(r"^ *Depends: (linux-image-[0-9]\S*)$", newest, re.MULTILINE)
-    if not kernel:
-        raise RuntimeError(f"no kernel for {architecture} in the package index")
-    apt("apt-get", "download", kernel[1], *names)
+    if kernel:
+        newest = apt("apt-cache", "depends", f"linux-image-cloud-{architecture}")
+        found = re.search(r"^ *Depends: (linux-image-[0-9]\S*)$", newest, re.MULTILINE)
+        if not found:
+            raise RuntimeError(f"no kernel for {architecture} in the package index")
+        names += found[1],
+    apt("apt-get", "download", *names)
     for package in work.glob("*.deb"):
         run("dpkg-deb", "-x", package, work / "unpacked")
     (work / "unpacked").rename(place)

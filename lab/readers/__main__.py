@@ -35,15 +35,18 @@ def unpack():
     """What would be large, or start a server, is not installed."""
     UNPACKED.mkdir()
     # Another Node than Debian's may be installed, and then counts as the candidate.
-    known = releases.output("apt-cache", "show", "--no-all-versions", "libnode108",
-                            text=True)
+    known = subprocess.run(["apt-cache", "show", "--no-all-versions", "libnode108"],
+                           capture_output=True, text=True).stdout
+    if not known:
+        stop(1, "apt knows no package libnode108; as root, run apt-get update")
     release = releases.find("Node", "^Version: (.*)", known)[1]
     say("Fetching Debian packages (35 MB)")
     fetched = subprocess.run(
         ["apt-get", "-q", "download", f"nodejs={release}", *PACKAGES], cwd=HOME,
         capture_output=True, text=True)
     if fetched.returncode:
-        stop(1, f"cannot fetch the programs: {fetched.stderr.strip()}")
+        why, *_ = fetched.stderr.splitlines()
+        stop(1, f"cannot fetch the programs: {why}")
     for package in HOME.glob("*.deb"):
         releases.output("dpkg-deb", "-x", package, UNPACKED)
         package.unlink()

@@ -14,13 +14,14 @@ from typing import NamedTuple
 from lab.carriers.image import run
 from lab.demo import data
 from lab.doors import build
-from lab.emulator.parts import Unavailable, fetch
+from lab.emulator.parts import Unavailable, fetch, on_path
 from lab.places import BUILD, PROJECT
 from lab.systems.foreign import run_with_qemu
 
 WORK = BUILD / "systems"
 GUEST = Path(__file__).parent / "guest"
 ROOT_PACKAGES = "apparmor,dbus,systemd,systemd-sysv,tzdata,udev"
+SYSVINIT = "sysvinit-core", "initscripts", "sysv-rc", "insserv", "startpar"
 # Nobody asks these systems anything, and nobody reads on them.
 LEFT_OUT = [word for place in ("doc", "info", "locale", "man", "lintian")
             for word in (f"--dpkgopt=path-exclude=/usr/share/{place}/*",
@@ -60,6 +61,7 @@ def prepare(processor=CHOSEN):
     if subprocess.call([PROJECT / "scripts/packages", "build", "demo", "systems",
                         *processor.packages]):
         raise Unavailable("packages are missing")
+    on_path(processor.qemu[0])
     place = processor.place
     place.mkdir(parents=True, exist_ok=True)
     with open(place / "lock", "w", encoding="ascii") as lock:
@@ -68,6 +70,9 @@ def prepare(processor=CHOSEN):
             if not (place / "packages").is_dir():
                 tell("Fetching a kernel")
                 fetch(place / "packages", processor.name, "busybox-static")
+            if not (place / "sysvinit").is_dir():
+                tell("Fetching SysV init")
+                fetch(place / "sysvinit", processor.name, *SYSVINIT, kernel=False)
             if not (place / "root.tar").exists():
                 tell("Making a Debian system, in two minutes or three")
                 make_root(processor)

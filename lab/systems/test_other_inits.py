@@ -1,24 +1,40 @@
 # SPDX-License-Identifier: BSD-2-Clause
-"""A system that boots without systemd, by the example for busybox."""
+"""Systems that boot without systemd, by the examples for busybox and for SysV init."""
 
 import pytest
 
 from lab import lines
 from lab.paths import ZONEINFO
 from lab.systems.machine import Seen, System
+from lab.systems.parts import AMD64
 from lab.systems.scene import device, install_update_here, linked, links, names
 
 pytestmark = pytest.mark.rest
+DEVICES = "devtmpfs.mount=1"  # the root has none
 EXAMPLES = "usr/share/doc/marlin/examples"
 BUSYBOX = f"""
 ln -sfn /usr/lib/lab/busybox usr/sbin/init
 {{
   echo '::sysinit:/bin/mount -t proc proc /proc'
-  echo '::sysinit:/bin/mount -t devtmpfs devtmpfs /dev'
   cat {EXAMPLES}/inittab
   echo '::wait:/usr/lib/lab/after'
 }} >etc/inittab
 """
+# As Debian's packages set it up; the order comes from the scripts' headers.
+SYSV = f"""
+tar -c -C {AMD64.place}/sysvinit . | tar -x --keep-directory-symlink
+sed 's,:respawn:.*getty .*,:off:,' usr/share/sysvinit/inittab >etc/inittab
+echo 'lab:2:wait:/usr/lib/lab/after' >>etc/inittab
+cp {EXAMPLES}/init-script etc/init.d/marlin
+rm etc/rc?.d/[SK]* etc/init.d/apparmor etc/init.d/dbus etc/init.d/udev  # for time
+bwrap --bind . / insserv --default $(find etc/init.d -type f ! -name '.*' -printf '%f ')
+"""
+INITS = {"busybox": BUSYBOX, "sysv": SYSV}
+
+
+@pytest.fixture(params=INITS)
+def init(request) -> str:
+    return request.param
 
 
 def printed(seen: Seen) -> list[str]:
@@ -26,13 +42,15 @@ def printed(seen: Seen) -> list[str]:
             if "marlin" in line and not line.startswith("[")]
 
 
-def test_an_update_and_a_forged_line():
-    """What commands a console is not let through; the boot after that is quiet."""
+def test_an_update_and_a_forged_line(init):
+    """They are where /var is mounted by then. What commands a console is not let
+    through; the boot after that is quiet."""
     update = names().update
-    here = System("busybox", BUSYBOX + f"""
+    here = System(init, INITS[init] + f"""
         {install_update_here()} {linked(device(announced=True))}
-        ln -sfn "$(printf '/x\\033[31m')" .{ZONEINFO}""")
-    seen = here.boot("rm /var/db/timezone/tz_latest")
+        ln -sfn "$(printf '/x\\033[31m')" .{ZONEINFO}
+        echo '/dev/nvme0n3 /var ext4 defaults 0 0' >etc/fstab""", apart="var")
+    seen = here.boot("rm /var/db/timezone/tz_latest", DEVICES)
     said = printed(seen)
     assert [line.rpartition(": ")[0] for line in said] == [
         "marlin: Bad zoneinfo link /x?[31m", f"marlin: {lines.INVALID_LINKS}"], said
@@ -41,16 +59,16 @@ def test_an_update_and_a_forged_line():
     assert seen.text("reader") == "14:00 CEST\n" and update in seen.text(
         "/var/db/timezone/TZVersionDiffRecord")
 
-    seen = here.boot()
+    seen = here.boot(options=DEVICES)
     assert printed(seen) == [] and seen.text("reader") == "14:00 CEST\n"
 
 
-def test_without_var():
+def test_without_var(init):
     """Where "/var" is read-only and empty the boot goes on."""
-    here = System("busybox-without-var", BUSYBOX + """
+    here = System(f"{init}-without-var", INITS[init] + """
         echo '/dev/nvme0n3 /var ext4 ro 0 0' >etc/fstab
         rm -rf var; mkdir var""", apart="var")
-    seen = here.boot()
+    seen = here.boot(options=DEVICES)
     said = printed(seen)
     assert any(lines.NO_DATA in line for line in said), said
     assert seen.text("reader") == "12:00 UTC\n"
