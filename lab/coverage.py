@@ -11,7 +11,10 @@ covered, 1 when a test fails or something is not, 2 for bad use.
 """
 
 import json
+import os
 import shutil
+from concurrent.futures import ThreadPoolExecutor
+from pathlib import Path
 
 from lab.doors import Options, build, locked, need, quietly, stop
 from lab.places import BUILD, shown
@@ -26,18 +29,22 @@ def gcovr(*options):
             "--filter", "support/", *options)
 
 
+def run_tests(program: Path):
+    """Left out: a million texts through std::regex, with every step counted, which show
+    nothing more than a few; a boot that may not write more than five bytes into any
+    file, so not its counters either; whole lists of calls, at the end of which the
+    counters are written."""
+    quietly(LOG.with_name(f"log of {program.name}"), program, "--gtest_brief=1",
+            "--gtest_filter=-*OnAMillion*:*CannotBeWrittenWhole*:WholeListOfCalls.*")
+
+
 def measure():
     shutil.rmtree(REPORT, ignore_errors=True)
     build("coverage")
     for counters in FOLDER.rglob("*.gcda"):
         counters.unlink()
-    for program in sorted(FOLDER.glob("tests/*_test")):
-        # Left out: a million texts through std::regex, with every step counted, which
-        # show nothing more than a few; a boot that may not write more than five bytes
-        # into any file, so not its counters either; whole lists of calls, at the end
-        # of which the counters are written.
-        quietly(LOG, program, "--gtest_brief=1", "--gtest_filter="
-                "-*OnAMillion*:*CannotBeWrittenWhole*:WholeListOfCalls.*")
+    with ThreadPoolExecutor(os.cpu_count()) as together:
+        list(together.map(run_tests, FOLDER.glob("tests/*_test")))
     REPORT.mkdir()
     # An object that was built but never ran counts as well: all of it is missing.
     gcovr("--object-directory", FOLDER, "--exclude-directories", ".*/CompilerIdCXX",

@@ -29,13 +29,16 @@ LEFT_OUT = [word for place in ("doc", "info", "locale", "man", "lintian")
 
 
 class Processor(NamedTuple):
-    """A Debian architecture, the preset that builds for it, and the machine."""
+    """A Debian architecture, the preset that builds for it, and the machine; and the
+    release of Debian."""
     name: str
+    architecture: str
     preset: str
     compiler: str
     qemu: tuple[str, ...]
     console: str
     packages: tuple[str, ...] = ()  # that this takes beside those of "systems"
+    suite: str = "bookworm"
 
     @property
     def place(self) -> Path:
@@ -47,13 +50,17 @@ class Processor(NamedTuple):
         return kernel
 
 
-AMD64 = Processor("amd64", "release", "gcc", (
+AMD64 = Processor("amd64", "amd64", "release", "gcc", (
     "qemu-system-x86_64", "-M", "q35"), "ttyS0")
-ARM64 = Processor("arm64", "arm64-release", "aarch64-linux-gnu-gcc", (
+ARM64 = Processor("arm64", "arm64", "arm64-release", "aarch64-linux-gnu-gcc", (
     "qemu-system-aarch64", "-M", "virt", "-cpu", "cortex-a57"), "ttyAMA0",
     ("arm64", "device", "systems-arm64"))
-# The one that systems have; scripts/device sets the variable.
-CHOSEN = ARM64 if os.environ.get("MARLIN_SYSTEMS") == ARM64.name else AMD64
+# All with the kernel of Debian 12.
+ALL = {each.name: each for each in (
+    AMD64, ARM64, AMD64._replace(name="debian-11", suite="bullseye"),
+    AMD64._replace(name="debian-13", suite="trixie"))}
+# scripts/device sets the variable.
+CHOSEN = ALL[os.environ.get("MARLIN_SYSTEMS", AMD64.name)]
 
 
 def prepare(processor=CHOSEN):
@@ -69,10 +76,11 @@ def prepare(processor=CHOSEN):
         try:
             if not (place / "packages").is_dir():
                 tell("Fetching a kernel")
-                fetch(place / "packages", processor.name, "busybox-static")
+                fetch(place / "packages", processor.architecture, "busybox-static")
             if not (place / "sysvinit").is_dir():
                 tell("Fetching SysV init")
-                fetch(place / "sysvinit", processor.name, *SYSVINIT, kernel=False)
+                fetch(place / "sysvinit", processor.architecture, *SYSVINIT,
+                      kernel=False)
             if not (place / "root.tar").exists():
                 tell("Making a Debian system, in two minutes or three")
                 make_root(processor)
@@ -95,8 +103,8 @@ def make_root(processor: Processor):
     made = processor.place / "root.new.tar"
     make = run_with_qemu if processor is ARM64 and os.geteuid() == 0 else run
     make("mmdebstrap", "--quiet", "--variant=essential",
-         f"--architectures={processor.name}", f"--include={ROOT_PACKAGES}",
-         "--aptopt=Acquire::Languages \"none\"", *LEFT_OUT, "bookworm", made)
+         f"--architectures={processor.architecture}", f"--include={ROOT_PACKAGES}",
+         "--aptopt=Acquire::Languages \"none\"", *LEFT_OUT, processor.suite, made)
     made.rename(processor.place / "root.tar")
 
 
