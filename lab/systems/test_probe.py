@@ -83,7 +83,7 @@ def test_the_probe_is_refused():
 def test_a_record_that_is_a_link(enforced):
     """Only the profile forbids to write to what it names, and nothing else."""
     other, update = "/var/db/other", names().update
-    system = System("apparmor", f"""
+    system = System(f"apparmor-{enforced}", f"""
         {install_update_here()} {linked(device(announced=True))}
         echo kept >.{other}
         ln -s {other} .{RECORD}
