@@ -93,7 +93,8 @@ def test_a_record_that_is_a_link(enforced):
         rm etc/systemd/system/apparmor.service
         rm -f etc/apparmor.d/[a-z]*.*
         {f"cp .{APPARMOR} etc/apparmor.d/usr.libexec.marlin" if enforced else ""}""")
-    seen = system.boot("dmesg | grep DENIED >/run/lab/seen/denied")
+    seen = system.boot("dmesg | grep DENIED >/run/lab/seen/denied",
+                       "sysctl.kernel.printk_ratelimit=0")
     made = device(active=True, announced=True)
     made.link(RECORD, other)
     insist(seen, [lines.CORRECTING % f"{ZONEINFO}/{ZONE}"], made, reader="14:00 CEST")
