@@ -34,7 +34,8 @@ def test_a_package_comes_and_goes():
         dpkg -s marlin | grep '^Version: 99$'
         systemctl daemon-reload
         systemctl show -p Description {UNIT} | grep 'Links, Newer$'
-        systemctl isolate lab.target
+        systemctl isolate --no-block lab.target
+        sleep 5
         {tell} >/run/lab/seen/after
         systemctl start {UNIT} || echo refused to start
         systemctl stop {UNIT} || echo refused to stop
@@ -52,7 +53,8 @@ def test_a_package_comes_and_goes():
 
     seen = system.boot(f"set -e; dpkg -P marlin; {AFTER}"
                        f"dpkg -i /usr/lib/lab/marlin_*.deb; systemctl daemon-reload\n"
-                       f"systemctl start systemd-tmpfiles-clean.service; {tell} >/run/lab/seen/new")
+                       "systemctl start systemd-tmpfiles-clean.service\n"
+                       f"{tell} >/run/lab/seen/new")
     assert seen.units[UNIT]["LoadState"] == "not-found"
     assert seen.links.get(ZONEINFO) and seen.text("reader") == "13:00 WEST\n"
     fail(seen, not_run(seen) + [f"left behind: {path}" for path in
