@@ -145,10 +145,12 @@ find "$place/packages" -name overlay.ko -exec cp {} usr/lib/lab \;
 ln -sfn /var/db/timezone/localtime etc/localtime
 rm -f etc/fstab
 # These take time, and nobody waits for them; some need a "/tmp" or a "/var".
-for unit in apparmor.service dbus.socket dpkg-db-backup.timer e2scrub_all.timer \
-  fstrim.timer systemd-binfmt.service systemd-hwdb-update.service \
-  systemd-journal-catalog-update.service systemd-pstore.service systemd-random-seed.service systemd-tmpfiles-clean.timer \
-  systemd-update-done.service systemd-update-utmp.service tmp.mount; do
+for unit in apparmor.service dbus.socket dpkg-db-backup.timer \
+  e2scrub_all.timer fstrim.timer systemd-binfmt.service \
+  systemd-hwdb-update.service systemd-journal-catalog-update.service \
+  systemd-pstore.service systemd-random-seed.service \
+  systemd-tmpfiles-clean.timer systemd-update-done.service \
+  systemd-update-utmp.service tmp.mount; do
   ln -s /dev/null etc/systemd/system/$unit
 done
 printf '%032d\n' 1 >etc/machine-id
