@@ -4,7 +4,7 @@
 
 Shows that nothing breaks the program; docs/proofs.md says what each proof claims. The
 last lines give a figure for each. All of them take an hour on two processors; --quick
-takes samples, in eight minutes.
+takes samples, in a quarter of an hour.
 
   faults     every system call that fails, storage that fails, memory refused
   kills      every instant at which the program can be killed, and pairs of them

@@ -45,7 +45,8 @@ def forged(init: str) -> Callable[[], None]:
 
 FAULTS = {
     "a directory for devices": Fault(
-        test_var.test_a_read_only_root_without_tmp, added("PrivateDevices=yes"),
+        test_var.test_a_read_only_root_without_tmp,
+        without("BindReadOnlyPaths") + added("PrivateDevices=yes"),
         (ENDED + "('exit-code', 'failed', '226')",)),
     "directories for temporary files": Fault(
         test_var.test_a_read_only_root_without_tmp, added("PrivateTmp=yes"),
