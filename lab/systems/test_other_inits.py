@@ -6,7 +6,7 @@ import pytest
 from lab import lines
 from lab.paths import ZONEINFO
 from lab.systems.machine import Seen, System
-from lab.systems.parts import AMD64
+from lab.systems.parts import CHOSEN
 from lab.systems.scene import device, install_update_here, linked, links, names
 
 pytestmark = pytest.mark.rest
@@ -22,7 +22,7 @@ ln -sfn /usr/lib/lab/busybox usr/sbin/init
 """
 # As Debian's packages set it up; the order comes from the scripts' headers.
 SYSV = f"""
-tar -c -C {AMD64.place}/sysvinit . | tar -x --keep-directory-symlink
+tar -c -C {CHOSEN.place}/sysvinit . | tar -x --keep-directory-symlink
 sed 's,:respawn:.*getty .*,:off:,' usr/share/sysvinit/inittab >etc/inittab
 echo 'lab:2:wait:/usr/lib/lab/after' >>etc/inittab
 cp {EXAMPLES}/init-script etc/init.d/marlin
