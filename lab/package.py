@@ -18,7 +18,7 @@ def main() -> int:
     options = Options(__doc__)
     options.add_argument("preset", nargs="?", choices=["release", "arm64-release"])
     chosen = options.parse_args().preset
-    need("build", "private-device", "test", "pytest", "package", "arm64")
+    need("build", "private-device", "pytest", "package", "arm64")
     presets = [chosen] if chosen else ["release", "arm64-release"]
     return subprocess.call(
         pytest("-v", *(f"--preset={name}" for name in presets), "lab/test_package.py"),

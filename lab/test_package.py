@@ -1,8 +1,9 @@
 # SPDX-License-Identifier: BSD-2-Clause
-"""The Debian package of each release preset, and the boot unit in it.
+"""The Debian package of each release preset, and the boot unit in it, as far as that
+can be judged without a boot.
 
 Built from what git knows of this tree, uncommitted changes too, in build/packaging,
-where the packages stay. The unit is tested on the machine's own architecture.
+where the packages stay.
 """
 
 import fcntl
@@ -20,7 +21,6 @@ from typing import NamedTuple
 
 import pytest
 
-from lab import doors
 from lab.places import BUILD, PROJECT
 
 WORK = BUILD / "packaging"
@@ -57,21 +57,6 @@ CONTENT = dict(reversed(line.split(maxsplit=1)) for line in """
     644 /usr/share/man/man8/marlin-mend.8.gz
     644 /usr/share/man/man8/marlin.8.gz
 """.strip().splitlines())
-
-# Every line of the unit's section is applied by packaging/confine.c, or takes away
-# what a process without capabilities, without these calls and without places to write
-# to does not have anyway, or does not restrict. A new one fails until somebody has
-# thought about it.
-KNOWN = set("""
-    Type RemainAfterExit ExecStart TimeoutStartSec TimeoutStopSec SyslogLevel
-    SyslogLevelPrefix LimitAS LimitCORE User UMask CapabilityBoundingSet NoNewPrivileges
-    ProtectSystem ReadWritePaths ReadOnlyPaths InaccessiblePaths DevicePolicy
-    MemoryDenyWriteExecute SystemCallArchitectures SystemCallErrorNumber
-    SystemCallFilter KeyringMode ProtectHome ProtectProc BindReadOnlyPaths
-    ProtectControlGroups ProtectKernelLogs ProtectKernelModules ProtectKernelTunables
-    PrivateMounts PrivateNetwork IPAddressDeny RestrictAddressFamilies
-    LockPersonality RestrictNamespaces RestrictRealtime RestrictSUIDSGID
-""".split())
 
 
 def run(*command, **options) -> str:
@@ -116,8 +101,6 @@ class Package(NamedTuple):
 
 def pytest_generate_tests(metafunc):
     presets = metafunc.config.getoption("preset") or list(ARCHITECTURES)
-    if "unit" in metafunc.fixturenames:
-        presets = [preset for preset in presets if preset == "release"]
     if "package" in metafunc.fixturenames:
         metafunc.parametrize("package", presets, indirect=True, scope="module")
 
@@ -268,26 +251,7 @@ def test_cmake_installs_it_below_any_prefix(package):
 # --- What starts it ------------------------------------------------------------------
 
 
-def boot(test: str, program: Path):
-    """Runs a test of lab/package_boots.py on a private device, with this program."""
-    in_user_namespace(
-        1000, "scripts/private-device", "/usr/bin/env", f"MARLIN={program}",
-        *doors.pytest("-q", "-p", "no:cacheprovider", f"lab/package_boots.py::{test}"),
-        cwd=PROJECT)
-
-
-@pytest.fixture(scope="module")
-def unit(package) -> str:
-    """The boot unit's text."""
-    return (package.content / "usr/lib/systemd/system/marlin.service").read_text()
-
-
-def values(unit: str, key: str) -> list[str]:
-    """The words of all its lines with this key."""
-    return " ".join(re.findall(rf"^{key}=(.*)$", unit, re.M)).split()
-
-
-def test_tmpfiles_make_the_two_directories(package, unit):
+def test_tmpfiles_make_the_two_directories(package):
     root = fresh(package.work / "tmpfiles")
     (root / "etc").mkdir()
     (root / "etc/passwd").write_text("root:x:0:0::/:\n")
@@ -307,24 +271,8 @@ def test_tmpfiles_make_the_two_directories(package, unit):
         assert directory.stat().st_mode == 0o42770
 
 
-@pytest.mark.parametrize("example, arguments", [("init-script", "start"),
-                                                ("inittab", "")])
-def test_an_example_for_another_init_system_boots(package, unit, example, arguments):
-    """With the program where it was unpacked. The mounts are there, and the paths of
-    busybox may differ."""
-    text = (package.content / "usr/share/doc/marlin/examples" / example).read_text()
-    text = text.replace("/usr/libexec/marlin", f"{package.content}/usr/libexec/marlin")
-    if example == "inittab":
-        text = "\n".join(re.findall("^::sysinit:((?!.*mount).*)$", text, re.M))
-    place = fresh(package.work / example)
-    (place / example).write_text(text)
-    (place / "marlin").write_text(f"#!/bin/sh\nexec sh {place}/{example} {arguments}\n")
-    (place / "marlin").chmod(0o755)
-    boot("test_a_new_device_boots", place / "marlin")
-
-
 @pytest.fixture(scope="module")
-def units(package, unit) -> str:
+def units(package) -> str:
     """The option for a root with the package in it and the units that it leans on."""
     root = fresh(package.work / "units")
     shutil.copytree(package.content / "usr", root / "usr", symlinks=True)
@@ -361,79 +309,3 @@ def test_systemd_rates_its_exposure_at_most_1(units, count):
     level = float(found(r"exposure level for marlin\.service: ([\d.]+) ", rating))
     assert level <= 1.0, rating
     count("tenths of exposure, as systemd rates the boot unit", round(10 * level))
-
-
-def test_every_restriction_of_the_unit_is_known(unit):
-    section = unit.partition("\n[Service]\n")[2]
-    assert set(re.findall(r"^([A-Za-z]+)=", section, re.M)) - KNOWN == set()
-    for line in ("ProtectSystem=strict", "CapabilityBoundingSet=",
-                 "MemoryDenyWriteExecute=yes"):
-        assert line in section.splitlines()
-
-
-# --- Boots under the unit's restrictions ---------------------------------------------
-
-
-def confinement(place: Path, unit: str, visible="") -> Path:
-    """A program that starts "marlin.real" beside it under the unit's restrictions,
-    except that one of the hidden paths may be visible."""
-    lists = {"ALLOWED_CALLS": values(unit, "SystemCallFilter"),
-             "WRITABLE_PATHS": values(unit, "ReadWritePaths"),
-             "READ_ONLY_PATHS": values(unit, "(?:Bind)?ReadOnlyPaths"),
-             "HIDDEN_PATHS": [path for path in values(unit, "InaccessiblePaths")
-                              if path != visible]}
-    [limit] = values(unit, "LimitAS")
-    program = fresh(place) / "marlin"
-    compiled(program, "confine.c", "-lseccomp",
-             f"-DMEMORY={limit.removesuffix('M')}ul<<20", *(
-                 f"-D{name}=" + ",".join(f'"{word.removeprefix("-")}"'
-                                         for word in words)
-                 for name, words in lists.items()))
-    return program
-
-
-@pytest.fixture(scope="module")
-def confined(package, unit) -> Path:
-    return confinement(package.work / "confined", unit)
-
-
-def compiled(program: Path, source: str, *options):
-    run("gcc", "-O1", "-Wall", "-Wextra", "-Werror", "-o", program,
-        PROJECT / "packaging" / source, *options)
-
-
-def test_the_confinement_confines(package, unit):
-    """The probe reads its capabilities in /proc."""
-    program = confinement(package.work / "probed", unit, visible="/proc")
-    compiled(program.with_suffix(".real"), "probe.c", "-static")
-    boot("test_the_probe_is_refused", program)
-
-
-def test_devices_boot_confined(package, confined):
-    shutil.copy(package.content / "usr/libexec/marlin", confined.with_suffix(".real"))
-    boot("test_a_chosen_device_boots", confined)
-
-
-def test_the_mend_works_confined(package, confined):
-    mend = fresh(package.work / "mend") / "marlin-mend"
-    shutil.copy(confined, mend)
-    for place in (mend, confined):
-        shutil.copy(package.content / "usr/libexec" / place.name,
-                    place.with_suffix(".real"))
-    both = mend.with_name("both")
-    both.write_text(f"#!/bin/sh\n{mend}\nexec {confined}\n")
-    both.chmod(0o755)
-    boot("test_mixed_links_are_mended", both)
-
-
-def test_the_boot_tests_pass_confined(package, confined):
-    """Where they look for the program, it is the confined one."""
-    build = package.tree / "build/dev"
-    run("cmake", "--preset", "dev", "-S", package.tree, "-B", build)
-    run("cmake", "--build", build, "--target", "boot_test")
-    (build / "marlin").unlink()
-    shutil.copy(confined, build / "marlin")
-    shutil.copy(package.content / "usr/libexec/marlin", build / "marlin.real")
-    output = in_user_namespace(1000, build / "tests/boot_test", "--gtest_brief=1")
-    assert re.search(r"\[  PASSED  \] [1-9]\d* tests?\.", output), output
-    assert "SKIPPED" not in output, output

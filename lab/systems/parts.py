@@ -92,7 +92,7 @@ def prepare(processor=CHOSEN):
         make_package(processor)
         # In marlin's place it has to have its name.
         run(processor.compiler, "-static", "-O1", "-Wall", "-o", place / "marlin",
-            PROJECT / "packaging/probe.c")
+            Path(__file__).with_name("probe.c"))
 
 
 def tell(text: str):

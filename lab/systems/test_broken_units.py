@@ -8,8 +8,9 @@ from typing import NamedTuple
 
 import pytest
 
-from lab.systems import (machine, parts, test_limits, test_ordinary, test_other_inits,
-                         test_package_on_a_system, test_probe, test_slow, test_var)
+from lab.systems import (machine, parts, test_chosen, test_limits, test_ordinary,
+                         test_other_inits, test_package_on_a_system, test_probe,
+                         test_slow, test_var)
 
 pytestmark = pytest.mark.rest
 
@@ -64,8 +65,9 @@ FAULTS = {
         test_limits.test_a_terabyte_for_a_word, without("LimitAS"),
         (ENDED,)),
     "a system call": Fault(
-        test_ordinary.test_from_its_first_boot_on,
-        without("SystemCallFilter=symlink"), ("the program's lines are",)),
+        test_chosen.test_every_device,
+        "sed -i 's/ rmdir$//' usr/lib/systemd/system/marlin.service\n",
+        ("the boot of: legacy migration", "ended with signal 31")),
     "too little time": Fault(
         lambda: test_slow.test_an_update("rw"),
         without("TimeoutStartSec") + added("TimeoutStartSec=5s"),

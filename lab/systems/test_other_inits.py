@@ -9,7 +9,6 @@ from lab.systems.machine import Seen, System
 from lab.systems.parts import CHOSEN
 from lab.systems.scene import device, install_update_here, linked, links, names
 
-pytestmark = pytest.mark.rest
 DEVICES = "devtmpfs.mount=1"  # the root has none
 EXAMPLES = "usr/share/doc/marlin/examples"
 BUSYBOX = f"""
@@ -63,6 +62,7 @@ def test_an_update_and_a_forged_line(init):
     assert printed(seen) == [] and seen.text("reader") == "14:00 CEST\n"
 
 
+@pytest.mark.rest
 def test_without_var(init):
     """Where "/var" is read-only and empty the boot goes on."""
     here = System(f"{init}-without-var", INITS[init] + """
