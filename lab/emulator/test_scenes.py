@@ -17,15 +17,14 @@ from lab.carriers import image
 from lab.device import Device, Node, sound_device
 from lab.emulator.machine import (NO_BLOCK, NO_FILLER, NO_INODE, Machine,
                                   shown_links)
-from lab.paths import (DEFAULT_ZONE, ICUTZ, LEGACY_ICUTZ, LOCALTIME, OLD_ICU,
-                       RECORD, SYSTEM_ZONEINFO, TIMEZONE, ZONEINFO, update_path)
+from lab.paths import (ICUTZ, RECORD, SYSTEM_ZONEINFO, TIMEZONE, ZONEINFO,
+                       update_path)
 from lab.seen import Seen
 from lab.trial import differences, fail
 
 UPDATE = "2024a.1.0"
 FIRST_RECORD = "2023c.1.0_2024a.1.0"
 REFUSED = lines.NOT_NEWER % (UPDATE, UPDATE)
-LOCALTIME_INVALID = lines.LOCALTIME_INVALID % DEFAULT_ZONE
 NO_ZONEINFO = (lines.BAD_LINK % "", lines.INVALID_LINKS)
 
 
@@ -89,7 +88,7 @@ def scene(machine, request):
     return Scene(machine("scenes/" + request.node.name))
 
 
-# --- What happens to every device -----------------------------------------------------
+# --- An ordinary life; every other state is in test_chosen.py -------------------------
 
 
 def test_never_updated(scene):
@@ -106,66 +105,6 @@ def test_update(scene):
     scene.boot(reader="U24AP")
     for _ in range(2):
         scene.boot(REFUSED, reader="U24AP")
-
-
-def test_another_schema(scene):
-    device = updated(active=True, announced=True)
-    device.install_update("2024b.1.0", "45l")
-    scene.on(device)
-    scene.boot(REFUSED, reader="U24AP", then=lambda: device.announce("2024b.1.0"))
-    scene.boot(lines.NOT_NEWER % ("2024b.1.0", UPDATE), reader="U24AP")
-
-
-def test_system_upgraded_past_the_update(scene):
-    device = scene.on(updated(announced=True))
-    activate(device)
-    scene.boot(reader="U24AP")
-    device.install_system("2024b")
-    scene.machine.build_system()
-    device.point_links_at(None)
-    scene.boot(lines.INCOMPATIBLE, REFUSED, reader="S24BP")
-    scene.boot(lines.NOT_NEWER % (UPDATE, "2024b.1.0"), reader="S24BP")
-
-
-def test_links_wiped(scene):
-    device = scene.on(updated(active=True))
-
-    def wipe(*paths):
-        for path in paths:
-            device.drop(path)
-
-    scene.boot(reader="U24AP", then=lambda: wipe(ZONEINFO, ICUTZ, LOCALTIME))
-    device.point_links_at(None)
-    device.choose_zone(DEFAULT_ZONE)
-    scene.boot(*NO_ZONEINFO, LOCALTIME_INVALID, reader="S23CL",
-               then=lambda: (device.announce(UPDATE), wipe(ZONEINFO, LOCALTIME)))
-    activate(device)
-    device.choose_zone(DEFAULT_ZONE)
-    scene.boot(*NO_ZONEINFO, LOCALTIME_INVALID, reader="U24AL")
-
-
-def test_legacy_icu_link(scene):
-    device = updated(active=True)
-    icutz = device.find(ICUTZ).text
-    device.drop(ICUTZ)
-    device.link(LEGACY_ICUTZ, icutz)
-    device.link(OLD_ICU, "/var/db/gone")
-    scene.on(device)
-    device.drop(LEGACY_ICUTZ)
-    device.drop(OLD_ICU)
-    device.link(ICUTZ, icutz)
-    for _ in range(2):
-        scene.boot(reader="U24AP")
-
-
-def test_no_directory(scene):
-    device = sound_device()
-    device.drop(TIMEZONE)
-    scene.on(device)
-    no_link = (lines.CREATE_SYMLINK % (ZONEINFO, SYSTEM_ZONEINFO), errno.ENOENT)
-    for _ in range(2):
-        scene.boot(*NO_ZONEINFO, no_link, (lines.NO_DATA, errno.ENOENT), no_link,
-                   ending="abort")
 
 
 # --- What only a real disk does -------------------------------------------------------
