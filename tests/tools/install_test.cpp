@@ -187,10 +187,10 @@ TEST_F(Installer, ShowsOnATerminalHowFarItIs) {
     ::dup2(::open(other_end.c_str(), O_RDWR | O_NOCTTY), STDOUT_FILENO);
   });
   EXPECT_EQ(shown.exit_status, 0);
-  char text[4096];
-  const ssize_t length = ::read(terminal, text, sizeof text);
-  ASSERT_GT(length, 0);
-  EXPECT_EQ(std::string(text, static_cast<std::size_t>(length)),
+  // It hands on what was written in pieces, and fails after the last.
+  std::string text;
+  for (char byte; ::read(terminal, &byte, 1) == 1;) text += byte;
+  EXPECT_EQ(text,
             "\rinstalling: 29 %\rinstalling: 59 %\rinstalling: 89 %\r\033[K"
             "2024b.1.0 is announced; the next boot decides\r\n");
   ::close(terminal);
