@@ -137,6 +137,18 @@ def build(preset: str, *options: str, folder: Path | None = None,
     return folder
 
 
+def package(preset: str, place: Path) -> Path:
+    """The Debian package of a release preset, made in a directory that is there."""
+    with locked(BUILD / preset):
+        folder = build(preset)
+        for old in place.glob("*.deb"):
+            old.unlink()
+        quietly(place / "cpack.log", "cpack", "--config", folder / "CPackConfig.cmake",
+                "-B", place)
+    [file] = place.glob("*.deb")
+    return file
+
+
 def pytest(*arguments: str) -> list[str]:
     """The command that runs tests of lab/."""
     return ["/usr/bin/python3", "-B", "-m", "pytest", "-c", "lab/pytest.ini",

@@ -12,7 +12,7 @@ import time
 import pytest
 
 from lab import releases
-from lab.doors import build
+from lab.doors import package
 from lab.places import PROJECT
 
 SECONDS = 400
@@ -55,9 +55,7 @@ def console(tmp_path_factory):
     given = releases.given(release)
     releases.run(releases.tool("make-system", **given, schema=releases.icu_schema(),
                                out=place / "system"))
-    folder = build("release")
-    releases.output("cpack", "--config", folder / "CPackConfig.cmake", "-B", place,
-                    cwd=folder)
+    package("release", place)
     text = (PROJECT / "docs/integration.md").read_text()
     recipe = re.search(r"<!-- image -->\n```\n(.*?)```\n<!-- end -->", text,
                        re.DOTALL)[1]

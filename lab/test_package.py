@@ -2,8 +2,8 @@
 """The Debian package of each release preset, and the boot unit in it, as far as that
 can be judged without a boot.
 
-Built from what git knows of this tree, uncommitted changes too, in build/packaging,
-where the packages stay.
+The packages stay in build/packaging. Each is built once more elsewhere, from what git
+knows of this tree, uncommitted changes too.
 """
 
 import fcntl
@@ -21,6 +21,7 @@ from typing import NamedTuple
 
 import pytest
 
+from lab import doors
 from lab.places import BUILD, PROJECT
 
 WORK = BUILD / "packaging"
@@ -92,9 +93,9 @@ def found(pattern: str, text: str) -> str:
 
 class Package(NamedTuple):
     preset: str
-    tree: Path  # in which it was built
     file: Path
-    again: Path  # built once more elsewhere
+    tree: Path  # in which it was built once more
+    again: Path
     work: Path
     content: Path  # unpacked
 
@@ -111,26 +112,27 @@ def package(request) -> Package:
     work.mkdir(parents=True, exist_ok=True)
     with open(work / "lock", "w", encoding="ascii") as lock:
         fcntl.flock(lock, fcntl.LOCK_EX)
-        file = built(work / "one", preset)
+        os.environ.pop("SOURCE_DATE_EPOCH", None)
+        file = doors.package(preset, work)
         # In another place, at another time, by somebody with other habits; and not by
         # a cache, which would give the same objects out twice.
-        again = built(work / "another/place", preset, umask=0o077, TZ="Pacific/Apia",
-                      LC_ALL="C.UTF-8", CCACHE_DISABLE="1")
+        tree = work / "another/place"
+        again = built(tree, preset, umask=0o077, TZ="Pacific/Apia", LC_ALL="C.UTF-8",
+                      CCACHE_DISABLE="1")
         run("dpkg-deb", "-x", file, fresh(work / "content"))
         shutil.copy(file, WORK)
-        yield Package(preset, work / "one", file, again, work, work / "content")
+        yield Package(preset, file, tree, again, work, work / "content")
 
 
 def built(tree: Path, preset: str, umask=-1, **environment) -> Path:
     """The package, built in a copy of this tree."""
-    environment = {**os.environ, **environment}
-    environment.pop("SOURCE_DATE_EPOCH", None)
     run("bash", "-euo", "pipefail", "-c", """
         (cd "$2" && git ls-files -z | tar -c --null -T -) | tar -x --no-same-permissions
         cmake --preset "$1"
         cmake --build --preset "$1"
         cpack --config "build/$1/CPackConfig.cmake" -B "build/$1"
-        """, "-", preset, PROJECT, cwd=fresh(tree), umask=umask, env=environment)
+        """, "-", preset, PROJECT, cwd=fresh(tree), umask=umask,
+        env=os.environ | environment)
     file, = (tree / "build" / preset).glob("*.deb")
     return file
 

@@ -13,7 +13,7 @@ from typing import NamedTuple
 
 from lab.carriers.image import run
 from lab.demo import data
-from lab.doors import build
+from lab.doors import package
 from lab.emulator.parts import Unavailable, fetch, on_path
 from lab.places import BUILD, PROJECT
 from lab.systems.foreign import run_with_qemu
@@ -89,7 +89,7 @@ def prepare(processor=CHOSEN):
             raise Unavailable("no Debian system can be made here, which takes a mirror "
                               f"of Debian: {why}") from reason
         data.prepare()
-        make_package(processor)
+        package(processor.preset, processor.place)
         # In marlin's place it has to have its name.
         run(processor.compiler, "-static", "-O1", "-Wall", "-o", place / "marlin",
             Path(__file__).with_name("probe.c"))
@@ -106,20 +106,6 @@ def make_root(processor: Processor):
          f"--architectures={processor.architecture}", f"--include={ROOT_PACKAGES}",
          "--aptopt=Acquire::Languages \"none\"", *LEFT_OUT, processor.suite, made)
     made.rename(processor.place / "root.tar")
-
-
-def make_package(processor: Processor):
-    """As scripts/package does, without its checks."""
-    folder = build(processor.preset)
-    for old in processor.place.glob("*.deb"):
-        old.unlink()
-    run("cpack", "--config", folder / "CPackConfig.cmake", "-B", processor.place,
-        cwd=folder)
-
-
-def package(processor=CHOSEN) -> Path:
-    [file] = processor.place.glob("marlin_*.deb")
-    return file
 
 
 IMAGE = r"""
@@ -176,9 +162,10 @@ def make_image(processor: Processor, image: Path, script="", apart="",
     """A system's disk, after a shell did what the script says in its root directory;
     what is below the directory `apart` goes to a disk of its own. In a user namespace:
     whoever runs this owns all, as root."""
+    [package] = processor.place.glob("*.deb")
     run("bwrap", "--unshare-user", "--uid", 0, "--gid", 0, "--dev-bind", "/", "/",
-        "sh", "-euc", IMAGE, "-", processor.place, GUEST, data.TARGET,
-        package(processor), image, script, apart, third or "", megabytes)
+        "sh", "-euc", IMAGE, "-", processor.place, GUEST, data.TARGET, package, image,
+        script, apart, third or "", megabytes)
 
 
 def room(place: Path) -> Path:
