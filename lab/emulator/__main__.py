@@ -15,14 +15,8 @@ import os
 import subprocess
 import sys
 
-from lab.doors import Options
+from lab.doors import Options, number
 from lab.places import PROJECT
-
-
-def number_of_cuts(text: str) -> int:
-    if not text.isdecimal() or int(text) == 0:
-        raise argparse.ArgumentTypeError(f"{text!r} is not a number of power cuts")
-    return int(text)
 
 
 def main() -> int:
@@ -33,11 +27,11 @@ def main() -> int:
                       'after the pass; "poweroff -f" ends it')
     mode.add_argument("--tests", nargs="*", metavar="TEST", help="every chosen device, "
                       "sequences of boots on one disk, ten power cuts; or these tests")
-    mode.add_argument("--power-cuts", type=number_of_cuts, metavar="N", help="cuts the "
+    mode.add_argument("--power-cuts", type=number, metavar="N", help="cuts the "
                       "power at N random instants, and checks what is left")
     mode.add_argument("--boot-cost", action="store_true",
                       help="measures the part of a boot that the pass takes")
-    mode.add_argument("--install-cuts", type=number_of_cuts, metavar="N", help="the "
+    mode.add_argument("--install-cuts", type=number, metavar="N", help="the "
                       "same while updates are installed")
     parser.add_argument("--mend", action="store_true", help="of --power-cuts: each "
                         "boot first removes links that are of two sets")

@@ -8,12 +8,10 @@ the same under every load of this machine."""
 import re
 import statistics
 
-from pathlib import Path
-
 from lab.emulator.boot_cost import COUNTED
 from lab.places import PROJECT
 from lab.systems.machine import System
-from lab.systems.parts import CHOSEN, Processor, prepare
+from lab.systems.parts import CHOSEN, prepare
 from lab.systems.scene import device, linked
 
 STARTS = 20
@@ -21,13 +19,13 @@ PROPERTIES = ("Id,Result,CPUUsageNSec,InactiveExitTimestampMonotonic,"
               "ActiveEnterTimestampMonotonic")
 
 # Every unit stays active until all are told of, so that nothing is forgotten.
-MEASURE = """
+MEASURE = f"""
 mkdir -p /run/systemd/system
 cd /run/lab/units && cp * /run/systemd/system && systemctl daemon-reload
 units=$(echo *)
-for start in $(seq {starts}); do
+for start in $(seq {STARTS}); do
   for unit in $units; do systemctl start $unit; done
-  systemctl show --property={properties} $units
+  systemctl show --property={PROPERTIES} $units
   echo
   systemctl stop $units
 done >/run/lab/seen/costs
@@ -55,11 +53,6 @@ def only(lines: list[str], *keys: str) -> list[str]:
     return [line for line in lines if line.partition("=")[0] in keys]
 
 
-def with_drop_in(lines: list[str], more: list[str]) -> list[str]:
-    """As systemd reads a drop-in: it comes last, and an empty value forgets."""
-    return [*lines, *more]
-
-
 UNITS = PROJECT / "packaging"
 # By the place that the filter of system calls, or an empty set of capabilities, has.
 FILTERS = ("LockPersonality", "MemoryDenyWriteExecute", "RestrictAddressFamilies",
@@ -84,7 +77,7 @@ def variants() -> dict[str, list[str]]:
         "no restriction": only(unit, *PROGRAM),
         "the list of system calls alone": only(unit, *PROGRAM, *CALLS),
         "as shipped": unit,
-        "with the lean drop-in": with_drop_in(unit, lean),
+        "with the lean drop-in": [*unit, *lean],
         **{f"without {key}": without(unit, key) for key in (
             "ProtectSystem", "ProtectHome", "InaccessiblePaths", "DevicePolicy",
             "PrivateNetwork")},
@@ -98,15 +91,11 @@ def variants() -> dict[str, list[str]]:
     }
 
 
-def measure(processor: Processor = CHOSEN, starts=STARTS, more: Path | None = None):
-    """`more` is another unit to compare with."""
-    prepare(processor)
-    compared = variants()
-    if more:
-        compared["another"] = section(more.read_text())
-    system = System("cost", linked(device()), processor=processor)
-    print(f"{'ms of ' + processor.name:66}{'processor':>10}{'wall':>8}{'exposure':>9}")
-    for name, (cpu, wall, rating) in measured(system, compared, starts).items():
+def measure():
+    prepare()
+    system = System("cost", linked(device()))
+    print(f"{'ms of ' + CHOSEN.name:66}{'processor':>10}{'wall':>8}{'exposure':>9}")
+    for name, (cpu, wall, rating) in measured(system, variants()).items():
         print(f"{name:66}{cpu:10.1f}{wall:8.1f}{rating:>9}", flush=True)
 
 
@@ -117,13 +106,11 @@ def written(units: dict[str, str]) -> str:
         for name, text in units.items())
 
 
-def measured(system: System, variants: dict[str, list[str]], starts=STARTS):
+def measured(system: System, variants: dict[str, list[str]]):
     """By name: medians of processor time and wall in ms, and systemd's rating."""
     names = {f"v{number:02}.service": name for number, name in enumerate(variants)}
     units = {file: service(variants[name]) for file, name in names.items()}
-    seen = system.boot(written(units) + MEASURE.format(starts=starts,
-                                                       properties=PROPERTIES),
-                       more=COUNTED, seconds=7200)
+    seen = system.boot(written(units) + MEASURE, more=COUNTED, seconds=7200)
     found = {name: ([], []) for name in variants}
     for block in seen.text("costs").strip().split("\n\n"):
         told = dict(line.split("=", 1) for line in block.splitlines())

@@ -14,7 +14,7 @@ from dataclasses import dataclass
 from pathlib import Path
 
 from lab.carriers import image
-from lab.systems.parts import CHOSEN, Processor, make_image, room
+from lab.systems.parts import CHOSEN, make_image, room
 
 SECONDS = 600  # a boot that takes longer hangs
 UNIT = "marlin.service"
@@ -66,12 +66,11 @@ def message(entry: dict) -> str:
 class System:
     """In a directory of its own. `script` and the rest are for make_image."""
 
-    def __init__(self, name: str, script="", processor: Processor = CHOSEN, **how):
-        self.processor = processor
-        self.directory = room(processor.place / "scenes" / name)
+    def __init__(self, name: str, script="", **how):
+        self.directory = room(CHOSEN.place / "scenes" / name)
         self.root, self.told, self.third = (
             self.directory / name for name in ("system.img", "told.tar", "third.img"))
-        make_image(processor, self.root, script, third=self.third, **how)
+        make_image(self.root, script, third=self.third, **how)
 
     def replace(self, path: str, text: str):
         """A file of the root, while the system is off."""
@@ -81,14 +80,14 @@ class System:
         image.debugfs(self.root, f"rm {path}", f"write {file} {path}", write=True)
 
     def command(self, options: str, more: tuple[str, ...]) -> list[str]:
-        parameters = (f"console={self.processor.console} root=/dev/nvme0n1 loglevel=4 "
+        parameters = (f"console={CHOSEN.console} root=/dev/nvme0n1 loglevel=4 "
                       "systemd.unit=lab.target panic=-1 no_timer_check "
                       f"{'' if ' ro ' in f' {options} ' else 'rw '}{options}")
         disks = [self.root, self.told] + [self.third] * self.third.exists()
-        return [*self.processor.qemu, "-accel", "tcg", "-m", "1024", "-nodefaults",
+        return [*CHOSEN.qemu, "-accel", "tcg", "-m", "1024", "-nodefaults",
                 "-no-reboot", "-display", "none",
                 "-serial", f"file:{self.directory}/console",
-                "-kernel", str(self.processor.kernel), "-append", parameters,
+                "-kernel", str(CHOSEN.kernel), "-append", parameters,
                 "-device", "nvme,id=nvme,serial=lab",
                 *(word for number, disk in enumerate(disks, 1) for word in (
                     "-drive", f"if=none,id=disk{number},format=raw,file={disk}",

@@ -7,13 +7,12 @@ import fcntl
 import os
 import shutil
 import subprocess
-import sys
 from pathlib import Path
 from typing import NamedTuple
 
 from lab.carriers.image import run
 from lab.demo import data
-from lab.doors import package
+from lab.doors import package, say
 from lab.emulator.parts import Unavailable, fetch, on_path
 from lab.places import BUILD, PROJECT
 from lab.systems.foreign import run_with_qemu
@@ -63,49 +62,45 @@ ALL = {each.name: each for each in (
 CHOSEN = ALL[os.environ.get("MARLIN_SYSTEMS", AMD64.name)]
 
 
-def prepare(processor=CHOSEN):
+def prepare():
     """Builds and fetches what is missing; or raises Unavailable."""
     if subprocess.call([PROJECT / "scripts/packages", "build", "demo", "systems",
-                        *processor.packages]):
+                        *CHOSEN.packages]):
         raise Unavailable("packages are missing")
-    on_path(processor.qemu[0])
-    place = processor.place
+    on_path(CHOSEN.qemu[0])
+    place = CHOSEN.place
     place.mkdir(parents=True, exist_ok=True)
     with open(place / "lock", "w", encoding="ascii") as lock:
         fcntl.flock(lock, fcntl.LOCK_EX)
         try:
             if not (place / "packages").is_dir():
-                tell("Fetching a kernel")
-                fetch(place / "packages", processor.architecture, "busybox-static")
+                say("Fetching a kernel")
+                fetch(place / "packages", CHOSEN.architecture, "busybox-static")
             if not (place / "sysvinit").is_dir():
-                tell("Fetching SysV init")
-                fetch(place / "sysvinit", processor.architecture, *SYSVINIT,
+                say("Fetching SysV init")
+                fetch(place / "sysvinit", CHOSEN.architecture, *SYSVINIT,
                       kernel=False)
             if not (place / "root.tar").exists():
-                tell("Making a Debian system, in two minutes or three")
-                make_root(processor)
+                say("Making a Debian system, in two minutes or three")
+                make_root()
         except RuntimeError as reason:
             why = str(reason).strip().splitlines()[-1]
             raise Unavailable("no Debian system can be made here, which takes a mirror "
                               f"of Debian: {why}") from reason
         data.prepare()
-        package(processor.preset, processor.place)
+        package(CHOSEN.preset, CHOSEN.place)
         # In marlin's place it has to have its name.
-        run(processor.compiler, "-static", "-O1", "-Wall", "-o", place / "marlin",
+        run(CHOSEN.compiler, "-static", "-O1", "-Wall", "-o", place / "marlin",
             Path(__file__).with_name("probe.c"))
 
 
-def tell(text: str):
-    print(text, file=sys.stderr, flush=True)
-
-
-def make_root(processor: Processor):
-    made = processor.place / "root.new.tar"
-    make = run_with_qemu if processor is ARM64 and os.geteuid() == 0 else run
+def make_root():
+    made = CHOSEN.place / "root.new.tar"
+    make = run_with_qemu if CHOSEN is ARM64 and os.geteuid() == 0 else run
     make("mmdebstrap", "--quiet", "--variant=essential",
-         f"--architectures={processor.architecture}", f"--include={ROOT_PACKAGES}",
-         "--aptopt=Acquire::Languages \"none\"", *LEFT_OUT, processor.suite, made)
-    made.rename(processor.place / "root.tar")
+         f"--architectures={CHOSEN.architecture}", f"--include={ROOT_PACKAGES}",
+         "--aptopt=Acquire::Languages \"none\"", *LEFT_OUT, CHOSEN.suite, made)
+    made.rename(CHOSEN.place / "root.tar")
 
 
 IMAGE = r"""
@@ -157,14 +152,14 @@ rm -rf "$root"
 """
 
 
-def make_image(processor: Processor, image: Path, script="", apart="",
+def make_image(image: Path, script="", apart="",
                third: Path | None = None, megabytes=32):
     """A system's disk, after a shell did what the script says in its root directory;
     what is below the directory `apart` goes to a disk of its own. In a user namespace:
     whoever runs this owns all, as root."""
-    [package] = processor.place.glob("*.deb")
+    [package] = CHOSEN.place.glob("*.deb")
     run("bwrap", "--unshare-user", "--uid", 0, "--gid", 0, "--dev-bind", "/", "/",
-        "sh", "-euc", IMAGE, "-", processor.place, GUEST, data.TARGET, package, image,
+        "sh", "-euc", IMAGE, "-", CHOSEN.place, GUEST, data.TARGET, package, image,
         script, apart, third or "", megabytes)
 
 

@@ -97,8 +97,8 @@ def test_a_fault_is_seen(name, monkeypatch):
     place = parts.CHOSEN.place / "scenes" / f"broken {name}".replace(" ", "-")
     monkeypatch.setattr(machine, "room", lambda _: parts.room(place))
     monkeypatch.setattr(
-        machine, "make_image", lambda processor, image, script="", **how:
-        parts.make_image(processor, image, change + script, **how))
+        machine, "make_image", lambda image, script="", **how:
+        parts.make_image(image, change + script, **how))
     with pytest.raises((AssertionError, pytest.fail.Exception)) as failed:
         scene()
     report = str(failed.value)
