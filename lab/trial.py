@@ -25,6 +25,13 @@ def fail(what: str, found: list[str], before: Entries):
                     as_device(before).in_words(), pytrace=False)
 
 
+def real(name: str) -> tuple[Device, Entries]:
+    """A chosen device, made real, and how it looks."""
+    device = CHOSEN[name]()
+    namespace.build(device)
+    return device, namespace.look()
+
+
 @functools.cache
 def undisturbed(name: str) -> Seen:
     """An undisturbed boot of a chosen device, with all its calls."""
