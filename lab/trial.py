@@ -6,6 +6,7 @@ from __future__ import annotations
 
 import functools
 import os
+from itertools import zip_longest
 
 import pytest
 
@@ -79,9 +80,6 @@ def expected(device: Device, condition: Condition) -> model.Outcome:
     return outcome
 
 
-# --- Comparing with the model -----------------------------------------------------
-
-
 def differences(device: Device, nodes: dict[str, Node], outcome: model.Outcome,
                 seen: Seen) -> list[str]:
     """Where a boot was not as the model says; `nodes` are the description's as they
@@ -147,16 +145,11 @@ def first_line(text: str) -> str:
 
 def call_differences(outcome: model.Outcome, calls: list[Call]) -> list[str]:
     """Where the calls are not the model's, or other calls failed than were to."""
-    found = []
     made = [(call.name, call.path) for call in calls]
-    for number, (wanted, got) in enumerate(zip(outcome.calls, made), start=1):
+    for number, (wanted, got) in enumerate(zip_longest(outcome.calls, made), start=1):
         if wanted != got:
-            return [f"call {number} is {got}, expected {wanted}"]
-    if len(made) != len(outcome.calls):
-        longer = max(made, outcome.calls, key=len)
-        whose = "unexpected" if longer is made else "missing"
-        found.append(f"{whose} call: {longer[min(len(made), len(outcome.calls))]}")
+            return [f"call {number} is {got or 'missing'}, expected {wanted or 'none'}"]
     injected = [number for number, call in enumerate(calls, start=1) if call.injected]
     if injected != outcome.failed:
-        found.append(f"failed were the calls {injected}, not {outcome.failed}")
-    return found
+        return [f"failed were the calls {injected}, not {outcome.failed}"]
+    return []
