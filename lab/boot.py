@@ -61,8 +61,6 @@ def spawn(command: list[str], descriptors: dict[int, int | None]) -> int:
     return status
 
 
-# --- System calls ----------------------------------------------------------------
-
 TRACE = "/tmp/strace"
 
 # The model's name -> the machine's names for it: on arm64, for one, there is only

@@ -49,8 +49,6 @@ class Mutant(NamedTuple):
     key: str  # in mutants_equivalent.txt
 
 
-# --- Rules -------------------------------------------------------------------
-
 NAMES = """
     true false   false true   begin end   end begin   back front   rfind find
     starts_with ends_with   ends_with starts_with   find_if find_if_not
@@ -183,9 +181,6 @@ def changes(source):
             yield *found.span(1), "return {};"
 
 
-# --- Mutants -----------------------------------------------------------------
-
-
 def by_rule() -> Iterator[Mutant]:
     for path in (path for folder in FOLDERS
                  for path in sorted((PROJECT / folder).glob("*.*"))):
@@ -241,9 +236,6 @@ def reasons() -> dict[str, str]:
         if not reason:
             sys.exit(f"mutants: {path.name} gives no reason for {key}")
     return found
-
-
-# --- Building and testing ----------------------------------------------------
 
 
 def run(seconds: int, *command, file_size="unlimited") -> tuple[bool, str]:

@@ -17,35 +17,33 @@ VERSIONS = ["2024a.1.0", "2024b.1.0", "2023c.1.0", "2023b.1.0", "2022z.1.0"]
 NEIGHBOURS = ["2023z.9.9", "2024a", "2024a.0", "2024a.0.0", "2024a.1", "2024a.1.0",
               "2024a.1.1", "2024a.2.0", "2024a.10", "2024az", "2024b", "2024z",
               "2024za", "2025a"]
-ODD_VERSIONS = [
-    "2024a", "2024a.1", "2024a.1.1", "2024aa.1.0", "2024a.01.0", "02024a.1.0",
-    "2024a.10.0", "2024A.1.0", "2024a.1.0.0", "2024a.", "2024", "a2024", " 2024a",
-    "2024a ", "2024a.1.0.bak", "x", "%s%n%d", "2024a.1.0\n", "2147483647z",
-    "2147483648a", "2024a.99999999999", "2024a.1.2147483648", "2024\xe4.1.0",
-    "2024\xc3\xa4", "...", "-1a", "+2024a", "0a", "1a.0.0", "9" * 250 + "a",
-    "x" * 255, "2024" + "a" * 251]
-ODD_RELEASES = [
-    "2022a", "2024a", "2024b", "2024z", "2023c.1.0", "", "2023C", "version", "2023c,x",
-    "2023c\0", "2147483648a", "9" * 30 + "a", "%s%s%n", "0" * 5000 + "2023c",
-    "9" * 5000 + "a", "2023" + "c" * 5000]
+ODD_VERSIONS = ["2024a", "2024a.1", "2024a.1.1", "2024aa.1.0", "2024a.01.0",
+                "02024a.1.0", "2024a.10.0", "2024A.1.0", "2024a.1.0.0", "2024a.",
+                "2024", "a2024", " 2024a", "2024a ", "2024a.1.0.bak", "x", "%s%n%d",
+                "2024a.1.0\n", "2147483647z", "2147483648a", "2024a.99999999999",
+                "2024a.1.2147483648", "2024\xe4.1.0", "2024\xc3\xa4", "...", "-1a",
+                "+2024a", "0a", "1a.0.0", "9" * 250 + "a", "x" * 255,
+                "2024" + "a" * 251]
+ODD_RELEASES = ["2022a", "2024a", "2024b", "2024z", "2023c.1.0", "", "2023C", "version",
+                "2023c,x", "2023c\0", "2147483648a", "9" * 30 + "a", "%s%s%n",
+                "0" * 5000 + "2023c", "9" * 5000 + "a", "2023" + "c" * 5000]
 ODD_SCHEMAS = ["45l", "44b", "44e", "044l", "0l", "9999999999999999999999l"]
 ODD_FORMATS = ["", "44L", "l", "44", "icutz44l.dat", "44l\0", "44l,", "4" * 5000 + "l"]
 ODD_SPACES = ["", " ", "\n\n\n", "\t", "\v", "\f", "\r\n", " x", "\0", "\x85", "\xa0",
               " " * 5000]
 ODD_MODES = [0o700, 0o555, 0o311, 0o444, 0o644, 0o000, 0o077, 0o2755]
 ODD_FILE_MODES = [0o600, 0o444, 0o200, 0o000, 0o004, 0o640]
-DATA_NAMES = [
-    "readme", "icutz44L.dat", "icutzl.dat", "icutz44x.dat", "xicutz44l.dat",
-    "icutz44l.dat.bak", "icutz44ldat", "icutz44l.dat\n", "ICUTZ44l.dat",
-    "icutz44ll.dat", "icutz-44l.dat", "icutz44l_dat", "icutz 44l.dat", "icutz",
-    "icutz44l.DAT", "icutz4\xe44l.dat", ".icutz44l.dat", "zone.tab"]
+DATA_NAMES = ["readme", "icutz44L.dat", "icutzl.dat", "icutz44x.dat", "xicutz44l.dat",
+              "icutz44l.dat.bak", "icutz44ldat", "icutz44l.dat\n", "ICUTZ44l.dat",
+              "icutz44ll.dat", "icutz-44l.dat", "icutz44l_dat", "icutz 44l.dat",
+              "icutz", "icutz44l.DAT", "icutz4\xe44l.dat", ".icutz44l.dat", "zone.tab"]
 
 # Targets of links. One with a "*" is a target for each version.
 ROOT = f"{TIMEZONE}/tz"
 ZONEINFO_TARGETS = [
     SYSTEM_ZONEINFO, f"{SYSTEM_ZONEINFO}/", "/usr/share/zoneinfo", "/",
-    "/usr/share//zoneinfo.default", ROOT, f"{ROOT}/", f"{ROOT}//zoneinfo",
-    f"{ROOT}/x/", f"{ROOT}/a/b/zoneinfo", f"{ROOT}/gone.1/zoneinfo",
+    "/usr/share//zoneinfo.default", ROOT, f"{ROOT}/", f"{ROOT}//zoneinfo", f"{ROOT}/x/",
+    f"{ROOT}/a/b/zoneinfo", f"{ROOT}/gone.1/zoneinfo",
     f"{ROOT}/../../../../usr/share/zoneinfo.default",
     f"{TIMEZONE}/TZ/2024a.1.0/zoneinfo", "zoneinfo", ZONEINFO, LOCALTIME,
     f"{ROOT}/{'y' * 990}/zoneinfo", f"{ROOT}/{'y/' * 600}", "x" * 1024,
@@ -53,16 +51,16 @@ ZONEINFO_TARGETS = [
     f"{ROOT}/*/zoneinfo/", f"{ROOT}/*", f"{ROOT}/*/", f"{ROOT}/*/other",
     f"{ROOT}/*//zoneinfo", f"{ROOT}/*/icutz", f"{ROOT}/*/./zoneinfo", "tz/*/zoneinfo",
     f"{ROOT}/./*/zoneinfo", f"{ROOT}//*/zoneinfo"]
-ICU_TARGETS = [
-    SYSTEM_ICU, "/nowhere", "timezone/tz", "tz", "icutz", ICUTZ, LEGACY_ICUTZ, OLD_ICU,
-    ZONEINFO, LOCALTIME, "/var/db", ".", "x" * 1023, "/usr/share/" + "./" * 500,
-    "/" * 1100, "/" * 4095, f"{ROOT}/*/icutz", "tz/*/icutz", "timezone/tz/*/icutz"]
-ANNOUNCEMENTS = [
-    "x", "/", f"{ROOT}/", ROOT, f"{ROOT}/x", f"{ROOT}/gone", f"{ROOT}/\n",
-    SYSTEM_ZONEINFO, "/var/db/Timezone/tz/2024a.1.0", ZONEINFO, "%s", TZ_LATEST,
-    f"{ROOT}/9999z.1.0", f"{ROOT}/{'y' * 1100}", f"{ROOT}/../../../../usr/share",
-    f"{ROOT}/*", f"{ROOT}/*/", f"{ROOT}/*/zoneinfo", "tz/*", f"{ROOT}/./*",
-    f"{ROOT}//*", f"{ROOT}/*/../x", f"{ROOT}/*".upper(), f" {ROOT}/*"]
+ICU_TARGETS = [SYSTEM_ICU, "/nowhere", "timezone/tz", "tz", "icutz", ICUTZ,
+               LEGACY_ICUTZ, OLD_ICU, ZONEINFO, LOCALTIME, "/var/db", ".", "x" * 1023,
+               "/usr/share/" + "./" * 500, "/" * 1100, "/" * 4095, f"{ROOT}/*/icutz",
+               "tz/*/icutz", "timezone/tz/*/icutz"]
+ANNOUNCEMENTS = ["x", "/", f"{ROOT}/", ROOT, f"{ROOT}/x", f"{ROOT}/gone", f"{ROOT}/\n",
+                 SYSTEM_ZONEINFO, "/var/db/Timezone/tz/2024a.1.0", ZONEINFO, "%s",
+                 TZ_LATEST, f"{ROOT}/9999z.1.0", f"{ROOT}/{'y' * 1100}",
+                 f"{ROOT}/../../../../usr/share", f"{ROOT}/*", f"{ROOT}/*/",
+                 f"{ROOT}/*/zoneinfo", "tz/*", f"{ROOT}/./*", f"{ROOT}//*",
+                 f"{ROOT}/*/../x", f"{ROOT}/*".upper(), f" {ROOT}/*"]
 LOCALTIME_TARGETS = [
     ZONEINFO, f"{ZONEINFO}/", f"{ZONEINFO}/Europe/Paris", f"{ZONEINFO}/Nowhere",
     f"{ZONEINFO}x", ZONEINFO[:-1], "/usr/share/zoneinfo", "/usr/share/zoneinfo/",

@@ -28,8 +28,6 @@ from lab.trial import entry_differences, fail, real, trial, undisturbed
 # reset, though older than the system's data, is reset once more.
 BOOTS_TO_SETTLE = 3
 
-# --- The windows -----------------------------------------------------------------
-
 
 class Window(NamedTuple):
     """From which the next boots do not fully recover. It is open after a kill between
@@ -83,8 +81,6 @@ def window_of(path, left, usual, carried_out):
                 return window.name
     return None
 
-
-# --- Every kill --------------------------------------------------------------------
 
 CHANGES = ("symlink", "unlink", "rmdir", "create", "write")
 

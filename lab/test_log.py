@@ -47,10 +47,9 @@ LOST_LOGS = {
     "pipe without reader": lambda: {2: pipe_without_reader()},
     "file to read": lambda: {2: os.open("/dev/null", os.O_RDONLY)},
     "pipe that takes no more": lambda: {2: pipe_that_takes_no_more()},
-}
-LOST_LOGS |= {
-    "closed " + " and ".join(map(str, closed)): functools.partial(dict.fromkeys, closed)
-    for number in (1, 2, 3) for closed in itertools.combinations(range(3), number)}
+    **{"closed " + " and ".join(map(str, closed)):
+       functools.partial(dict.fromkeys, closed)
+       for number in (1, 2, 3) for closed in itertools.combinations(range(3), number)}}
 
 TAKEN = 5  # bytes, of a line of which only a part is taken
 
@@ -128,9 +127,8 @@ def test_a_log_that_fails_in_the_middle(name, what, options, hit, left):
     failure."""
     device, before = real(name)
     record_is_lost = any(call.name == "write" for call in hit)
-    outcome = model.boot(
-        device, lambda number, call, path:
-        EIO if call == "write" and record_is_lost else None)
+    outcome = model.boot(device, lambda number, call, path: (
+        EIO if call == "write" and record_is_lost else None))
     booted = boot.traced(*options)
     found = entry_differences(device, namespace.look())
     if booted.ending != outcome.ending:
