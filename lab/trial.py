@@ -66,16 +66,9 @@ def trial(device: Device, condition: Condition | None = None,
 
 def expected(device: Device, condition: Condition) -> model.Outcome:
     """The model's boot; its `failed` are the numbers of the calls that failed."""
-    failed = []
-
-    def noted_fault(number, name, path):
-        error = condition.fault(number, name, path)
-        if error is not None:
-            failed.append(number)
-        return error
-
-    outcome = model.boot(device, noted_fault, condition.killed_before)
-    outcome.failed = failed
+    outcome = model.boot(device, condition.fault, condition.killed_before)
+    outcome.failed = [number for number, call in enumerate(outcome.calls, start=1)
+                      if condition.fault(number, *call) is not None]
     condition.amend(device, outcome)
     return outcome
 
