@@ -21,11 +21,11 @@ build/mutants.
 """
 
 import os
-import queue
 import random
 import re
 import subprocess
 import sys
+import threading
 import time
 from collections import Counter
 from collections.abc import Iterator
@@ -61,15 +61,12 @@ NAMES = """
     SIG_IGN SIG_DFL   SIGPIPE SIGHUP   _IOLBF _IONBF   fsutil::remove std::remove
     std::remove ::unlink   make_shared<mln_icu> make_shared<mln_zoneinfo>
 """.split()
-OPERATORS = {
-    "==": ["!="], "!=": ["=="], "<": ["<=", ">"], ">": [">=", "<"],
-    "<=": ["<", ">"], ">=": [">", "<"], "&&": ["||"], "||": ["&&"],
-    "+": ["-"], "-": ["+"], "+=": ["-=", "="], "&": ["|"],
-}
+OPERATORS = {"==": "!=", "!=": "==", "<": "<= >", ">": ">= <", "<=": "< >", ">=": "> <",
+             "&&": "||", "||": "&&", "+": "-", "-": "+", "+=": "-= =", "&": "|"}
 REPLACED = [  # what stands in the group of a pattern, and by what
     *((rf"(?<![\w:])({name})(?![\w<>:])", [other])
       for name, other in zip(NAMES[::2], NAMES[1::2])),
-    *((rf"(?<= )({re.escape(operator)})(?= |\n)", others)
+    *((rf"(?<= )({re.escape(operator)})(?= |\n)", others.split())
       for operator, others in OPERATORS.items()),
     (r"(?<![\w!])(!)(?=[\w(:])", [""]), (r"catch \((\.\.\.)\)", ["char", "int"])]
 STATEMENT = re.compile(
@@ -333,20 +330,14 @@ class Tree:
 
 
 def fates(trees: list[Tree], mutants: list[Mutant]) -> Iterator[tuple[Mutant, str]]:
-    """Every mutant with its fate."""
-    free = queue.SimpleQueue()
-    for tree in trees:
-        free.put(tree)
+    """Every mutant with its fate. Each worker has a tree of its own."""
+    own = threading.local()
 
-    def work(mutant):
-        tree = free.get()
-        try:
-            return mutant, tree.fate_of(mutant)
-        finally:
-            free.put(tree)
+    def take_a_tree():
+        own.tree = trees.pop()
 
-    with ThreadPoolExecutor(len(trees)) as pool:
-        yield from pool.map(work, mutants)
+    with ThreadPoolExecutor(len(trees), initializer=take_a_tree) as pool:
+        yield from pool.map(lambda mutant: (mutant, own.tree.fate_of(mutant)), mutants)
 
 
 def figures(counts: Counter) -> str:
