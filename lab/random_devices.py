@@ -113,34 +113,23 @@ class Composer:
         if not self.odd():
             return device.file(path, content)
         return self.any([
-            lambda: None,
             lambda: device.file(path, content, self.any(ODD_FILE_MODES)),
             lambda: device.file(path, ""),
             lambda: device.file(path, "x" * self.any([4095, 4096, 4097, 20000])),
             lambda: device.file(path, " " * self.any([4095, 4096, 8192]) + content),
             lambda: device.file(path, content.strip().rjust(4096) + "\n" + content),
-            lambda: device.directory(path),
-            lambda: device.fifo(path),
-            lambda: device.socket(path),
-            lambda: device.link(path, self.any(["gone", path, ".", "/var/db"])),
             lambda: (device.file(f"{path}.real", content),
                      device.link(path, f"{path}.real")),
-        ])()
+            *[lambda: self.stand_in(path, ["gone", path, ".", "/var/db"])] * 4])()
 
     def directory(self, path):
         """Makes the directory for what a path leads to: there or, behind something
         else that stands there, beside it. Returns where."""
-        device, real = self.device, f"{path}.real"
         if self.odd():
-            self.any([
-                lambda: None,
-                lambda: device.file(path, "x"),
-                lambda: device.fifo(path),
-                lambda: device.link(path, self.any(["gone", path])),
-                lambda: device.link(path, self.any([real, os.path.basename(real)])),
-            ])()
+            real = f"{path}.real"
+            self.stand_in(path, ["gone", path, real, os.path.basename(real)])
             path = real
-        device.directory(path)
+        self.device.directory(path)
         return path
 
     def tree(self, path):
@@ -174,9 +163,7 @@ class Composer:
         self.of(lambda: device.file(path, "ICU"), [
             lambda: device.file(path, "ICU", self.any(ODD_FILE_MODES)),
             lambda: device.file(f"{path}/icutz44l.dat", "ICU"),
-            lambda: device.link(path, self.any(["icutz44l.dat", "gone", ".", "/"])),
-            lambda: device.fifo(path),
-            lambda: None])()
+            *[lambda: self.stand_in(path, ["icutz44l.dat", "gone", ".", "/"])] * 2])()
 
     def system(self):
         self.tree(SYSTEM_ZONEINFO)
@@ -228,11 +215,15 @@ class Composer:
 
     def place(self, path, usual, targets):
         """A link to a usual target, if any, or whatever can stand in its place."""
+        if self.odd():
+            self.device.drop(path)
+            self.stand_in(path, targets)
+        elif usual:
+            self.device.link(path, usual)
+
+    def stand_in(self, path, targets):
         device = self.device
-        if not self.odd():
-            return usual and device.link(path, usual)
-        device.drop(path)
-        return self.any([
+        self.any([
             *[lambda: device.link(path, self.target(targets))] * 8,
             *[lambda: None] * 2,
             lambda: device.file(path, "x" * 100, self.of(0o644, ODD_FILE_MODES)),
@@ -264,5 +255,4 @@ class Composer:
                 lambda: device.file(TIMEZONE, "x"),
                 lambda: device.link(TIMEZONE, "gone"),
                 lambda: (device.put("/var/db/moved", whole),
-                         device.link(TIMEZONE, "moved")),
-            ])()
+                         device.link(TIMEZONE, "moved"))])()
