@@ -24,11 +24,9 @@ class Booted(NamedTuple):
 
 
 def ending_of(status: int) -> str:
-    if os.WIFEXITED(status):
-        return f"exit {os.WEXITSTATUS(status)}"
-    number = os.WTERMSIG(status)
-    return {signal.SIGABRT: "abort", signal.SIGKILL: "killed"}.get(
-        number, f"signal {number}")
+    code = os.waitstatus_to_exitcode(status)
+    return {-signal.SIGABRT: "abort", -signal.SIGKILL: "killed"}.get(
+        code, f"exit {code}" if code >= 0 else f"signal {-code}")
 
 
 def boot() -> Booted:
@@ -63,40 +61,24 @@ def spawn(command: list[str], descriptors: dict[int, int | None]) -> int:
     return status
 
 
-# --- System calls ----------------------------------------------------------------
-
 TRACE = "/tmp/strace"
 
 # The model's name -> the machine's names for it: on arm64, for one, there is only
 # unlinkat for unlink and rmdir. What depends on arguments is in `name_and_path`.
 FAMILIES = {
-    "access": "access faccessat faccessat2",
-    "readlink": "readlink readlinkat",
-    "symlink": "symlink symlinkat",
-    "unlink": "unlink unlinkat",
-    "rmdir": "rmdir",
-    "open": "open openat",
-    "read": "read readv preadv pread64",
-    "write": "write writev pwrite64",
-    "close": "close",
-    "fchdir": "fchdir",
-    "getdents": "getdents64",
-    "stat": "stat newfstatat fstatat64 statx",
-    "lstat": "lstat",
-    "fstat": "fstat",
+    "access": "access faccessat faccessat2", "readlink": "readlink readlinkat",
+    "symlink": "symlink symlinkat", "unlink": "unlink unlinkat", "rmdir": "rmdir",
+    "open": "open openat", "read": "read readv preadv pread64",
+    "write": "write writev pwrite64", "close": "close", "fchdir": "fchdir",
+    "getdents": "getdents64", "stat": "stat newfstatat fstatat64 statx",
+    "lstat": "lstat", "fstat": "fstat",
     # Never seen in a boot, but to be noticed.
-    "create": "creat",
-    "mkdir": "mkdir mkdirat",
-    "rename": "rename renameat renameat2",
-    "link": "link linkat",
-    "chmod": "chmod fchmod fchmodat",
-    "truncate": "truncate ftruncate",
-    "fsync": "fsync fdatasync sync syncfs",
-    "mknod": "mknod mknodat",
-    "chown": "chown lchown fchown fchownat",
+    "create": "creat", "mkdir": "mkdir mkdirat", "rename": "rename renameat renameat2",
+    "link": "link linkat", "chmod": "chmod fchmod fchmodat",
+    "truncate": "truncate ftruncate", "fsync": "fsync fdatasync sync syncfs",
+    "mknod": "mknod mknodat", "chown": "chown lchown fchown fchownat",
     "statfs": "statfs fstatfs",
-    **{name: name for name in
-       "chdir lseek fcntl flock ioctl utimensat umask".split()},
+    **{name: name for name in "chdir lseek fcntl flock ioctl utimensat umask".split()},
 }
 NAMES = {call: name for name, calls in FAMILIES.items() for call in calls.split()}
 TRACED = ",".join("?" + call for call in NAMES)
@@ -139,9 +121,8 @@ def calls() -> Iterator[Call]:
 def name_and_path(call, arguments):
     name = NAMES.get(call, call)
     # Paths stand in full; of other texts nothing does.
-    paths = [unescaped(text) for text in
-             re.findall(r'"((?:[^"\\]|\\.)*)"(?!\.\.\.)', arguments)]
-    path = paths[-1] if paths else None
+    texts = re.findall(r'"((?:[^"\\]|\\.)*)"(?!\.\.\.)', arguments)
+    path = texts[-1].encode("latin-1").decode("unicode_escape") if texts else None
     if name == "unlink" and "AT_REMOVEDIR" in arguments:
         name = "rmdir"
     elif name == "stat" and "AT_EMPTY_PATH" in arguments:
@@ -153,14 +134,6 @@ def name_and_path(call, arguments):
     elif name == "write" and re.match(r"[12], ", arguments):
         name = "print"
     return name, path if name in WITH_PATH else None
-
-
-def unescaped(text):
-    plain = {"n": "\n", "t": "\t", "v": "\v", "f": "\f", "r": "\r"}
-    return re.sub(
-        r"\\([0-7]{1,3}|.)", lambda match:
-        chr(int(match[1], 8)) if match[1][0] in "01234567" else plain.get(
-            match[1], match[1]), text)
 
 
 def pass_of(all_calls: list[Call]) -> list[Call]:

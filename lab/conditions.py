@@ -38,58 +38,48 @@ def described(number: int, call: Call) -> str:
     return f"call {number}, {call.name} {call.path or ''}".rstrip()
 
 
-class Fails(Condition):
-    """One call fails, once."""
+# What the model calls by several names and the machine by one.
+SHARED = {"openat": {"open", "create"}, "open": {"open", "create"},
+          "unlinkat": {"unlink", "rmdir"}, **dict.fromkeys(
+              ["newfstatat", "fstatat64", "statx"], {"stat", "lstat", "fstat"})}
 
-    def __init__(self, number: int, call: Call, error: int):
+
+class Fails(Condition):
+    """One call fails; for good: so does every later one of the machine's name."""
+
+    def __init__(self, number: int, call: Call, error: int, for_good=False):
         self.number, self.call, self.error = number, call, error
         self.name = f"{described(number, call)} fails with {errorcode[error]}"
+        self.when, self.later = f"{call.number}", set()
+        if for_good:
+            self.name += ", as do all of its kind that follow"
+            self.when += "+"
+            self.later = SHARED.get(call.call, {boot.NAMES[call.call]})
 
     def options(self, outcome):
-        return boot.failing(self.call.call, self.error, self.call.number)
+        return boot.failing(self.call.call, self.error, self.when)
 
     def fault(self, number, name, path):
-        return self.error if number == self.number else None
+        fails = number == self.number or number > self.number and name in self.later
+        return self.error if fails else None
 
 
-class FailsForGood(Fails):
-    """One call fails, and every later one of the same machine's name."""
-
-    def __init__(self, number: int, call: Call, error: int):
-        super().__init__(number, call, error)
-        self.name += ", as do all of its kind that follow"
-        self.names = {
-            "openat": {"open", "create"}, "open": {"open", "create"},
-            "unlinkat": {"unlink", "rmdir"},
-            "newfstatat": {"stat", "lstat", "fstat"},
-            "fstatat64": {"stat", "lstat", "fstat"},
-            "statx": {"stat", "lstat", "fstat"},
-        }.get(call.call, {boot.NAMES[call.call]})
-
-    def options(self, outcome):
-        return boot.failing(self.call.call, self.error, f"{self.call.number}+")
-
-    def fault(self, number, name, path):
-        later = number >= self.number and name in self.names
-        return self.error if later else None
-
-
-class Storage(Condition):
+class Storage(Fails):
     """The file system changes for good: calls of several kinds fail from then on."""
 
     def __init__(self, number: int, undisturbed: list[Call], kind: str, error: int,
                  names: set[str]):
         self.number, self.undisturbed = number, undisturbed
-        self.error, self.names = error, names
+        self.error, self.later = error, names
         self.name = f"{kind} before {described(number, undisturbed[number - 1])}"
 
     def options(self, outcome):
         found = []
-        so_far = self.undisturbed[:self.number - 1]
+        so_far = [call.call for call in self.undisturbed[:self.number - 1]]
         for machine, name in boot.NAMES.items():
-            if name in self.names & {"symlink", "unlink", "rmdir"}:
-                made = sum(call.call == machine for call in so_far)
-                found += boot.failing(machine, self.error, f"{made + 1}+")
+            if name in self.later & {"symlink", "unlink", "rmdir"}:
+                found += boot.failing(machine, self.error,
+                                      f"{so_far.count(machine) + 1}+")
         # The record's calls share their names with harmless ones. But there is one
         # of each, and only where nothing has failed before.
         for failed in outcome.failed:
@@ -97,10 +87,6 @@ class Storage(Condition):
                 same = self.undisturbed[failed - 1]
                 found += boot.failing(same.call, self.error, same.number)
         return found
-
-    def fault(self, number, name, path):
-        later = number >= self.number and name in self.names
-        return self.error if later else None
 
 
 def storage_conditions(device: Device, undisturbed: list[Call]):

@@ -9,6 +9,7 @@ from __future__ import annotations
 
 import os
 from collections.abc import Iterator
+from dataclasses import dataclass
 from errno import EACCES, ELOOP, ENAMETOOLONG, ENOENT, ENOTDIR
 
 from lab.paths import (ICUTZ, LOCALTIME, PLACES, SYSTEM_ICU, SYSTEM_ZONEINFO, TIMEZONE,
@@ -28,14 +29,13 @@ def failure(number: int) -> OSError:
     return OSError(number, os.strerror(number))
 
 
+@dataclass(eq=False)
 class Node:
-    """Whatever can stand at a path. `kind`: dir, file, link, fifo, socket, device."""
-
-    def __init__(self, kind: str, mode=0o777, text="", entries=None):
-        self.kind = kind
-        self.mode = mode  # of a link: without meaning
-        self.text = text  # a file's content, a link's target
-        self.entries = entries  # a directory's, by name, in listing order
+    """Whatever can stand at a path."""
+    kind: str  # dir, file, link, fifo, socket or device
+    mode: int = 0o777  # of a link: without meaning
+    text: str = ""  # a file's content, a link's target
+    entries: dict[str, Node] | None = None  # a directory's, in listing order
 
     def permits(self, wanted: int) -> bool:
         """Whether the owner, which the program runs as, may: 4, 2, 1 or sums."""
@@ -153,8 +153,7 @@ class Device:
         """A line for every entry that is no empty directory above others."""
         return "\n".join(f"{path}: {described(node)}"
                          for path, node in self.everything()
-                         if not (node.kind == "dir" and node.entries
-                                 and node.mode == 0o755))
+                         if not (node.entries and node.mode == 0o755))
 
     def walk(self, path: str, follow: bool) -> tuple[Node, str, Node | None]:
         """What the kernel finds at a path: (directory, name, node), the node None
@@ -202,15 +201,13 @@ class Device:
 
 def described(entry) -> str:
     """A node, or an entry that was seen, in words."""
-    text = entry.text if len(entry.text) < 300 else (
-        f"{entry.text[:100]!r}... of {len(entry.text)} bytes, hash {hash(entry.text)}")
+    mode, text = f"{entry.mode:04o}", entry.text
+    if len(text) >= 300:
+        text = f"{text[:100]!r}... of {len(text)} bytes, hash {hash(text)}"
     return {
-        "dir": f"a directory, mode {entry.mode:04o}",
-        "file": f"a file, mode {entry.mode:04o}, {text!r}",
-        "link": f"a link to {text!r}",
-        "fifo": f"a FIFO, mode {entry.mode:04o}",
-        "socket": f"a socket, mode {entry.mode:04o}"
-    }.get(entry.kind, entry.kind)
+        "dir": f"a directory, mode {mode}", "file": f"a file, mode {mode}, {text!r}",
+        "link": f"a link to {text!r}", "fifo": f"a FIFO, mode {mode}",
+        "socket": f"a socket, mode {mode}"}.get(entry.kind, entry.kind)
 
 
 def sound_device() -> Device:

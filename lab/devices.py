@@ -42,9 +42,6 @@ def activation(current: str | None = None, update="2024a.1.0") -> Device:
     return device
 
 
-# --- Boots that end well ------------------------------------------------------
-
-
 @chosen()
 def nothing_to_do(device):
     """The links are right, and nothing is announced."""
@@ -187,9 +184,6 @@ def long_version_file(device):
     """A word that ends where a read does, and a format without a line end."""
     device.file(f"{SYSTEM_ZONEINFO}/+VERSION", "2023c".rjust(4096) + "\n" + "x" * 5000)
     device.file(f"{SYSTEM_ICU}/icutzformat.txt", "44l")
-
-
-# --- Boots that end abnormally, as they have to -------------------------------
 
 
 @chosen(abnormal=True)

@@ -22,14 +22,9 @@ from lab.places import BUILD, PROJECT
 PLACE = BUILD / "fuzz"
 TARGETS = ["version_text", "icu_file_name", "zoneinfo_link", "first_word", "mounts"]
 
-# The format is told in the first line of every file; tests/fuzz/replay.cpp reads
-# it too.
-FORMAT = (r"# One seed a line, between the outer quotes. \\ and \n as in C; any other"
-          r" byte that" "\n"
-          r"# is not printable ASCII is \x and two digits. Sorted; lab/fuzz.py --keep"
-          r" adds to it." "\n")
 
-
+# The format of seeds is told at the head of each file; tests/fuzz/replay.cpp reads it
+# too.
 def escaped(seed: bytes) -> str:
     text = seed.decode("latin-1").replace("\\", r"\\").replace("\n", r"\n")
     return '"' + re.sub("[^ -~]", lambda byte: f"\\x{ord(byte[0]):02x}", text) + '"'
@@ -45,23 +40,14 @@ def seeds_file(target: str) -> Path:
     return PROJECT / "tests/fuzz" / f"{target}.seeds"
 
 
-def read_seeds(target: str) -> list[bytes]:
-    lines = seeds_file(target).read_text("ascii").splitlines()
-    return [unescaped(line) for line in lines if not line.startswith("#")]
-
-
-def write_seeds(target: str, seeds: set[bytes]) -> None:
-    lines = [escaped(seed) + "\n" for seed in sorted(seeds)]
-    seeds_file(target).write_text(FORMAT + "".join(lines), "ascii")
-
-
 def unpack_seeds(target: str) -> Path:
     """The directory that the engine reads: a file for each seed."""
     directory = PLACE / "seeds" / target
     shutil.rmtree(directory, ignore_errors=True)
     directory.mkdir(parents=True)
-    for index, seed in enumerate(read_seeds(target)):
-        (directory / f"{index:04}").write_bytes(seed)
+    for index, line in enumerate(seeds_file(target).read_text("ascii").splitlines()):
+        if not line.startswith("#"):
+            (directory / f"{index:04}").write_bytes(unescaped(line))
     return directory
 
 
@@ -98,7 +84,10 @@ def keep(target: str) -> None:
     if not merged:
         stop(1, f"{target}: the seeds cannot be merged")
     seeds = {path.read_bytes() for path in directory.iterdir()}
-    write_seeds(target, seeds)
+    file = seeds_file(target)
+    head = re.match("(?:#.*\n)*", file.read_text("ascii"))[0]
+    lines = [escaped(seed) + "\n" for seed in sorted(seeds)]
+    file.write_text(head + "".join(lines), "ascii")
     print(f"fuzz: {target}: {len(seeds)} seeds, {sum(map(len, seeds))} bytes")
 
 

@@ -21,11 +21,11 @@ build/mutants.
 """
 
 import os
-import queue
 import random
 import re
 import subprocess
 import sys
+import threading
 import time
 from collections import Counter
 from collections.abc import Iterator
@@ -49,27 +49,26 @@ class Mutant(NamedTuple):
     key: str  # in mutants_equivalent.txt
 
 
-# --- Rules -------------------------------------------------------------------
-
 NAMES = """
     true false   false true   begin end   end begin   back front   rfind find
     starts_with ends_with   ends_with starts_with   find_if find_if_not
-    find_if_not find_if   remove_prefix remove_suffix
-    remove_suffix remove_prefix   is_digit is_letter   is_letter is_digit
-    major minor   minor major   from to   legacy present   present legacy
-    system current   current system   latest current   update current
-    active current   corrected target   ENOENT ENOTDIR   F_OK R_OK
+    find_if_not find_if   remove_prefix remove_suffix   remove_suffix remove_prefix
+    is_digit is_letter   is_letter is_digit   major minor   minor major   from to
+    legacy present   present legacy   system current   current system   latest current
+    update current   active current   corrected target   ENOENT ENOTDIR   F_OK R_OK
     S_ISREG S_ISCHR   S_IROTH S_IRGRP   O_RDONLY O_RDWR   O_WRONLY O_RDWR
-    FTS_F FTS_SL   FTS_D FTS_DP   FTS_SKIP FTS_AGAIN
-    FTS_PHYSICAL FTS_LOGICAL   SIG_IGN SIG_DFL   SIGPIPE SIGHUP
-    _IOLBF _IONBF   fsutil::remove std::remove   std::remove ::unlink
-    make_shared<mln_icu> make_shared<mln_zoneinfo>
+    FTS_F FTS_SL   FTS_D FTS_DP   FTS_SKIP FTS_AGAIN   FTS_PHYSICAL FTS_LOGICAL
+    SIG_IGN SIG_DFL   SIGPIPE SIGHUP   _IOLBF _IONBF   fsutil::remove std::remove
+    std::remove ::unlink   make_shared<mln_icu> make_shared<mln_zoneinfo>
 """.split()
-OPERATORS = {
-    "==": ["!="], "!=": ["=="], "<": ["<=", ">"], ">": [">=", "<"],
-    "<=": ["<", ">"], ">=": [">", "<"], "&&": ["||"], "||": ["&&"],
-    "+": ["-"], "-": ["+"], "+=": ["-=", "="], "&": ["|"],
-}
+OPERATORS = {"==": "!=", "!=": "==", "<": "<= >", ">": ">= <", "<=": "< >", ">=": "> <",
+             "&&": "||", "||": "&&", "+": "-", "-": "+", "+=": "-= =", "&": "|"}
+REPLACED = [  # what stands in the group of a pattern, and by what
+    *((rf"(?<![\w:])({name})(?![\w<>:])", [other])
+      for name, other in zip(NAMES[::2], NAMES[1::2])),
+    *((rf"(?<= )({re.escape(operator)})(?= |\n)", others.split())
+      for operator, others in OPERATORS.items()),
+    (r"(?<![\w!])(!)(?=[\w(:])", [""]), (r"catch \((\.\.\.)\)", ["char", "int"])]
 STATEMENT = re.compile(
     r"(?:(?<=[;{})])|(?<=else))\s+"
     r"((?:throw|return)\b[^;{}]*;|[*\w:.>[\]-]+(?:\(| \+?= )[^;]*;)")
@@ -139,23 +138,15 @@ def changes(source):
         for other in {number + 1, abs(number - 1)}:
             yield *found.span(), f"0{other:o}" if octal else str(other)
 
-    for name, other in zip(NAMES[::2], NAMES[1::2]):  # names
-        for found in re.finditer(rf"(?<![\w:]){name}(?![\w<>:])", code):
-            yield *found.span(), other
+    for pattern, others in REPLACED:
+        for found in re.finditer(pattern, code):
+            for other in others:
+                yield *found.span(1), other
     paths = (PROJECT / "support/paths.h").read_text()
     places = re.findall(r"char (\w+)\[\] =", paths)
     for found in re.finditer(r"paths::(\w+)", code):
         if found[1] in places:
             yield *found.span(1), places[places.index(found[1]) - 1]
-    for found in re.finditer(r"catch \((\.\.\.)\)", code):  # handlers
-        yield *found.span(1), "char"
-        yield *found.span(1), "int"
-
-    for found in re.finditer(r"(?<= )(\W{1,2})(?= |\n)", code):  # operators
-        for other in OPERATORS.get(found[1], []):
-            yield *found.span(), other
-    for found in re.finditer(r"(?<![\w!])!(?=[\w(:])", code):
-        yield *found.span(), ""
     for found in re.finditer(r" (&&|\|\||[|+])\s+", code):  # operands
         yield operand_before(code, found.start()), found.end(), ""
         yield found.start(), operand_after(code, found.end()), ""
@@ -185,9 +176,6 @@ def changes(source):
             yield *found.span(1), "throw 0;"
         if re.match(r"return (?!{|0;|false;|std::nullopt;)", found[1]):
             yield *found.span(1), "return {};"
-
-
-# --- Mutants -----------------------------------------------------------------
 
 
 def by_rule() -> Iterator[Mutant]:
@@ -240,20 +228,11 @@ def by_hand() -> Iterator[Mutant]:
 def reasons() -> dict[str, str]:
     """The mutants that are explained: a line each, then the reason, indented."""
     path = Path(__file__).with_name("mutants_equivalent.txt")
-    found, key = {}, ""
-    for line in path.read_text().splitlines():
-        if line.startswith(" ") and key:
-            found[key] += line
-        elif line and not line.startswith("#"):
-            key = line
-            found[key] = ""
+    found = dict(re.findall(r"^([^ #\n].*)\n((?: .*\n)*)", path.read_text(), re.M))
     for key, reason in found.items():
         if not reason:
             sys.exit(f"mutants: {path.name} gives no reason for {key}")
     return found
-
-
-# --- Building and testing ----------------------------------------------------
 
 
 def run(seconds: int, *command, file_size="unlimited") -> tuple[bool, str]:
@@ -282,10 +261,8 @@ class Tree:
         if not (self.root / "build/build.ninja").exists():
             subprocess.run(
                 ["cmake", "-S", self.root, "-B", self.root / "build", "-G", "Ninja",
-                 "-DBUILD_TESTING=ON", "-DMARLIN_TOOLS=OFF",
-                 "-DCMAKE_BUILD_TYPE=None",
-                 "-DCMAKE_CXX_FLAGS=-O0 -w "
-                 "-D_GLIBCXX_ASSERTIONS -fsanitize=return",
+                 "-DBUILD_TESTING=ON", "-DMARLIN_TOOLS=OFF", "-DCMAKE_BUILD_TYPE=None",
+                 "-DCMAKE_CXX_FLAGS=-O0 -w -D_GLIBCXX_ASSERTIONS -fsanitize=return",
                  "-DCMAKE_GTEST_DISCOVER_TESTS_DISCOVERY_MODE=PRE_TEST"],
                 check=True, stdout=subprocess.DEVNULL)
         built, output = self.build("all")
@@ -353,20 +330,14 @@ class Tree:
 
 
 def fates(trees: list[Tree], mutants: list[Mutant]) -> Iterator[tuple[Mutant, str]]:
-    """Every mutant with its fate."""
-    free = queue.SimpleQueue()
-    for tree in trees:
-        free.put(tree)
+    """Every mutant with its fate. Each worker has a tree of its own."""
+    own = threading.local()
 
-    def work(mutant):
-        tree = free.get()
-        try:
-            return mutant, tree.fate_of(mutant)
-        finally:
-            free.put(tree)
+    def take_a_tree():
+        own.tree = trees.pop()
 
-    with ThreadPoolExecutor(len(trees)) as pool:
-        yield from pool.map(work, mutants)
+    with ThreadPoolExecutor(len(trees), initializer=take_a_tree) as pool:
+        yield from pool.map(lambda mutant: (mutant, own.tree.fate_of(mutant)), mutants)
 
 
 def figures(counts: Counter) -> str:

@@ -15,8 +15,8 @@ import os
 import re
 import shutil
 from collections.abc import Callable
+from dataclasses import dataclass
 from pathlib import Path
-from typing import NamedTuple
 
 from lab.doors import Options, build, locked, need, quietly, say, show_end, stop
 from lab.places import BUILD, PROJECT, shown
@@ -48,7 +48,8 @@ def memchecked(reports: str):
                 f"--log-file={reports.replace('%', '%%')}.%p"]
 
 
-class Tool(NamedTuple):
+@dataclass
+class Tool:
     """One build of the tests, run with one tool, whose reports are files."""
 
     folder: Path
@@ -57,13 +58,8 @@ class Tool(NamedTuple):
     tests: str
     watched: Callable[[str], tuple[dict[str, str], list[str]]]  # environment, prefix
 
-    @property
-    def findings(self) -> Path:
-        return self.folder / "findings"
-
-    @property
-    def log(self) -> Path:
-        return self.folder / "sanitize.log"
+    def __post_init__(self):
+        self.findings, self.log = self.folder / "findings", self.folder / "sanitize.log"
 
     def run(self) -> int:
         """Returns how many tests have passed, without a finding."""

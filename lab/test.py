@@ -22,9 +22,7 @@ from lab.places import BUILD, PROJECT
 
 # What the machine of a preset cannot do, and the tests that therefore skip themselves.
 MAY_SKIP = {
-    "dev": (None, ""),
-    "clang": (None, ""),
-    "coverage": (None, ""),
+    **dict.fromkeys(["dev", "clang", "coverage"], (None, "")),
     "asan": (r"(UntrustedData|WholeListOfCalls)\.",
              "a sanitizer stands no limit of memory, and makes its own calls"),
     "arm64-dev": (r"(Calls|DataProtection|UntrustedData|WholeListOfCalls)\.",

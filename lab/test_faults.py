@@ -11,7 +11,7 @@ from errno import (EACCES, EAGAIN, EBUSY, EDQUOT, EEXIST, EFBIG, EINTR, EINVAL, 
 import pytest
 
 from lab import boot
-from lab.conditions import Fails, FailsForGood, WritesInPart, storage_conditions
+from lab.conditions import Fails, WritesInPart, storage_conditions
 from lab.devices import CHOSEN
 from lab.trial import trial, undisturbed
 
@@ -61,7 +61,7 @@ def disturbances(option):
             for error in once:
                 yield "a call that fails", name, Fails(number, call, error)
             for error in for_good:
-                yield "a failure for good", name, FailsForGood(number, call, error)
+                yield "a failure for good", name, Fails(number, call, error, True)
             if call.name == "write":
                 for taken in (0, 1, 8):
                     yield "a write in part", name, WritesInPart(number, call, taken)

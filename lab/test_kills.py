@@ -22,13 +22,11 @@ from lab.devices import ABNORMAL, CHOSEN
 from lab.paths import (DEFAULT_LOCALTIME, ICUTZ, LEGACY_ICUTZ, LOCALTIME, RECORD,
                        ZONEINFO)
 from lab.seen import Entries
-from lab.trial import entry_differences, fail, trial, undisturbed
+from lab.trial import entry_differences, fail, real, trial, undisturbed
 
 # As many as it takes until a device is settled: an update that was activated after a
 # reset, though older than the system's data, is reset once more.
 BOOTS_TO_SETTLE = 3
-
-# --- The windows -----------------------------------------------------------------
 
 
 class Window(NamedTuple):
@@ -83,8 +81,6 @@ def window_of(path, left, usual, carried_out):
                 return window.name
     return None
 
-
-# --- Every kill --------------------------------------------------------------------
 
 CHANGES = ("symlink", "unlink", "rmdir", "create", "write")
 
@@ -161,9 +157,7 @@ def test_a_kill(name, kill, count):
     for _ in range(BOOTS_TO_SETTLE + 1):
         model.boot(usual)
     usual = usual.contents()
-    device = CHOSEN[name]()
-    namespace.build(device)
-    start = namespace.look()
+    device, start = real(name)
     outcome = killed(device, kill, start, undisturbed(name).log)
     settles(name, device, start)
     left = device.contents()
@@ -178,9 +172,7 @@ def test_a_kill(name, kill, count):
 
 @pytest.mark.cases("name, first, second", pairs)
 def test_two_kills(name, first, second):
-    device = CHOSEN[name]()
-    namespace.build(device)
-    start = namespace.look()
+    device, start = real(name)
     killed(device, first, start)
     killed(device, second, start)
     settles(name, device, start)

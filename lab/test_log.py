@@ -22,7 +22,7 @@ from lab import boot, lines, model
 from lab.carriers import namespace
 from lab.device import decoded
 from lab.devices import CHOSEN
-from lab.trial import entry_differences, fail, undisturbed
+from lab.trial import entry_differences, fail, real, undisturbed
 
 
 def pipe_without_reader():
@@ -47,10 +47,9 @@ LOST_LOGS = {
     "pipe without reader": lambda: {2: pipe_without_reader()},
     "file to read": lambda: {2: os.open("/dev/null", os.O_RDONLY)},
     "pipe that takes no more": lambda: {2: pipe_that_takes_no_more()},
-}
-LOST_LOGS |= {
-    "closed " + " and ".join(map(str, closed)): functools.partial(dict.fromkeys, closed)
-    for number in (1, 2, 3) for closed in itertools.combinations(range(3), number)}
+    **{"closed " + " and ".join(map(str, closed)):
+       functools.partial(dict.fromkeys, closed)
+       for number in (1, 2, 3) for closed in itertools.combinations(range(3), number)}}
 
 TAKEN = 5  # bytes, of a line of which only a part is taken
 
@@ -87,9 +86,7 @@ def with_names(_):
 @pytest.mark.parametrize("log", LOST_LOGS)
 @pytest.mark.parametrize("name", CHOSEN)
 def test_a_lost_log(name, log):
-    device = CHOSEN[name]()
-    namespace.build(device)
-    before = namespace.look()
+    device, before = real(name)
     outcome = model.boot(device)
     null = os.open("/dev/null", os.O_RDWR)
     at_start = {0: null, 1: null, 2: null} | LOST_LOGS[log]()
@@ -108,9 +105,7 @@ def test_a_lost_log(name, log):
 @pytest.mark.parametrize("name", CHOSEN)
 def test_lines_in_one_write_each(name, count):
     """Every write to a pipe of packets is read as one."""
-    device = CHOSEN[name]()
-    namespace.build(device)
-    before = namespace.look()
+    device, before = real(name)
     outcome = model.boot(device)
     reader, writer = os.pipe2(os.O_DIRECT)
     fcntl.fcntl(writer, fcntl.F_SETPIPE_SZ, 1 << 20)
@@ -130,13 +125,10 @@ def test_lines_in_one_write_each(name, count):
 def test_a_log_that_fails_in_the_middle(name, what, options, hit, left):
     """The error texts of the lines that are left may have become those of the log's own
     failure."""
-    device = CHOSEN[name]()
-    namespace.build(device)
-    before = namespace.look()
+    device, before = real(name)
     record_is_lost = any(call.name == "write" for call in hit)
-    outcome = model.boot(
-        device, lambda number, call, path:
-        EIO if call == "write" and record_is_lost else None)
+    outcome = model.boot(device, lambda number, call, path: (
+        EIO if call == "write" and record_is_lost else None))
     booted = boot.traced(*options)
     found = entry_differences(device, namespace.look())
     if booted.ending != outcome.ending:

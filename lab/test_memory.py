@@ -13,7 +13,7 @@ from lab import boot, model
 from lab.carriers import namespace
 from lab.devices import CHOSEN
 from lab.seen import Seen
-from lab.trial import call_differences, differences, fail
+from lab.trial import call_differences, differences, fail, real
 
 
 class ListingGivenUp(Exception):
@@ -102,7 +102,7 @@ def test_memory_is_refused(name, count):
     """At each request for memory of a pass, in turn. With no reserve the program makes
     one for every few pages."""
     options = ["-E", "MALLOC_TOP_PAD_=0", "-e", f"trace={boot.TRACED},brk,mmap"]
-    namespace.build(CHOSEN[name]())
+    real(name)
     boot.traced(*options)
     undisturbed = list(boot.calls())
     start = boot.beginning(undisturbed)
@@ -119,9 +119,7 @@ def test_memory_is_refused(name, count):
 
 def refuse(name, request, options):
     """The way in which the boot did without."""
-    built = CHOSEN[name]()
-    namespace.build(built)
-    before = namespace.look()
+    built, before = real(name)
     booted = boot.traced(*options, *boot.inject("brk", "retval=0", request))
     seen = Seen(before, namespace.look(), *booted, list(boot.calls()))
     refused = [index for index, call in enumerate(seen.calls) if call.injected]

@@ -6,6 +6,7 @@ from __future__ import annotations
 
 import functools
 import os
+from itertools import zip_longest
 
 import pytest
 
@@ -23,6 +24,13 @@ def fail(what: str, found: list[str], before: Entries):
     if found:
         pytest.fail("\n  ".join([what, *found]) + "\nThe device at the start:\n" +
                     as_device(before).in_words(), pytrace=False)
+
+
+def real(name: str) -> tuple[Device, Entries]:
+    """A chosen device, made real, and how it looks."""
+    device = CHOSEN[name]()
+    namespace.build(device)
+    return device, namespace.look()
 
 
 @functools.cache
@@ -58,21 +66,11 @@ def trial(device: Device, condition: Condition | None = None,
 
 def expected(device: Device, condition: Condition) -> model.Outcome:
     """The model's boot; its `failed` are the numbers of the calls that failed."""
-    failed = []
-
-    def noted_fault(number, name, path):
-        error = condition.fault(number, name, path)
-        if error is not None:
-            failed.append(number)
-        return error
-
-    outcome = model.boot(device, noted_fault, condition.killed_before)
-    outcome.failed = failed
+    outcome = model.boot(device, condition.fault, condition.killed_before)
+    outcome.failed = [number for number, call in enumerate(outcome.calls, start=1)
+                      if condition.fault(number, *call) is not None]
     condition.amend(device, outcome)
     return outcome
-
-
-# --- Comparing with the model -----------------------------------------------------
 
 
 def differences(device: Device, nodes: dict[str, Node], outcome: model.Outcome,
@@ -140,16 +138,11 @@ def first_line(text: str) -> str:
 
 def call_differences(outcome: model.Outcome, calls: list[Call]) -> list[str]:
     """Where the calls are not the model's, or other calls failed than were to."""
-    found = []
     made = [(call.name, call.path) for call in calls]
-    for number, (wanted, got) in enumerate(zip(outcome.calls, made), start=1):
+    for number, (wanted, got) in enumerate(zip_longest(outcome.calls, made), start=1):
         if wanted != got:
-            return [f"call {number} is {got}, expected {wanted}"]
-    if len(made) != len(outcome.calls):
-        longer = max(made, outcome.calls, key=len)
-        whose = "unexpected" if longer is made else "missing"
-        found.append(f"{whose} call: {longer[min(len(made), len(outcome.calls))]}")
+            return [f"call {number} is {got or 'missing'}, expected {wanted or 'none'}"]
     injected = [number for number, call in enumerate(calls, start=1) if call.injected]
     if injected != outcome.failed:
-        found.append(f"failed were the calls {injected}, not {outcome.failed}")
-    return found
+        return [f"failed were the calls {injected}, not {outcome.failed}"]
+    return []

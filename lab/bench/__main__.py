@@ -153,17 +153,16 @@ def making():
             processor = sum(used[2:4]) - sum(before[2:4])
             return f"{time.monotonic() - started:.2f}", f"{processor:.2f}"
 
-        rows = [("make-system", *timed(
-            releases.make_system, names.system, names.icu, system))]
-        rows.append(("make-update", *timed(
-            releases.make_update, names.update, system, work)))
+        whole = timed(releases.make_system, names.system, names.icu, system)
+        update = timed(releases.make_update, names.update, system, work)
         shutil.copytree(system, other)
         run("zic", "-b", "fat", "-d", f"{other}/zoneinfo.default", str(releases.RULES))
-        rows.append(("make-update, all files differ", *timed(
-            releases.make_update, names.refused, other, work)))
+        all_differ = timed(releases.make_update, names.refused, other, work)
         size = sum(path.stat().st_size for path in Path(
             work, f"{names.update}.1.0").rglob("*") if path.is_file())
-    print_table("Job, Seconds, of a processor", rows)
+    print_table("Job, Seconds, of a processor", [
+        ("make-system", *whole), ("make-update", *update),
+        ("make-update, all files differ", *all_differ)])
     print(f"\nThe update has {size} bytes, in files.")
 
 
@@ -197,8 +196,6 @@ def out_of_step(series: str, points: list[list[int]]) -> Iterator[str]:
                 yield (f"{series} does not grow in step: at {size} its {name} are off "
                        f"by {off:.0f}")
 
-
-# --- The baseline ----------------------------------------------------------------
 
 TOOLCHAIN = ("compiler", "libc", "instrument")
 
@@ -267,28 +264,22 @@ def compare(was: dict[str, str], now: dict[str, str]):
         print("Some have shrunk by more than 3 %: --record keeps the gain.")
 
 
-# --- Hardening -------------------------------------------------------------------
-
 # All flags of a release build without hardening, not even what a compiler does unasked.
 # Those that follow take precedence.
 BARE = ("-O3 -DNDEBUG -ffunction-sections -fdata-sections -fno-stack-protector "
         "-fno-stack-clash-protection -U_FORTIFY_SOURCE -fcf-protection=none "
         "-Wl,--gc-sections,-z,norelro,-z,lazy,-z,noseparate-code")
 FIXED, PIE = "-fno-pie -static -no-pie", "-fPIE -static-pie"
-PACKED, RELRO = f"{PIE} -Wl,-z,pack-relative-relocs", "-Wl,-z,relro,-z,now"
-GUARD, FORTIFY = "-fstack-protector-strong", "-D_FORTIFY_SOURCE=2"
-CLASH, ASSERTIONS = "-fstack-clash-protection", "-D_GLIBCXX_ASSERTIONS"
-SEPARATE = "-Wl,-z,separate-code"
-HARDENING = {
-    "none": FIXED, "static-pie": PIE, "static-pie, packed": PACKED,
-    "stack protector, strong": f"{FIXED} {GUARD}",
-    "_FORTIFY_SOURCE=2": f"{FIXED} {FORTIFY}",
-    "full RELRO": f"{FIXED} {RELRO}",
-    "separate code": f"{FIXED} {SEPARATE}",
-    "stack clash protection": f"{FIXED} {CLASH}",
-    "_GLIBCXX_ASSERTIONS": f"{FIXED} {ASSERTIONS}",
-    "all of these": " ".join([PACKED, GUARD, FORTIFY, RELRO, SEPARATE, CLASH,
-                              ASSERTIONS])}
+PACKED = f"{PIE} -Wl,-z,pack-relative-relocs"
+PROTECTIONS = {
+    "stack protector, strong": "-fstack-protector-strong",
+    "_FORTIFY_SOURCE=2": "-D_FORTIFY_SOURCE=2", "full RELRO": "-Wl,-z,relro,-z,now",
+    "separate code": "-Wl,-z,separate-code",
+    "stack clash protection": "-fstack-clash-protection",
+    "_GLIBCXX_ASSERTIONS": "-D_GLIBCXX_ASSERTIONS"}
+HARDENING = {"none": FIXED, "static-pie": PIE, "static-pie, packed": PACKED,
+             **{name: f"{FIXED} {option}" for name, option in PROTECTIONS.items()},
+             "all of these": " ".join([PACKED, *PROTECTIONS.values()])}
 
 
 def hardening():
@@ -306,22 +297,16 @@ def hardening():
         in zip([*HARDENING, "what ships"], files, quiet, thrown)])
 
 
-# --- Companions -------------------------------------------------------------------
-
-
 def companions():
     marlin = built_static("marlin-install", "marlin-mend")
-    tools = [f"{BUILDS}/static/tools/{name}" for name in ("marlin-install",
-                                                          "marlin-mend")]
-    for tool in tools:
-        run("strip", tool)
+    tools = [f"{BUILDS}/static/tools/marlin-{name}" for name in ("install", "mend")]
+    run("strip", *tools)
     figures = measured("companions", marlin, *tools)
     (milliseconds, kilobytes), (boot, mend) = figures["install"], figures["quiet"]
     print(f"marlin-install, an update of {figures['bytes']:,} bytes: "
           f"{milliseconds:.0f} ms, {kilobytes:,} kB")
     print_table("Quiet boot, Instructions, Calls, Peak kB, Bytes", [
-        ("marlin", *boot, size_of(marlin)),
-        ("marlin-mend", *mend, size_of(tools[1]))])
+        ("marlin", *boot, size_of(marlin)), ("marlin-mend", *mend, size_of(tools[1]))])
     if milliseconds > 100 or kilobytes > 16_000:
         sys.exit("marlin-install takes too much")
     if any(here >= there for here, there in zip(mend, boot)):
@@ -337,8 +322,7 @@ def main():
     parser = Options(__doc__)
     parser.add_argument("--rounds", type=number, default=11)
     jobs = parser.add_mutually_exclusive_group()
-    for job in (check, record, growth, hardening, parsers, companions, status,
-                making):
+    for job in (check, record, growth, hardening, parsers, companions, status, making):
         jobs.add_argument(f"--{job.__name__}", dest="job", action="store_const",
                           const=job, default=table)
     options = parser.parse_args()

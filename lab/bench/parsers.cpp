@@ -6,10 +6,9 @@
 #include <benchmark/benchmark.h>
 
 #include <cstdlib>
-#include <cstring>
-#include <iostream>
 #include <regex>
 #include <string>
+#include <utility>
 
 #include "dataset/icu_file_name.h"
 #include "support/version.h"
@@ -39,12 +38,7 @@ void match_by_regex(const std::string& text, const std::regex& regex) {
   use(std::regex_match(text, groups, regex));
 }
 
-struct operation {
-  const char* name;
-  void (*run)();
-};
-
-const operation operations[] = {
+const std::pair<std::string, void (*)()> operations[] = {
     {"version/match", [] { use(match_version_text(version_text)); }},
     {"version/match/near_miss", [] { use(match_version_text(near_version)); }},
     {"version/parse", [] { use(mln_version(version_text)); }},
@@ -64,27 +58,25 @@ const operation operations[] = {
      [] { match_by_regex(other_name, icu_regex); }},
 };
 
-int repeat(const char* name, long number) {
-  for (const auto& operation : operations)
-    if (std::strcmp(operation.name, name) == 0) {
-      for (long i = 0; i < number; ++i) operation.run();
-      return 0;
-    }
-  std::cerr << "parsers: no operation " << name << '\n';
-  return 2;
+void repeat(const std::string& wanted, long number) {
+  for (const auto& [name, run] : operations)
+    if (name == wanted)
+      for (long i = 0; i < number; ++i) run();
 }
 
 }  // namespace
 
 int main(int argc, char** argv) {
-  if (argc == 4 && std::strcmp(argv[1], "--repeat") == 0)
-    return repeat(argv[2], std::strtol(argv[3], nullptr, 10));
+  if (argc == 4 && argv[1] == std::string("--repeat")) {
+    repeat(argv[2], std::strtol(argv[3], nullptr, 10));
+    return 0;
+  }
 
-  for (const auto& operation : operations)
-    benchmark::RegisterBenchmark(
-        operation.name, [run = operation.run](benchmark::State& state) {
-          for (auto _ : state) run();
-        });
+  for (const auto& [name, run] : operations)
+    benchmark::RegisterBenchmark(name.c_str(),
+                                 [run = run](benchmark::State& state) {
+                                   for (auto _ : state) run();
+                                 });
   benchmark::Initialize(&argc, argv);
   benchmark::RunSpecifiedBenchmarks();
   return 0;

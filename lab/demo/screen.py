@@ -36,8 +36,10 @@ def say(text: str, colour=""):
         break_on_hyphens=False)))
 
 
-def field(name: str, text: str):
-    print(f"  {name:<{NAME - 2}}{text}")
+def field(name: str, *lines: str):
+    for line in lines:
+        print(f"  {name:<{NAME - 2}}{line}")
+        name = ""
 
 
 def row(name: str, before: str, after: str, width=LEAST_BEFORE, marker=" ", colour=DIM):
@@ -74,15 +76,13 @@ def broken(text: str) -> list[str]:
 def printed(lines: Iterable[str]):
     """Lines of a boot. One that is too long is broken before the system's text, which
     follows the last colon."""
-    name, room = "printed", WIDTH - NAME
-    if not lines:
-        field(name, "nothing")
+    told = []
     for line in lines:
         head, colon, text = line.rpartition(": ")
         head, text = (head + ":", " " + text) if colon else (line, "")
-        if len(line) > room:
+        if len(line) > WIDTH - NAME:
             indent = "\n" + " " * NAME
-            head = indent.join(textwrap.wrap(head, room, break_on_hyphens=False))
+            head = indent.join(broken(head))
             text = indent + " " + text
-        field(name, paint(YELLOW, head) + paint(DIM, text))
-        name = ""
+        told.append(paint(YELLOW, head) + paint(DIM, text))
+    field("printed", *told or ["nothing"])

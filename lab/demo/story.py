@@ -11,6 +11,7 @@ from __future__ import annotations
 import contextlib
 import datetime
 import difflib
+import itertools
 import os
 import shutil
 import signal
@@ -23,7 +24,7 @@ from pathlib import Path
 from lab import boot, lines
 from lab.carriers import namespace
 from lab.demo import data, screen
-from lab.device import Device, decoded
+from lab.device import Device
 from lab.paths import (DOWNLOADS, FORMER_ZONEINFO, ICUTZ, LOCALTIME, RECORD, SYSTEM_ICU,
                        SYSTEM_ZONEINFO, TIMEZONE, TZ_LATEST, ZONEINFO, update_path)
 from lab.seen import Entries, Seen, as_device
@@ -145,10 +146,7 @@ class Story:
 
     def bring(self, source: str, target: str):
         """Has the device hold what stands somewhere in the data."""
-        source = decoded(os.fsencode(data.TARGET.absolute() / source))
-        entries: Entries = {}
-        namespace.look_below(source, entries)
-        self.device.put(target, as_device(entries).find(source))
+        self.device.put(target, namespace.description_of(data.TARGET / source))
 
     def install_system(self, data_set: str):
         self.bring(f"{data_set}/zoneinfo", SYSTEM_ZONEINFO)
@@ -164,11 +162,10 @@ class Story:
     def install(self, data_set: str):
         """With marlin-install, on the device as it is."""
         self.make_real()
-        version = getattr(self.names, data_set)
-        unpacked = Path("/tmp", version)
-        shutil.copytree(data.TARGET.absolute() / data_set, unpacked, symlinks=True)
-        done = subprocess.run([COMPANIONS / "marlin-install", unpacked], text=True,
-                              capture_output=True)
+        unpacked = Path("/tmp", getattr(self.names, data_set))
+        shutil.copytree(data.TARGET / data_set, unpacked, symlinks=True)
+        done = subprocess.run([COMPANIONS / "marlin-install", unpacked],
+                              capture_output=True, text=True)
         shutil.rmtree(unpacked)
         self.device.root = as_device(namespace.look()).root
         self.installer = (done.stdout or done.stderr).strip()
@@ -192,12 +189,9 @@ class Story:
         before = namespace.look()
         expected, reasons = self.foretold()
         print()
-        for name, told in {"installer": [self.installer],
-                           "foretold": reasons or ["no change"]}.items():
-            for text in filter(None, told):
-                for part in screen.broken(text):
-                    screen.field(name, part)
-                    name = ""
+        screen.field("installer", *screen.broken(self.installer))
+        screen.field("foretold", *itertools.chain.from_iterable(
+            map(screen.broken, reasons or ["no change"])))
         self.installer = ""
         was = self.rows(before)
         booted = boot.boot()
