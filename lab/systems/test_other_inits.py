@@ -4,7 +4,7 @@
 import pytest
 
 from lab import lines
-from lab.paths import ZONEINFO
+from lab.paths import ICUTZ, ZONEINFO
 from lab.systems.machine import Seen, System
 from lab.systems.parts import CHOSEN
 from lab.systems.scene import device, install_update_here, linked, links, names
@@ -29,6 +29,9 @@ rm etc/rc?.d/[SK]* etc/init.d/apparmor etc/init.d/dbus etc/init.d/udev  # for ti
 bwrap --bind . / insserv --default $(find etc/init.d -type f ! -name '.*' -printf '%f ')
 """
 INITS = {"busybox": BUSYBOX, "sysv": SYSV}
+# How the examples say that it is switched on: the file, what is there, and instead.
+MEND = {"busybox": ("inittab", "(timeout", "(/usr/libexec/marlin-mend; timeout"),
+        "sysv": ("init.d/marlin", "# run /", "run /")}
 
 
 @pytest.fixture(params=INITS)
@@ -60,6 +63,29 @@ def test_an_update_and_a_forged_line(init):
 
     seen = here.boot(options=DEVICES)
     assert printed(seen) == [] and seen.text("reader") == "14:00 CEST\n"
+
+
+@pytest.mark.rest
+def test_links_of_two_data_sets(init):
+    """With the mend; and with one that only fails, which stops no boot."""
+    file, off, on = MEND[init]
+    made = device(active=True, announced=True)
+    made.drop(ICUTZ)
+    here = System(f"{init}-mend", INITS[init] + f"""
+        {install_update_here()} {linked(made)}
+        sed -i 's,{off},{on},' etc/{file}
+        awk 'length > 255 {{ exit 1 }}' etc/{file}
+        grep -qF '{on}' etc/{file}
+        echo '/dev/nvme0n3 /var ext4 defaults 0 0' >etc/fstab""", apart="var")
+    seen = here.boot(f"rm {ICUTZ}; cp /bin/false /usr/libexec/marlin-mend", DEVICES)
+    assert printed(seen)[0] == (
+        f"marlin-mend: {ZONEINFO} did not fit {ICUTZ}; marlin makes both anew")
+    assert seen.links[ICUTZ] == links(device(active=True))[ICUTZ]
+
+    seen = here.boot(options=DEVICES)
+    assert any(lines.NOT_NEWER % ((names().update,) * 2) in line
+               for line in printed(seen)), printed(seen)
+    assert ICUTZ not in seen.links and seen.text("reader") == "14:00 CEST\n"
 
 
 @pytest.mark.rest
