@@ -10,7 +10,7 @@ from pathlib import Path
 
 import pytest
 
-from lab import private_device, test
+from lab import private_device, releases, test
 from lab.places import PROJECT
 
 DOORS = sorted(door for door in (PROJECT / "scripts").iterdir()
@@ -176,6 +176,16 @@ def test_a_private_device_is_made_from_any_place(tmp_path):
                place, written)
     assert done.returncode == 7, done.stderr
     assert (written / "here").exists()
+
+
+def test_a_folder_that_somebody_else_made_is_refused(tmp_path):
+    parts = tmp_path / "emulator/packages"
+    parts.mkdir(parents=True)
+    refusal = f"{parts} is there, and not made by this; remove it"
+    assert refusal in told(run(PROJECT / "scripts/device", MARLIN_BUILD=str(tmp_path)),
+                           77)
+    with pytest.raises(releases.NotOfTheForm, match="not made by this"):
+        releases.once(parts, [], parts.rmdir)
 
 
 def test_a_signal_that_python_ignores_ends_a_command():
