@@ -60,6 +60,7 @@ TEST_F(LocaltimeLinkRepair, LeavesALinkToAMissingZoneAlone) {
 TEST_F(LocaltimeLinkRepair, AcceptsThePrefixWithoutASeparator) {
   leaves_alone("/var/db/timezone/zoneinfo");
   leaves_alone("/var/db/timezone/zoneinfo2/Europe/Paris");
+  leaves_alone("/var/db/timezone/zoneinfo" + std::string(900, 'x'));
   leaves_alone("/var/db/timezone/zoneinfo/../tz/x/zoneinfo/Europe/Paris");
 }
 
