@@ -81,8 +81,8 @@ TEST_F(LocaltimeLinkRepair, LooksForTheCorrectedZoneInTheActiveDataSet) {
 }
 
 TEST_F(LocaltimeLinkRepair, AnnouncesACorrectionThatThenFails) {
-  corrects_and_then_resets("/usr/share/zoneinfo/Mars/Base",
-                           "/var/db/timezone/zoneinfo/Mars/Base");
+  corrects_and_then_resets("/usr/share/zoneinfo/usr/share/zoneinfo/Base",
+                           "/var/db/timezone/zoneinfo/usr/share/zoneinfo/Base");
 }
 
 TEST_F(LocaltimeLinkRepair, CorrectsThePrefixWithoutASeparatorAndThenResets) {
