@@ -10,7 +10,7 @@ from pathlib import Path
 
 import pytest
 
-from lab import private_device, test
+from lab import private_device, releases, test
 from lab.places import PROJECT
 
 DOORS = sorted(door for door in (PROJECT / "scripts").iterdir()
@@ -101,13 +101,14 @@ def test_the_remedy_fits_the_machine(setting, value, user, advice, tmp_path,
     assert advice in private_device.remedy()
 
 
-def test_nothing_is_built_where_every_test_would_be_skipped(fakes, tmp_path):
+@pytest.mark.parametrize("door, says", [
+    ("test", r"\ntest: ([1-9]\d\d+) of \1 tests skipped.*\n$"), ("demo", r"\n$")])
+def test_nothing_is_built_where_there_can_be_no_device(door, says, fakes, tmp_path):
     path = fakes(bwrap=f"echo '{REFUSAL}' >&2; exit 1")
-    done = run(PROJECT / "scripts/test", PATH=path, MARLIN_BUILD=str(tmp_path / "made"))
+    done = run(PROJECT / "scripts" / door, PATH=path,
+               MARLIN_BUILD=str(tmp_path / "made"))
     assert (done.returncode, done.stdout) == (77, "")
-    first, second = done.stderr.splitlines()
-    assert REFUSAL in first
-    assert re.search(r"test: ([1-9]\d\d+) of \1 tests skipped", second)
+    assert re.match(f"private-device: {REFUSAL}; allow it .*{says}", done.stderr)
     assert not list((tmp_path / "made").iterdir())
 
 
@@ -175,6 +176,16 @@ def test_a_private_device_is_made_from_any_place(tmp_path):
                place, written)
     assert done.returncode == 7, done.stderr
     assert (written / "here").exists()
+
+
+def test_a_folder_that_somebody_else_made_is_refused(tmp_path):
+    parts = tmp_path / "emulator/packages"
+    parts.mkdir(parents=True)
+    refusal = f"{parts} is there, and not made by this; remove it"
+    assert refusal in told(run(PROJECT / "scripts/device", MARLIN_BUILD=str(tmp_path)),
+                           77)
+    with pytest.raises(releases.NotOfTheForm, match="not made by this"):
+        releases.once(parts, [], parts.rmdir)
 
 
 def test_a_signal_that_python_ignores_ends_a_command():

@@ -28,6 +28,8 @@ class Unavailable(Exception):
 
 def prepare():
     """Builds and fetches what is missing; or raises Unavailable."""
+    if PARTS.exists() and not (PARTS / "bin/busybox").exists():
+        raise Unavailable(f"{PARTS} is there, and not made by this; remove it")
     if subprocess.call([PROJECT / "scripts/packages", "build", "arm64", "device"]):
         raise Unavailable("packages are missing")
     on_path("qemu-system-aarch64")

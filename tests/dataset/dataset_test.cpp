@@ -120,6 +120,7 @@ TEST_F(Dataset, OfAPathWithATrailingSlashKeepsItAndIsOlderThanAll) {
                 EXPECT_EQ(dataset.path, "/var/db/timezone/tz/2024a.1.0/");
                 EXPECT_EQ(dataset.version_string, "2024a.1.0/");
                 EXPECT_TRUE(mln_dataset() > dataset);
+                EXPECT_FALSE(dataset == mln_dataset(update("2024a.1.0")));
                 EXPECT_EQ(zoneinfo_of(dataset).zoneinfo_path,
                           "/var/db/timezone/tz/2024a.1.0//zoneinfo");
               }),
@@ -189,9 +190,9 @@ TEST_F(Dataset, OfTheSystemEqualsEveryOtherButNoUpdate) {
 }
 
 TEST_F(Dataset, OfAnotherPathIsNotEqualThoughOfTheSameVersion) {
-  install_update("2024a.1.0", "44l");
+  install_update("2024a.1.00", "44l");
   install_update("2024a.01.0", "44l");
-  const mln_dataset left(update("2024a.1.0"));
+  const mln_dataset left(update("2024a.1.00"));
   const mln_dataset right(update("2024a.01.0"));
   EXPECT_FALSE(left == right);
   EXPECT_FALSE(left > right);

@@ -41,7 +41,9 @@ TEST_F(IcuSchema, OfTheSystemIsTheFirstWordOfItsFormatFile) {
 }
 
 TEST_F(IcuSchema, OfTheSystemIsNotCheckedForItsForm) {
-  for (const std::string word : {"any%thing", "44L", "#44l", "icutz44l.dat"}) {
+  for (const std::string& word :
+       std::vector<std::string>{"any%thing", "44L", "#44l", "icutz44l.dat",
+                                std::string(5000, '4')}) {
     make_file(system_icu + "/icutzformat.txt", word + " 44l");
     EXPECT_EQ(mln_icu().schema, word);
   }

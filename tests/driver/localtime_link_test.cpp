@@ -60,6 +60,7 @@ TEST_F(LocaltimeLinkRepair, LeavesALinkToAMissingZoneAlone) {
 TEST_F(LocaltimeLinkRepair, AcceptsThePrefixWithoutASeparator) {
   leaves_alone("/var/db/timezone/zoneinfo");
   leaves_alone("/var/db/timezone/zoneinfo2/Europe/Paris");
+  leaves_alone("/var/db/timezone/zoneinfo" + std::string(900, 'x'));
   leaves_alone("/var/db/timezone/zoneinfo/../tz/x/zoneinfo/Europe/Paris");
 }
 
@@ -80,8 +81,8 @@ TEST_F(LocaltimeLinkRepair, LooksForTheCorrectedZoneInTheActiveDataSet) {
 }
 
 TEST_F(LocaltimeLinkRepair, AnnouncesACorrectionThatThenFails) {
-  corrects_and_then_resets("/usr/share/zoneinfo/Mars/Base",
-                           "/var/db/timezone/zoneinfo/Mars/Base");
+  corrects_and_then_resets("/usr/share/zoneinfo/usr/share/zoneinfo/Base",
+                           "/var/db/timezone/zoneinfo/usr/share/zoneinfo/Base");
 }
 
 TEST_F(LocaltimeLinkRepair, CorrectsThePrefixWithoutASeparatorAndThenResets) {

@@ -43,12 +43,12 @@ namespace {
 class WithoutMemory : public DeviceTest {
  protected:
   // The lines that `act` prints when so many of its requests are granted and
-  // the next one is refused.
+  // the next one is refused, or as many as that.
   static std::vector<std::string> printed_by_refused(
-      const std::function<void()>& act, int granted = 0) {
+      const std::function<void()>& act, int granted = 0, int refused = 1) {
     return printed_by([&] {
       accepted = granted;
-      refusals = 1;
+      refusals = refused;
       act();
       accepted = refusals = 0;
     });
@@ -184,6 +184,18 @@ TEST_F(WithoutMemory, TheLocalTimeIsReset) {
   EXPECT_THAT(printed_by_refused(repair_localtime_link),
               lines(resetting_localtime(any_error)));
   EXPECT_EQ(link_at(local_time), default_localtime);
+}
+
+TEST_F(WithoutMemory, AFallbackThatIsRefusedItsOwnEndsThePass) {
+  EXPECT_THAT(
+      printed_by_refused(
+          [] { EXPECT_THROW(run_startup_pass(), std::bad_alloc); }, 1, 1000),
+      lines(unable_to_locate(any_error)));
+  point_localtime_at("/usr/share/zoneinfo/Europe/Paris");
+  EXPECT_THAT(
+      printed_by_refused(
+          [] { EXPECT_THROW(repair_localtime_link(), std::bad_alloc); }, 0, 2),
+      lines(resetting_localtime(any_error)));
 }
 
 }  // namespace
