@@ -494,6 +494,7 @@ def test_a_tree_that_disappears():
     (["--rock"], 64, "--rock is not understood; see --help"),
     (["-xh"], 64, "-x is not understood; see --help"),
     (["--root"], 64, "--root needs a directory; see --help"),
+    (["--json=x"], 64, "--json=x is not understood; see --help"),
     (["--root="], 64, "--root needs a directory; see --help"),
     (["--json", "--check"], 64, "one of --json and --check is enough; see --help"),
     (["x\033[2J"], 64, r"x\x1b[2J is not expected; see --help"),

@@ -10,7 +10,7 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
-#include <exception>
+#include <new>
 #include <string>
 
 #include "tools/escaped.h"
@@ -61,40 +61,44 @@ void print_and_exit(const std::string& text) {
 }
 
 options parse(int count, char** words) {
-  static const option known[] = {{"root", required_argument, nullptr, 'r'},
-                                 {"json", no_argument, nullptr, 'j'},
-                                 {"check", no_argument, nullptr, 'c'},
-                                 {"help", no_argument, nullptr, 'h'},
-                                 {"version", no_argument, nullptr, 'v'},
+  // Numbers that no letter has.
+  enum { root = 256, json, check, help_, version };
+  static const option known[] = {{"root", required_argument, nullptr, root},
+                                 {"json", no_argument, nullptr, json},
+                                 {"check", no_argument, nullptr, check},
+                                 {"help", no_argument, nullptr, help_},
+                                 {"version", no_argument, nullptr, version},
                                  {}};
   options chosen;
   int letter = 0;
   opterr = 0;
   while ((letter = getopt_long(count, words, "+:h", known, nullptr)) != -1) {
     switch (letter) {
-      case 'r':
+      case root:
         chosen.root = optarg;
         break;
-      case 'j':
-      case 'c':
+      case json:
+      case check:
         if (chosen.wanted != form::rows)
           refuse(bad_use, "one of --json and --check is enough; see --help");
-        chosen.wanted = letter == 'j' ? form::json : form::reasons;
+        chosen.wanted = letter == json ? form::json : form::reasons;
         break;
       case 'h':
+      case help_:
         print_and_exit(help);
         break;
-      case 'v':
+      case version:
         print_and_exit("marlin-status " MARLIN_VERSION "\n");
         break;
       case ':':
         refuse(bad_use, "--root needs a directory; see --help");
       default:
-        refuse(bad_use, (optopt != 0 ? std::string("-") +
-                                           escaped(std::string(
-                                               1, static_cast<char>(optopt)))
-                                     : escaped(words[optind - 1])) +
-                            " is not understood; see --help");
+        refuse(bad_use,
+               (optopt != 0 && optopt < root
+                    ? std::string("-") +
+                          escaped(std::string(1, static_cast<char>(optopt)))
+                    : escaped(words[optind - 1])) +
+                   " is not understood; see --help");
     }
   }
   if (chosen.root.empty())
@@ -184,18 +188,28 @@ int tell(const options& chosen) {
 
 // In a child: whatever a device does to it, there is an answer.
 int tell_or_say_why_not(const options& chosen) {
+  std::string why;
   try {
     return tell(chosen);
-  } catch (const std::exception& reason) {
-    std::fprintf(stderr, "marlin-status: cannot tell: %s\n", reason.what());
-    return not_here;
+  } catch (const cannot_tell& reason) {
+    why = reason.what();
+  } catch (const std::bad_alloc&) {
+    why = "it takes more memory than there is";
+  } catch (...) {
+    why =
+        "what the boot did does not follow from what was read; is the device "
+        "being changed?";
   }
+  std::fprintf(stderr, "marlin-status: cannot tell: %s\n", why.c_str());
+  return not_here;
 }
 
 }  // namespace
 
 int main(int count, char** words) {
   const options chosen = parse(count, words);
+  // If it is ignored, nobody is told how a child ends.
+  ::signal(SIGCHLD, SIG_DFL);
   const pid_t child = ::fork();
   if (child < 0) refuse(not_here, std::string("fork: ") + std::strerror(errno));
   if (child == 0) {

@@ -306,6 +306,7 @@ void become_the_boot() {
   ::setgroups(0, nullptr);
   const rlimit none{0, 0};
   must(::setrlimit(RLIMIT_CORE, &none), "setrlimit");
+  ::umask(022);
   must(::prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0), "no_new_privs");
   __user_cap_header_struct header{_LINUX_CAPABILITY_VERSION_3, 0};
   const __user_cap_data_struct no_capability[2] = {};
