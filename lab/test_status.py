@@ -27,6 +27,7 @@ from lab.devices import CHOSEN
 from lab.paths import (DOWNLOADS, ICUTZ, LEGACY_ICUTZ, LOCALTIME, OLD_ICU, PLACES,
                        RECORD, SYSTEM_ICU, SYSTEM_ZONEINFO, TIMEZONE, TZ_LATEST,
                        ZONEINFO, update_path)
+from lab.places import BUILD
 from lab.properties import version_of
 from lab.random_devices import compose
 from lab.seen import Entries, Seen, as_device
@@ -216,6 +217,7 @@ def test_random_devices(numbers, count):
 TREE = "/tmp/device"
 ODD_NAME = "a\nb\033[2J %s\xff\\"
 OUTSIDE = "../../../../../../../../../../etc"
+AS_ROOT = "/usr/bin/unshare --user --map-root-user --mount /bin/sh -euc".split()
 UPDATE = "2024a.1.0"
 UPDATES = DOWNLOADS.rstrip("/")
 UPDATE_VERSION = update_path(f"{UPDATE}/zoneinfo/+VERSION")
@@ -577,6 +579,28 @@ def test_rows_fit_a_terminal():
         assert max(map(len, plain.replace(b"\r", b"").split(b"\n"))) <= 60
 
 
+@pytest.mark.parametrize("status, change", [
+    (0, ("directory", SYSTEM_ZONEINFO)),
+    (77, ("announce", UPDATE)),
+    (77, ("file", SYSTEM_VERSION, "2023c", 0o600)),
+])
+def test_a_record_of_another_user(status, change):
+    """It is sound only if it is so with the rights of everybody."""
+    unpack(("file", RECORD), change)
+    done = subprocess.run(
+        [*AS_ROOT, f"""mount --bind {another_users()} {TREE}{RECORD}
+             exec {STATUS} --root {TREE} --check"""], capture_output=True, text=True)
+    assert (done.returncode, done.stdout) == (status, "")
+    assert done.stderr == ("" if status == 0 else
+                           f"marlin-status: cannot tell: {RECORD} belongs to another "
+                           "user, whose rights this user has not; run this as root\n")
+
+
+def another_users() -> str:
+    return next(path for path in (f"{BUILD}/prove/foreign", "/etc/passwd")
+                if os.path.exists(path) and os.stat(path).st_uid != os.geteuid())
+
+
 @pytest.mark.parametrize("place", ["/var/db/timezone", "/var/db/timezone/tz", "/var/db",
                                    "/var", "/usr/share/icu"])
 def test_a_file_system_of_its_own(place):
@@ -584,8 +608,7 @@ def test_a_file_system_of_its_own(place):
     unpack(("announce", UPDATE))
     at = TREE + place
     done = subprocess.run(
-        ["/usr/bin/unshare", "--user", "--map-root-user", "--mount", "/bin/sh", "-euc",
-         f"""mkdir /tmp/aside && cp -a {at}/. /tmp/aside
+        [*AS_ROOT, f"""mkdir /tmp/aside && cp -a {at}/. /tmp/aside
              mount -t tmpfs -o mode=755 own {at} && cp -a /tmp/aside/. {at}
              find {TREE} -printf '%p %i %T@ %C@ %l\\n' >/tmp/before
              {STATUS} --root {TREE} --json || [ $? = 1 ]

@@ -23,9 +23,10 @@
 
 namespace {
 
-constexpr std::size_t longest_text = 4096;   // of a link or a record
 constexpr std::size_t longest_word = 65536;  // of a version or a schema
 constexpr std::size_t most_names = 10000;
+// How an owner appears whom this user namespace does not have.
+constexpr uid_t nobody = 65534;
 
 unsigned refusals = 0;
 
@@ -140,28 +141,37 @@ void list_downloads(device_facts& device) {
             });
 }
 
-// Whether another user owns a part that a boot reads or changes.
-bool is_foreign(const device_facts& device) {
-  std::vector<std::string> parts = {
-      "/usr",
-      "/usr/share",
-      "/var",
-      "/var/db",
-      "/var/db/timezone",
-      paths::download_root,
-      paths::system_zoneinfo,
-      std::string(paths::system_zoneinfo) + "/+VERSION",
-      paths::system_icu,
-      std::string(paths::system_icu) + "/icutzformat.txt",
-      paths::version_record};
+// Notes whose the parts are that a boot reads or changes. Whose those are that
+// it only reads does not matter where everybody may read them.
+void note_rights(device_facts& device) {
+  const auto look_at = [&](const std::string& part, bool is_changed) {
+    struct stat status {};
+    if (::stat(part.c_str(), &status) != 0) return;
+    const mode_t for_all = S_ISDIR(status.st_mode) ? 0555 : 0444;
+    const bool is_closed = (status.st_mode & for_all) != for_all;
+    device.has_closed_part = device.has_closed_part || is_closed;
+    if (status.st_uid == nobody && (is_changed || is_closed) &&
+        device.foreign_part.empty())
+      device.foreign_part = part;
+  };
+  // The owner of "/" is the device's root.
+  for (const char* part :
+       {"/", "/var/db", "/var/db/timezone", paths::version_record})
+    look_at(part, true);
+  const std::string& zone = device.links.localtime.text;
+  for (const std::string& part :
+       {std::string("/usr"), std::string("/usr/share"),
+        std::string(paths::system_zoneinfo),
+        std::string(paths::system_zoneinfo) + "/+VERSION",
+        std::string(paths::system_icu),
+        std::string(paths::system_icu) + "/icutzformat.txt",
+        std::string("/var"), std::string(paths::download_root),
+        zone.substr(0, zone.rfind('/'))})
+    look_at(part, false);
   for (const auto* set : {&device.current, &device.update})
     if (*set && !(*set)->path.empty())
       for (const char* part : {"", "/zoneinfo", "/zoneinfo/+VERSION", "/icutz"})
-        parts.push_back((*set)->path + part);
-  return std::any_of(parts.begin(), parts.end(), [](const std::string& part) {
-    struct stat status {};
-    return ::stat(part.c_str(), &status) == 0 && status.st_uid != ::geteuid();
-  });
+        look_at((*set)->path + part, false);
 }
 
 void expect_file(dataset_facts& facts, const std::string& path) {
@@ -258,6 +268,6 @@ device_facts read_device() {
   if (device.links.tz_latest.what == entry::kind::link)
     device.update = facts_of(latest_update_path(), system.get());
   list_downloads(device);
-  device.is_foreign = is_foreign(device);
+  note_rights(device);
   return device;
 }

@@ -9,6 +9,9 @@
 
 #include "support/version.h"
 
+// What is read of a link or a record.
+inline constexpr std::size_t longest_text = 4096;
+
 // What stands at a path. "none" is an answer, `unknown` comes with an errno.
 struct entry {
   enum class kind { none, link, file, directory, special, unknown };
@@ -84,7 +87,8 @@ struct device_facts {
   std::vector<download> downloads{};  // those that are needed first
   int downloads_error = 0;
   bool has_more_downloads = false;  // than are listed
-  bool is_foreign = false;          // a part of it is another user's
+  std::string foreign_part{};       // the first that is another user's
+  bool has_closed_part = false;     // one that not everybody may read
 };
 
 // The links as they are, also after a boot. Neither throws anything but

@@ -148,13 +148,14 @@ void insist_on_enough_memory(const report& told) {
 }
 
 // In a user namespace this user is the device's root only as far as the device
-// is this user's. What is sound for somebody with less rights is sound.
+// is this user's. What is sound for somebody with the rights of everybody is
+// sound.
 void insist_on_rights(const report& told, const place& here) {
-  if (here.is_user_namespace && told.device.is_foreign &&
-      told.why.is != verdict::sound)
-    throw cannot_tell(
-        "a part of the device belongs to another user, whose rights this user "
-        "has not; run this as root");
+  if (!here.has_all_users && !told.device.foreign_part.empty() &&
+      (told.why.is != verdict::sound || told.device.has_closed_part))
+    throw cannot_tell(escaped(told.device.foreign_part) +
+                      " belongs to another user, whose rights this user has "
+                      "not; run this as root");
 }
 
 report examine(const options& chosen) {

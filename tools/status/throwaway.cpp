@@ -76,18 +76,16 @@ void map_to_root(const char* file, unsigned id) {
   write_file(file, "0 " + std::to_string(id) + " 1\n");
 }
 
-// Returns whether it took a user namespace.
-bool enter_namespaces() {
+void enter_namespaces() {
   const unsigned user = ::geteuid();
   const unsigned group = ::getegid();
-  if (::unshare(CLONE_NEWNS) == 0) return false;
+  if (::unshare(CLONE_NEWNS) == 0) return;
   if (errno != EPERM) fail("unshare");
   must(::unshare(CLONE_NEWUSER | CLONE_NEWNS),
        "this user may not have namespaces");
   write_file("/proc/self/setgroups", "deny");
   map_to_root("/proc/self/uid_map", user);
   map_to_root("/proc/self/gid_map", group);
-  return true;
 }
 
 void set_attributes(int tree, unsigned flags, unsigned long attributes,
@@ -172,16 +170,16 @@ class process {
     return std::string(path, static_cast<std::size_t>(length));
   }
 
-  std::string mounts() const {
+  std::string text_of(const char* name) const {
     const descriptor file(
-        ::openat(directory_.get(), "self/mountinfo", O_RDONLY | O_CLOEXEC));
-    must(file.get(), "/proc/self/mountinfo");
+        ::openat(directory_.get(), name, O_RDONLY | O_CLOEXEC));
+    must(file.get(), name);
     std::string text;
     char buffer[4096];
     ssize_t count = 0;
     while ((count = ::read(file.get(), buffer, sizeof buffer)) > 0)
       text.append(buffer, static_cast<std::size_t>(count));
-    must(count, "/proc/self/mountinfo");
+    must(count, name);
     return text;
   }
 
@@ -297,10 +295,12 @@ class layers {
 
 place enter_throwaway_device(const std::string& root) {
   place here;
-  here.is_user_namespace = enter_namespaces();
+  enter_namespaces();
   must(::mount(nullptr, "/", nullptr, MS_REC | MS_PRIVATE, nullptr), "mount");
   const descriptor device = open_directory(root);
   const process self;
+  here.has_all_users =
+      self.text_of("self/uid_map").find("4294967295") != std::string::npos;
   here.is_running_system = self.path_of(device) == "/";
 
   // Taken before anything is covered.
