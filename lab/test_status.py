@@ -188,6 +188,10 @@ def examine(device: Device, tell: str, count):
     found += status_differences(said, seen) + reason_differences(said)
     if answer.status != said["status"] or answer.errors:
         found.append(f"exit status {answer.status}, {answer.errors!r}")
+    wrote = any(path in seen.after and seen.after[path].kind == "file"
+                for path in seen.changed())
+    if wrote != (fact(said, "record") == "activation"):
+        found.append(f"said of the record: {fact(said, 'record')}, which is not so")
     fail(tell, found, before)
     for step in said["next_boot"]["steps"]:
         count(f"said: {step['step']} {step['does']}: {step['reason']}")
@@ -296,6 +300,9 @@ CASES = {
     "a stale icutz": case(2, ("use", UPDATE),
                           ("link", ICUTZ, update_path("2023d.1.0/icutz")),
                           now__pair="update_with_other_icu"),
+    "an icutz of other words": case(0, ("use", UPDATE),
+                                    ("link", ICUTZ, f"tz/{UPDATE}/icutz"),
+                                    now__pair="update"),
     "an icutz left over": case(2, ("link", ICUTZ, update_path(UPDATE)),
                                now__pair="system_with_icu"),
     "icutz is a directory": case(2, ("directory", ICUTZ),
@@ -349,7 +356,13 @@ CASES = {
     "two icu data files": case(
         2, ("use", UPDATE), ("drop", ICU_DATA),
         ("file", update_path(f"{UPDATE}/icutz/icutz45l.dat")),
-        ("file", update_path(f"{UPDATE}/icutz/icutz46l.dat"))),
+        ("file", update_path(f"{UPDATE}/icutz/icutz46l.dat")),
+        current__has_several_schemas=True),
+    "icu data that does not count": case(
+        0, ("use", UPDATE), ("link", update_path(f"{UPDATE}/icutz/icutz45l.dat"),
+                             ICU_DATA),
+        ("file", update_path(f"{UPDATE}/icutz/icutz46l.dat"), "ICU", 0o640),
+        current__has_several_schemas=False),
     "an update that is a link to the host": case(
         2, ("link", update_path(UPDATE), OUTSIDE),
         ("link", TZ_LATEST, update_path(UPDATE)), announced__schema=None),
@@ -365,6 +378,11 @@ CASES = {
         next_boot__after__record={"kind": "link", "target": "/etc/passwd"}),
     "a record that is a directory": case(
         2, ("announce", UPDATE), ("directory", RECORD)),
+    "a record that nobody may write": case(
+        2, ("announce", UPDATE), ("file", RECORD, "2", 0o444), record="not_opened"),
+    "a record that is right, and nobody may write": case(
+        2, ("announce", UPDATE), ("file", RECORD, f"2023c.1.0_{UPDATE}", 0o444),
+        record="not_opened"),
     "var is a link inside": case(0, ("move", "/var", "/data"),
                                  ("link", "/var", "data")),
     "var is an absolute link inside": case(0, ("move", "/var", "/data"),

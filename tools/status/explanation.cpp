@@ -8,6 +8,7 @@
 #include <utility>
 
 #include "tools/escaped.h"
+#include "tools/status/words.h"
 
 namespace {
 
@@ -394,7 +395,9 @@ class account {
         has(lines::incompatible) ? device_.system : compared();
     const std::string change =
         active.version_text + "_" + device_.update->version_text;
-    if (!after_.recorded.empty() && change.starts_with(after_.recorded))
+    // Of a long one only the beginning is read.
+    if (!after_.recorded.empty() &&
+        change.substr(0, longest_text) == after_.recorded)
       return add("record", "written", "activation", change);
     add("record", "not_written", "not_opened");
   }
@@ -433,7 +436,8 @@ class account {
       is_wrong("the system partition's data has no ICU schema");
     if (!boot_.ends_normally) return;
     if (after_.pair != link_pair::system && after_.pair != link_pair::update)
-      is_wrong("zoneinfo and icutz do not name the same data after the boot");
+      is_wrong(std::string("after the boot ") +
+               words_for(after_.pair).sentence);
     if (!after_.zone_is_file)
       is_wrong("the local zone's file cannot be reached after the boot");
   }

@@ -35,6 +35,14 @@ void note_refusal() {
   throw std::bad_alloc();
 }
 
+bool is_same_directory(const std::string& left, const std::string& right) {
+  struct stat one {
+  }, other{};
+  return ::stat(left.c_str(), &one) == 0 &&
+         ::stat(right.c_str(), &other) == 0 && S_ISDIR(one.st_mode) &&
+         one.st_dev == other.st_dev && one.st_ino == other.st_ino;
+}
+
 bool is_regular(const std::string& path) {
   struct stat status {};
   return ::stat(path.c_str(), &status) == 0 && S_ISREG(status.st_mode);
@@ -83,8 +91,17 @@ link_pair pair_of(const link_facts& links) {
     return has_icu ? link_pair::system_with_icu : link_pair::system;
   if (links.zoneinfo.text != path + "/zoneinfo") return link_pair::not_the_tree;
   if (!has_icu) return link_pair::update_without_icu;
-  return links.icutz.text == path + "/icutz" ? link_pair::update
-                                             : link_pair::update_with_other_icu;
+  const std::string icu = path + "/icutz";
+  return links.icutz.text == icu || is_same_directory(paths::icu_link, icu)
+             ? link_pair::update
+             : link_pair::update_with_other_icu;
+}
+
+// As a boot finds one: links, and what others may not read, do not count.
+bool is_icu_data(const std::string& path) {
+  struct stat status {};
+  return ::lstat(path.c_str(), &status) == 0 && S_ISREG(status.st_mode) &&
+         (status.st_mode & S_IROTH) != 0;
 }
 
 // The names in a directory, as it lists them, no more than anybody reads.
@@ -98,14 +115,6 @@ int list(const std::string& path, std::vector<std::string>& names) {
   }
   ::closedir(directory);
   return 0;
-}
-
-bool is_same_directory(const std::string& left, const std::string& right) {
-  struct stat one {
-  }, other{};
-  return ::stat(left.c_str(), &one) == 0 &&
-         ::stat(right.c_str(), &other) == 0 && S_ISDIR(one.st_mode) &&
-         one.st_dev == other.st_dev && one.st_ino == other.st_ino;
 }
 
 // By its text or by where it leads; what is in a directory needs that.
@@ -197,7 +206,7 @@ void note_unreadable(dataset_facts& facts) {
   std::vector<std::string> schemas;
   for (const auto& name : names) {
     const std::string schema(icu_schema_in(name));
-    if (!schema.empty() && is_regular(icu + "/" + name))
+    if (!schema.empty() && is_icu_data(icu + "/" + name))
       schemas.push_back(schema);
   }
   facts.has_several_schemas =
@@ -243,7 +252,8 @@ link_facts read_links() {
   links.record = record_at(paths::version_record);
   links.legacy_icutz = entry_at(paths::legacy_icu_link);
   links.old_icu = entry_at(paths::obsolete_icu);
-  links.recorded = content_of(paths::version_record);
+  if (::access(paths::version_record, W_OK) == 0)
+    links.recorded = content_of(paths::version_record);
   links.zone_is_file = is_regular(paths::localtime_link);
   try {
     links.current_path = current_dataset_path();

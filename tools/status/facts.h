@@ -68,7 +68,8 @@ struct link_facts {
   std::optional<std::string> current_path{};  // if "zoneinfo" is accepted
   link_pair pair = link_pair::no_dataset;
   bool zone_is_file = false;  // "localtime" leads to a regular file
-  std::string recorded{};     // what the record holds, through links
+  std::string recorded{};     // what a record holds, through links, that a boot
+                              // may write
 };
 
 // A directory among the downloads, and the links that need it.
