@@ -383,6 +383,8 @@ CASES = {
     "a record that is right, and nobody may write": case(
         2, ("announce", UPDATE), ("file", RECORD, f"2023c.1.0_{UPDATE}", 0o444),
         record="not_opened"),
+    "a record that nobody may read": case(
+        1, ("announce", UPDATE), ("file", RECORD, "2", 0o200), record="activation"),
     "var is a link inside": case(0, ("move", "/var", "/data"),
                                  ("link", "/var", "data")),
     "var is an absolute link inside": case(0, ("move", "/var", "/data"),

@@ -393,13 +393,10 @@ class account {
       return add("record", "nothing", "no_activation");
     const dataset_facts& active =
         has(lines::incompatible) ? device_.system : compared();
-    const std::string change =
-        active.version_text + "_" + device_.update->version_text;
-    // Of a long one only the beginning is read.
-    if (!after_.recorded.empty() &&
-        change.substr(0, longest_text) == after_.recorded)
-      return add("record", "written", "activation", change);
-    add("record", "not_written", "not_opened");
+    if (!after_.is_recordable)
+      return add("record", "not_written", "not_opened");
+    add("record", "written", "activation",
+        active.version_text + "_" + device_.update->version_text);
   }
 
   void last_resort(bool failed) {

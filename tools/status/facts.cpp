@@ -23,6 +23,7 @@
 
 namespace {
 
+constexpr std::size_t longest_text = 4096;   // of a link or a record
 constexpr std::size_t longest_word = 65536;  // of a version or a schema
 constexpr std::size_t most_names = 10000;
 // How an owner appears whom this user namespace does not have.
@@ -63,23 +64,18 @@ entry entry_at(const char* path) {
   return {entry::kind::link, {target, static_cast<std::size_t>(length)}};
 }
 
-// Follows links, as the boot does when it writes there.
-std::string content_of(const char* path) {
-  if (!is_regular(path)) return {};
-  const int file = ::open(path, O_RDONLY | O_CLOEXEC);
-  if (file < 0) return {};
-  char text[longest_text];
-  const ssize_t length = ::read(file, text, sizeof text);
-  ::close(file);
-  return length <= 0 ? std::string()
-                     : std::string(text, static_cast<std::size_t>(length));
-}
-
 entry record_at(const char* path) {
   entry record = entry_at(path);
   if (record.what != entry::kind::file) return record;
-  if (::access(path, R_OK) != 0) record.error = errno;
-  record.text = content_of(path);
+  const int file = ::open(path, O_RDONLY | O_CLOEXEC);
+  if (file < 0) {
+    record.error = errno;
+    return record;
+  }
+  char text[longest_text];
+  const ssize_t length = ::read(file, text, sizeof text);
+  ::close(file);
+  if (length > 0) record.text.assign(text, static_cast<std::size_t>(length));
   return record;
 }
 
@@ -252,8 +248,8 @@ link_facts read_links() {
   links.record = record_at(paths::version_record);
   links.legacy_icutz = entry_at(paths::legacy_icu_link);
   links.old_icu = entry_at(paths::obsolete_icu);
-  if (::access(paths::version_record, W_OK) == 0)
-    links.recorded = content_of(paths::version_record);
+  links.is_recordable = is_regular(paths::version_record) &&
+                        ::access(paths::version_record, W_OK) == 0;
   links.zone_is_file = is_regular(paths::localtime_link);
   try {
     links.current_path = current_dataset_path();

@@ -9,9 +9,6 @@
 
 #include "support/version.h"
 
-// What is read of a link or a record.
-inline constexpr std::size_t longest_text = 4096;
-
 // What stands at a path. "none" is an answer, `unknown` comes with an errno.
 struct entry {
   enum class kind { none, link, file, directory, special, unknown };
@@ -67,9 +64,8 @@ struct link_facts {
   entry old_icu{};
   std::optional<std::string> current_path{};  // if "zoneinfo" is accepted
   link_pair pair = link_pair::no_dataset;
-  bool zone_is_file = false;  // "localtime" leads to a regular file
-  std::string recorded{};     // what a record holds, through links, that a boot
-                              // may write
+  bool zone_is_file = false;   // "localtime" leads to a regular file
+  bool is_recordable = false;  // a record, through links, that a boot may write
 };
 
 // A directory among the downloads, and the links that need it.
