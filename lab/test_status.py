@@ -428,7 +428,8 @@ CASES = {
         downloads__1={"name": "real", "needed_by": ["zoneinfo", "icutz"]}),
     "downloads that are a file": case(
         0, ("file", UPDATES), downloads=[], downloads_error="Not a directory"),
-    "var db is a file": case(2, ("file", "/var/db"), old_icu="unreachable"),
+    "var db is a file": case(2, ("file", "/var/db"), old_icu="unreachable",
+                             legacy_icu_link="unreachable"),
     "no var": case(2, ("drop", "/var")),
     "no timezone directory": case(2, ("drop", TIMEZONE), next_boot__ends="abnormally"),
     "nothing at all": case(2, ("drop", "/var"), ("drop", "/usr")),

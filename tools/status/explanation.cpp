@@ -50,6 +50,8 @@ constexpr row table[] = {
     {"legacy_icu_link", "nothing", "none", sound, "none"},
     {"legacy_icu_link", "nothing", "dangles", sound,
      "/var/db/icutz leads nowhere and counts as none"},
+    {"legacy_icu_link", "nothing", "unreachable", sound,
+     "/var/db/icutz cannot be looked at"},
     {"legacy_icu_link", "moved", "no_present_link", changes,
      "/var/db/icutz moves to /var/db/timezone/icutz"},
     {"legacy_icu_link", "removed", "present_link_resolves", changes,
@@ -62,7 +64,8 @@ constexpr row table[] = {
 
     {"old_icu", "nothing", "none", sound, "none"},
     {"old_icu", "removed", "obsolete", changes, "/var/db/icu is removed"},
-    {"old_icu", "nothing", "unreachable", sound, "it cannot be looked at"},
+    {"old_icu", "nothing", "unreachable", sound,
+     "/var/db/icu cannot be looked at"},
     {"old_icu", "kept", "not_removed", wrong, "/var/db/icu cannot be removed"},
 
     {"current", "not_reached", "earlier_failure", wrong, "not looked at"},
@@ -251,6 +254,8 @@ class account {
       return add(name, "removed", "not_migrated", {}, {}, said->error);
     if (device_.links.legacy_icutz.what == entry::kind::none)
       return add(name, "nothing", "none");
+    if (device_.links.legacy_icutz.what == entry::kind::unknown)
+      return add(name, "nothing", "unreachable");
     if (!device_.legacy_resolves) return add(name, "nothing", "dangles");
     if (device_.icutz_resolves)
       return add(name, "removed", "present_link_resolves");
