@@ -4,9 +4,10 @@
 Runs every test twice, the program that the tests boot included: built with
 AddressSanitizer, LeakSanitizer and UndefinedBehaviorSanitizer, and under valgrind's
 memcheck. Before that, each has to find a leak that was made on purpose. With an option
-only the one or the other. With the sanitizers marlin-status also tells of trees, and of
-random devices that are then booted. Left out is what the tool itself makes impossible: limits of
-memory, and under valgrind a limit of file sizes and a test that would take an hour.
+only the one or the other. With the sanitizers marlin-status also tells of trees, and
+of random devices that are then booted. Left out is what the tool itself makes
+impossible: limits of memory, and under valgrind a limit of file sizes and a test that
+would take an hour.
 
 Exit status: 0 without a finding, 1 with one or when a test fails, 2 for bad use.
 Reports are left in build/asan/findings and build/memcheck/findings.

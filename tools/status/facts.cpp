@@ -20,6 +20,7 @@
 #include "driver/dataset_links.h"
 #include "support/fsutil.h"
 #include "support/paths.h"
+#include "tools/status/line.h"
 
 namespace {
 
@@ -30,6 +31,7 @@ constexpr std::size_t most_names = 10000;
 constexpr uid_t nobody = 65534;
 
 unsigned refusals = 0;
+bool walk_was_refused = false;
 
 void note_refusal() {
   ++refusals;
@@ -215,6 +217,8 @@ dataset_facts facts_of(const std::string& path, const mln_dataset* system) {
   dataset_facts facts;
   facts.path = path;
   const unsigned before = refusals;
+  errno = 0;
+  walk_was_refused = false;
   try {
     const mln_dataset built(path);
     facts.version_text = built.version_string.substr(0, longest_word);
@@ -233,6 +237,7 @@ dataset_facts facts_of(const std::string& path, const mln_dataset* system) {
     facts.ends = dataset_facts::state::no_memory;
   }
   facts.word_is_cut = refusals != before;
+  if (walk_was_refused) facts.ends = dataset_facts::state::no_memory;
   if (facts.ends != dataset_facts::state::bad_path) note_unreadable(facts);
   return facts;
 }
@@ -261,6 +266,10 @@ link_facts read_links() {
 
 device_facts read_device() {
   std::set_new_handler(note_refusal);
+  // A walk that gets no memory looks like one that finds nothing.
+  take_lines([](const line& said) {
+    if (said.error == ENOMEM) walk_was_refused = true;
+  });
   device_facts device;
   device.links = read_links();
   device.legacy_resolves = fsutil::exists(paths::legacy_icu_link);
@@ -275,5 +284,6 @@ device_facts read_device() {
     device.update = facts_of(latest_update_path(), system.get());
   list_downloads(device);
   note_rights(device);
+  take_lines(nullptr);
   return device;
 }

@@ -139,10 +139,17 @@ std::vector<std::string> unknown(const report& told, bool is_running_system) {
 
 // A word that is cut costs one refusal, and an update's decides nothing.
 void insist_on_enough_memory(const report& told) {
+  using enum dataset_facts::state;
+  const auto lacks_memory = [](const std::optional<dataset_facts>& set) {
+    return set && set->ends == no_memory;
+  };
   unsigned expected = 0;
   for (const auto* set : {&told.device.current, &told.device.update})
     if (*set && !(*set)->path.empty() && (*set)->word_is_cut) ++expected;
-  if (told.device.system.word_is_cut || told.boot.refusals > expected)
+  if (told.device.system.word_is_cut || told.boot.refusals > expected ||
+      lacks_memory(told.device.current) || lacks_memory(told.device.update) ||
+      std::any_of(told.boot.lines.begin(), told.boot.lines.end(),
+                  [](const line& said) { return said.error == ENOMEM; }))
     throw cannot_tell("the next boot takes more than " +
                       std::to_string(most_memory >> 20) + " MB of memory");
 }
@@ -165,6 +172,7 @@ report examine(const options& chosen) {
   limit_time();
   report told;
   told.device = read_device();
+  insist_on_enough_memory(told);
   told.boot = rehearse_boot();
   told.after = read_links();
   insist_on_enough_memory(told);
