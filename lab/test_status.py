@@ -6,6 +6,7 @@ This takes a user who may have namespaces and is not root: lab.prove starts it s
 """
 
 import contextlib
+import functools
 import json
 import os
 import random
@@ -13,6 +14,7 @@ import re
 import shutil
 import stat
 import subprocess
+import tarfile
 import termios
 from errno import ENOENT
 from pathlib import Path
@@ -27,7 +29,7 @@ from lab.devices import CHOSEN
 from lab.paths import (DOWNLOADS, ICUTZ, LEGACY_ICUTZ, LOCALTIME, OLD_ICU, PLACES,
                        RECORD, SYSTEM_ICU, SYSTEM_ZONEINFO, TIMEZONE, TZ_LATEST,
                        ZONEINFO, update_path)
-from lab.places import BUILD
+from lab.places import BUILD, PROJECT
 from lab.properties import version_of
 from lab.random_devices import compose
 from lab.seen import Entries, Seen, as_device
@@ -599,6 +601,30 @@ def test_rows_fit_a_terminal():
         assert (b"\033[" in text) == colours
         plain = re.sub(rb"\033\[\d*m", b"", text)
         assert max(map(len, plain.replace(b"\r", b"").split(b"\n"))) <= 60
+
+
+def test_an_archive_as_the_page_says():
+    here = Path("/tmp/archive")
+    here.mkdir()
+    page = (PROJECT / "docs/marlin-status.8").read_text()
+    command = re.search(r"^\.Dl (mkdir device && .*)", page, re.M)[1]
+    unpack()
+    with tarfile.open(here / "device.tar", "w") as archive:
+        archive.add(TREE, ".")
+    run = functools.partial(subprocess.run, ["/bin/sh", "-c", command], cwd=here,
+                            env={"PATH": f"{Path(STATUS).parent}:/usr/bin"})
+    assert run().returncode == 0
+
+    shutil.rmtree(here / "device")
+    with tarfile.open(here / "device.tar", "a") as archive:
+        out = tarfile.TarInfo("out")
+        out.type, out.linkname = tarfile.SYMTYPE, "/tmp/outside"
+        archive.addfile(out)
+        for name in "out/file", "/tmp/outside/file", "../../outside/file":
+            archive.addfile(tarfile.TarInfo(name))
+    assert run(stderr=subprocess.DEVNULL).returncode == 1
+    assert not os.path.exists("/tmp/outside")
+    shutil.rmtree(here)
 
 
 @pytest.mark.parametrize("status, change", [
