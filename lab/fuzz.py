@@ -20,7 +20,8 @@ from lab.doors import Options, build, need, number, quietly, say, show_end, stop
 from lab.places import BUILD, PROJECT
 
 PLACE = BUILD / "fuzz"
-TARGETS = ["version_text", "icu_file_name", "zoneinfo_link", "first_word", "mounts"]
+TARGETS = ["version_text", "icu_file_name", "zoneinfo_link", "first_word", "mounts",
+           "telling"]
 
 
 # The format of seeds is told at the head of each file; tests/fuzz/replay.cpp reads it

@@ -4,8 +4,10 @@
 Runs every test twice, the program that the tests boot included: built with
 AddressSanitizer, LeakSanitizer and UndefinedBehaviorSanitizer, and under valgrind's
 memcheck. Before that, each has to find a leak that was made on purpose. With an option
-only the one or the other. Left out is what the tool itself makes impossible: limits of
-memory, and under valgrind a limit of file sizes and a test that would take an hour.
+only the one or the other. With the sanitizers marlin-status also tells of trees, and
+of random devices that are then booted. Left out is what the tool itself makes
+impossible: limits of memory, and under valgrind a limit of file sizes and a test that
+would take an hour.
 
 Exit status: 0 without a finding, 1 with one or when a test fails, 2 for bad use.
 Reports are left in build/asan/findings and build/memcheck/findings.
@@ -20,6 +22,7 @@ from pathlib import Path
 
 from lab.doors import Options, build, locked, need, quietly, say, show_end, stop
 from lab.places import BUILD, PROJECT, shown
+from lab.prove import trials
 
 LEAK = """int main() {
   char* volatile lost = new char[9];
@@ -135,6 +138,21 @@ TOOLS = {
 }
 
 
+def asked_about() -> int:
+    """What marlin-status says of trees and random devices, and the boots that follow:
+    a finding is a line too many. Returns how many tests have passed."""
+    folder = TOOLS["sanitizers"].folder
+    log = folder / "status.log"
+    with locked(folder):
+        quietly(log, *trials("sanitize", "--states", "200",
+                             "lab/test_status.py::test_a_tree",
+                             "lab/test_status.py::test_random_devices"),
+                env={**os.environ, "MARLIN": str(folder / "marlin")})
+    passed = re.search(r"^(\d+) passed", read(log), re.MULTILINE)
+    print(f"{shown(folder)}/tools/marlin-status: {passed[1]} tests", flush=True)
+    return int(passed[1])
+
+
 def read(file: Path) -> str:
     return file.read_text(errors="replace")
 
@@ -145,8 +163,10 @@ def main():
     for name in TOOLS:
         one.add_argument(f"--{name}", action="store_const", const=[name], dest="names")
     names = options.parse_args().names or list(TOOLS)
-    need("build", "private-device", "test", "sanitize")
+    need("build", "private-device", "test", "pytest", "prove", "sanitize")
     tests = sum(TOOLS[name].run() for name in names)
+    if "sanitizers" in names:
+        tests += asked_about()
     print(f"sanitize: {tests} tests with {' '.join(names)}: no finding")
 
 

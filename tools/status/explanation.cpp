@@ -8,6 +8,7 @@
 #include <utility>
 
 #include "tools/escaped.h"
+#include "tools/status/words.h"
 
 namespace {
 
@@ -49,6 +50,8 @@ constexpr row table[] = {
     {"legacy_icu_link", "nothing", "none", sound, "none"},
     {"legacy_icu_link", "nothing", "dangles", sound,
      "/var/db/icutz leads nowhere and counts as none"},
+    {"legacy_icu_link", "nothing", "unreachable", sound,
+     "/var/db/icutz cannot be looked at"},
     {"legacy_icu_link", "moved", "no_present_link", changes,
      "/var/db/icutz moves to /var/db/timezone/icutz"},
     {"legacy_icu_link", "removed", "present_link_resolves", changes,
@@ -61,7 +64,8 @@ constexpr row table[] = {
 
     {"old_icu", "nothing", "none", sound, "none"},
     {"old_icu", "removed", "obsolete", changes, "/var/db/icu is removed"},
-    {"old_icu", "nothing", "unreachable", sound, "it cannot be looked at"},
+    {"old_icu", "nothing", "unreachable", sound,
+     "/var/db/icu cannot be looked at"},
     {"old_icu", "kept", "not_removed", wrong, "/var/db/icu cannot be removed"},
 
     {"current", "not_reached", "earlier_failure", wrong, "not looked at"},
@@ -250,6 +254,8 @@ class account {
       return add(name, "removed", "not_migrated", {}, {}, said->error);
     if (device_.links.legacy_icutz.what == entry::kind::none)
       return add(name, "nothing", "none");
+    if (device_.links.legacy_icutz.what == entry::kind::unknown)
+      return add(name, "nothing", "unreachable");
     if (!device_.legacy_resolves) return add(name, "nothing", "dangles");
     if (device_.icutz_resolves)
       return add(name, "removed", "present_link_resolves");
@@ -392,11 +398,10 @@ class account {
       return add("record", "nothing", "no_activation");
     const dataset_facts& active =
         has(lines::incompatible) ? device_.system : compared();
-    const std::string change =
-        active.version_text + "_" + device_.update->version_text;
-    if (!after_.recorded.empty() && change.starts_with(after_.recorded))
-      return add("record", "written", "activation", change);
-    add("record", "not_written", "not_opened");
+    if (!after_.is_recordable)
+      return add("record", "not_written", "not_opened");
+    add("record", "written", "activation",
+        active.version_text + "_" + device_.update->version_text);
   }
 
   void last_resort(bool failed) {
@@ -433,7 +438,8 @@ class account {
       is_wrong("the system partition's data has no ICU schema");
     if (!boot_.ends_normally) return;
     if (after_.pair != link_pair::system && after_.pair != link_pair::update)
-      is_wrong("zoneinfo and icutz do not name the same data after the boot");
+      is_wrong(std::string("after the boot ") +
+               words_for(after_.pair).sentence);
     if (!after_.zone_is_file)
       is_wrong("the local zone's file cannot be reached after the boot");
   }

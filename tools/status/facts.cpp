@@ -20,18 +20,30 @@
 #include "driver/dataset_links.h"
 #include "support/fsutil.h"
 #include "support/paths.h"
+#include "tools/status/line.h"
 
 namespace {
 
 constexpr std::size_t longest_text = 4096;   // of a link or a record
 constexpr std::size_t longest_word = 65536;  // of a version or a schema
 constexpr std::size_t most_names = 10000;
+// How an owner appears whom this user namespace does not have.
+constexpr uid_t nobody = 65534;
 
 unsigned refusals = 0;
+bool walk_was_refused = false;
 
 void note_refusal() {
   ++refusals;
   throw std::bad_alloc();
+}
+
+bool is_same_directory(const std::string& left, const std::string& right) {
+  struct stat one {
+  }, other{};
+  return ::stat(left.c_str(), &one) == 0 &&
+         ::stat(right.c_str(), &other) == 0 && S_ISDIR(one.st_mode) &&
+         one.st_dev == other.st_dev && one.st_ino == other.st_ino;
 }
 
 bool is_regular(const std::string& path) {
@@ -54,23 +66,18 @@ entry entry_at(const char* path) {
   return {entry::kind::link, {target, static_cast<std::size_t>(length)}};
 }
 
-// Follows links, as the boot does when it writes there.
-std::string content_of(const char* path) {
-  if (!is_regular(path)) return {};
-  const int file = ::open(path, O_RDONLY | O_CLOEXEC);
-  if (file < 0) return {};
-  char text[longest_text];
-  const ssize_t length = ::read(file, text, sizeof text);
-  ::close(file);
-  return length <= 0 ? std::string()
-                     : std::string(text, static_cast<std::size_t>(length));
-}
-
 entry record_at(const char* path) {
   entry record = entry_at(path);
   if (record.what != entry::kind::file) return record;
-  if (::access(path, R_OK) != 0) record.error = errno;
-  record.text = content_of(path);
+  const int file = ::open(path, O_RDONLY | O_CLOEXEC);
+  if (file < 0) {
+    record.error = errno;
+    return record;
+  }
+  char text[longest_text];
+  const ssize_t length = ::read(file, text, sizeof text);
+  ::close(file);
+  if (length > 0) record.text.assign(text, static_cast<std::size_t>(length));
   return record;
 }
 
@@ -82,8 +89,17 @@ link_pair pair_of(const link_facts& links) {
     return has_icu ? link_pair::system_with_icu : link_pair::system;
   if (links.zoneinfo.text != path + "/zoneinfo") return link_pair::not_the_tree;
   if (!has_icu) return link_pair::update_without_icu;
-  return links.icutz.text == path + "/icutz" ? link_pair::update
-                                             : link_pair::update_with_other_icu;
+  const std::string icu = path + "/icutz";
+  return links.icutz.text == icu || is_same_directory(paths::icu_link, icu)
+             ? link_pair::update
+             : link_pair::update_with_other_icu;
+}
+
+// As a boot finds one: links, and what others may not read, do not count.
+bool is_icu_data(const std::string& path) {
+  struct stat status {};
+  return ::lstat(path.c_str(), &status) == 0 && S_ISREG(status.st_mode) &&
+         (status.st_mode & S_IROTH) != 0;
 }
 
 // The names in a directory, as it lists them, no more than anybody reads.
@@ -97,14 +113,6 @@ int list(const std::string& path, std::vector<std::string>& names) {
   }
   ::closedir(directory);
   return 0;
-}
-
-bool is_same_directory(const std::string& left, const std::string& right) {
-  struct stat one {
-  }, other{};
-  return ::stat(left.c_str(), &one) == 0 &&
-         ::stat(right.c_str(), &other) == 0 && S_ISDIR(one.st_mode) &&
-         one.st_dev == other.st_dev && one.st_ino == other.st_ino;
 }
 
 // By its text or by where it leads; what is in a directory needs that.
@@ -140,28 +148,37 @@ void list_downloads(device_facts& device) {
             });
 }
 
-// Whether another user owns a part that a boot reads or changes.
-bool is_foreign(const device_facts& device) {
-  std::vector<std::string> parts = {
-      "/usr",
-      "/usr/share",
-      "/var",
-      "/var/db",
-      "/var/db/timezone",
-      paths::download_root,
-      paths::system_zoneinfo,
-      std::string(paths::system_zoneinfo) + "/+VERSION",
-      paths::system_icu,
-      std::string(paths::system_icu) + "/icutzformat.txt",
-      paths::version_record};
+// Notes whose the parts are that a boot reads or changes. Whose those are that
+// it only reads does not matter where everybody may read them.
+void note_rights(device_facts& device) {
+  const auto look_at = [&](const std::string& part, bool is_changed) {
+    struct stat status {};
+    if (::stat(part.c_str(), &status) != 0) return;
+    const mode_t for_all = S_ISDIR(status.st_mode) ? 0555 : 0444;
+    const bool is_closed = (status.st_mode & for_all) != for_all;
+    device.has_closed_part = device.has_closed_part || is_closed;
+    if (status.st_uid == nobody && (is_changed || is_closed) &&
+        device.foreign_part.empty())
+      device.foreign_part = part;
+  };
+  // The owner of "/" is the device's root.
+  for (const char* part :
+       {"/", "/var/db", "/var/db/timezone", paths::version_record})
+    look_at(part, true);
+  const std::string& zone = device.links.localtime.text;
+  for (const std::string& part :
+       {std::string("/usr"), std::string("/usr/share"),
+        std::string(paths::system_zoneinfo),
+        std::string(paths::system_zoneinfo) + "/+VERSION",
+        std::string(paths::system_icu),
+        std::string(paths::system_icu) + "/icutzformat.txt",
+        std::string("/var"), std::string(paths::download_root),
+        zone.substr(0, zone.rfind('/'))})
+    look_at(part, false);
   for (const auto* set : {&device.current, &device.update})
     if (*set && !(*set)->path.empty())
       for (const char* part : {"", "/zoneinfo", "/zoneinfo/+VERSION", "/icutz"})
-        parts.push_back((*set)->path + part);
-  return std::any_of(parts.begin(), parts.end(), [](const std::string& part) {
-    struct stat status {};
-    return ::stat(part.c_str(), &status) == 0 && status.st_uid != ::geteuid();
-  });
+        look_at((*set)->path + part, false);
 }
 
 void expect_file(dataset_facts& facts, const std::string& path) {
@@ -187,7 +204,7 @@ void note_unreadable(dataset_facts& facts) {
   std::vector<std::string> schemas;
   for (const auto& name : names) {
     const std::string schema(icu_schema_in(name));
-    if (!schema.empty() && is_regular(icu + "/" + name))
+    if (!schema.empty() && is_icu_data(icu + "/" + name))
       schemas.push_back(schema);
   }
   facts.has_several_schemas =
@@ -200,6 +217,8 @@ dataset_facts facts_of(const std::string& path, const mln_dataset* system) {
   dataset_facts facts;
   facts.path = path;
   const unsigned before = refusals;
+  errno = 0;
+  walk_was_refused = false;
   try {
     const mln_dataset built(path);
     facts.version_text = built.version_string.substr(0, longest_word);
@@ -218,6 +237,7 @@ dataset_facts facts_of(const std::string& path, const mln_dataset* system) {
     facts.ends = dataset_facts::state::no_memory;
   }
   facts.word_is_cut = refusals != before;
+  if (walk_was_refused) facts.ends = dataset_facts::state::no_memory;
   if (facts.ends != dataset_facts::state::bad_path) note_unreadable(facts);
   return facts;
 }
@@ -233,7 +253,8 @@ link_facts read_links() {
   links.record = record_at(paths::version_record);
   links.legacy_icutz = entry_at(paths::legacy_icu_link);
   links.old_icu = entry_at(paths::obsolete_icu);
-  links.recorded = content_of(paths::version_record);
+  links.is_recordable = is_regular(paths::version_record) &&
+                        ::access(paths::version_record, W_OK) == 0;
   links.zone_is_file = is_regular(paths::localtime_link);
   try {
     links.current_path = current_dataset_path();
@@ -245,6 +266,10 @@ link_facts read_links() {
 
 device_facts read_device() {
   std::set_new_handler(note_refusal);
+  // A walk that gets no memory looks like one that finds nothing.
+  take_lines([](const line& said) {
+    if (said.error == ENOMEM) walk_was_refused = true;
+  });
   device_facts device;
   device.links = read_links();
   device.legacy_resolves = fsutil::exists(paths::legacy_icu_link);
@@ -258,6 +283,7 @@ device_facts read_device() {
   if (device.links.tz_latest.what == entry::kind::link)
     device.update = facts_of(latest_update_path(), system.get());
   list_downloads(device);
-  device.is_foreign = is_foreign(device);
+  note_rights(device);
+  take_lines(nullptr);
   return device;
 }

@@ -64,8 +64,8 @@ struct link_facts {
   entry old_icu{};
   std::optional<std::string> current_path{};  // if "zoneinfo" is accepted
   link_pair pair = link_pair::no_dataset;
-  bool zone_is_file = false;  // "localtime" leads to a regular file
-  std::string recorded{};     // what the record holds, through links
+  bool zone_is_file = false;   // "localtime" leads to a regular file
+  bool is_recordable = false;  // a record, through links, that a boot may write
 };
 
 // A directory among the downloads, and the links that need it.
@@ -84,7 +84,8 @@ struct device_facts {
   std::vector<download> downloads{};  // those that are needed first
   int downloads_error = 0;
   bool has_more_downloads = false;  // than are listed
-  bool is_foreign = false;          // a part of it is another user's
+  std::string foreign_part{};       // the first that is another user's
+  bool has_closed_part = false;     // one that not everybody may read
 };
 
 // The links as they are, also after a boot. Neither throws anything but

@@ -10,7 +10,7 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
-#include <exception>
+#include <new>
 #include <string>
 
 #include "tools/escaped.h"
@@ -61,40 +61,44 @@ void print_and_exit(const std::string& text) {
 }
 
 options parse(int count, char** words) {
-  static const option known[] = {{"root", required_argument, nullptr, 'r'},
-                                 {"json", no_argument, nullptr, 'j'},
-                                 {"check", no_argument, nullptr, 'c'},
-                                 {"help", no_argument, nullptr, 'h'},
-                                 {"version", no_argument, nullptr, 'v'},
+  // Numbers that no letter has.
+  enum { root = 256, json, check, help_, version };
+  static const option known[] = {{"root", required_argument, nullptr, root},
+                                 {"json", no_argument, nullptr, json},
+                                 {"check", no_argument, nullptr, check},
+                                 {"help", no_argument, nullptr, help_},
+                                 {"version", no_argument, nullptr, version},
                                  {}};
   options chosen;
   int letter = 0;
   opterr = 0;
   while ((letter = getopt_long(count, words, "+:h", known, nullptr)) != -1) {
     switch (letter) {
-      case 'r':
+      case root:
         chosen.root = optarg;
         break;
-      case 'j':
-      case 'c':
+      case json:
+      case check:
         if (chosen.wanted != form::rows)
           refuse(bad_use, "one of --json and --check is enough; see --help");
-        chosen.wanted = letter == 'j' ? form::json : form::reasons;
+        chosen.wanted = letter == json ? form::json : form::reasons;
         break;
       case 'h':
+      case help_:
         print_and_exit(help);
         break;
-      case 'v':
+      case version:
         print_and_exit("marlin-status " MARLIN_VERSION "\n");
         break;
       case ':':
         refuse(bad_use, "--root needs a directory; see --help");
       default:
-        refuse(bad_use, (optopt != 0 ? std::string("-") +
-                                           escaped(std::string(
-                                               1, static_cast<char>(optopt)))
-                                     : escaped(words[optind - 1])) +
-                            " is not understood; see --help");
+        refuse(bad_use,
+               (optopt != 0 && optopt < root
+                    ? std::string("-") +
+                          escaped(std::string(1, static_cast<char>(optopt)))
+                    : escaped(words[optind - 1])) +
+                   " is not understood; see --help");
     }
   }
   if (chosen.root.empty())
@@ -135,22 +139,30 @@ std::vector<std::string> unknown(const report& told, bool is_running_system) {
 
 // A word that is cut costs one refusal, and an update's decides nothing.
 void insist_on_enough_memory(const report& told) {
+  using enum dataset_facts::state;
+  const auto lacks_memory = [](const std::optional<dataset_facts>& set) {
+    return set && set->ends == no_memory;
+  };
   unsigned expected = 0;
   for (const auto* set : {&told.device.current, &told.device.update})
     if (*set && !(*set)->path.empty() && (*set)->word_is_cut) ++expected;
-  if (told.device.system.word_is_cut || told.boot.refusals > expected)
+  if (told.device.system.word_is_cut || told.boot.refusals > expected ||
+      lacks_memory(told.device.current) || lacks_memory(told.device.update) ||
+      std::any_of(told.boot.lines.begin(), told.boot.lines.end(),
+                  [](const line& said) { return said.error == ENOMEM; }))
     throw cannot_tell("the next boot takes more than " +
                       std::to_string(most_memory >> 20) + " MB of memory");
 }
 
 // In a user namespace this user is the device's root only as far as the device
-// is this user's. What is sound for somebody with less rights is sound.
+// is this user's. What is sound for somebody with the rights of everybody is
+// sound.
 void insist_on_rights(const report& told, const place& here) {
-  if (here.is_user_namespace && told.device.is_foreign &&
-      told.why.is != verdict::sound)
-    throw cannot_tell(
-        "a part of the device belongs to another user, whose rights this user "
-        "has not; run this as root");
+  if (!here.has_all_users && !told.device.foreign_part.empty() &&
+      (told.why.is != verdict::sound || told.device.has_closed_part))
+    throw cannot_tell(escaped(told.device.foreign_part) +
+                      " belongs to another user, whose rights this user has "
+                      "not; run this as root");
 }
 
 report examine(const options& chosen) {
@@ -160,6 +172,7 @@ report examine(const options& chosen) {
   limit_time();
   report told;
   told.device = read_device();
+  insist_on_enough_memory(told);
   told.boot = rehearse_boot();
   told.after = read_links();
   insist_on_enough_memory(told);
@@ -184,18 +197,28 @@ int tell(const options& chosen) {
 
 // In a child: whatever a device does to it, there is an answer.
 int tell_or_say_why_not(const options& chosen) {
+  std::string why;
   try {
     return tell(chosen);
-  } catch (const std::exception& reason) {
-    std::fprintf(stderr, "marlin-status: cannot tell: %s\n", reason.what());
-    return not_here;
+  } catch (const cannot_tell& reason) {
+    why = reason.what();
+  } catch (const std::bad_alloc&) {
+    why = "it takes more memory than there is";
+  } catch (...) {
+    why =
+        "what the boot did does not follow from what was read; is the device "
+        "being changed?";
   }
+  std::fprintf(stderr, "marlin-status: cannot tell: %s\n", why.c_str());
+  return not_here;
 }
 
 }  // namespace
 
 int main(int count, char** words) {
   const options chosen = parse(count, words);
+  // If it is ignored, nobody is told how a child ends.
+  ::signal(SIGCHLD, SIG_DFL);
   const pid_t child = ::fork();
   if (child < 0) refuse(not_here, std::string("fork: ") + std::strerror(errno));
   if (child == 0) {

@@ -12,7 +12,7 @@ constexpr std::size_t label_width = 12;
 constexpr std::size_t most_downloads = 20;
 
 std::string error_text(int error) {
-  return "(" + std::string(std::strerror(error)) + ")";
+  return std::string("(") + std::strerror(error) + ")";
 }
 
 std::string plain(const entry& here) {

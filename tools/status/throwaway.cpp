@@ -24,12 +24,14 @@
 #include <utility>
 #include <vector>
 
+#include "support/paths.h"
 #include "tools/escaped.h"
 #include "tools/status/mounts.h"
 
 namespace {
 
 constexpr char writable[] = "/var/db";
+constexpr char no_overlay[] = "an overlay cannot be had here";
 constexpr char downloads[] = "/var/db/timezone/tz";
 
 [[noreturn]] void fail(const std::string& what) {
@@ -74,18 +76,16 @@ void map_to_root(const char* file, unsigned id) {
   write_file(file, "0 " + std::to_string(id) + " 1\n");
 }
 
-// Returns whether it took a user namespace.
-bool enter_namespaces() {
+void enter_namespaces() {
   const unsigned user = ::geteuid();
   const unsigned group = ::getegid();
-  if (::unshare(CLONE_NEWNS) == 0) return false;
+  if (::unshare(CLONE_NEWNS) == 0) return;
   if (errno != EPERM) fail("unshare");
   must(::unshare(CLONE_NEWUSER | CLONE_NEWNS),
        "this user may not have namespaces");
   write_file("/proc/self/setgroups", "deny");
   map_to_root("/proc/self/uid_map", user);
   map_to_root("/proc/self/gid_map", group);
-  return true;
 }
 
 void set_attributes(int tree, unsigned flags, unsigned long attributes,
@@ -127,12 +127,12 @@ descriptor make_layer(const std::string& layer) {
   must(::chmod(upper.c_str(), status.st_mode & 07777), "chmod");
 
   const descriptor options(::fsopen("overlay", FSOPEN_CLOEXEC));
-  must(options.get(), "no overlay file system here: fsopen");
+  must(options.get(), no_overlay);
   const auto set = [&](const char* key, const char* value) {
     must(::fsconfig(options.get(),
                     value == nullptr ? FSCONFIG_SET_FLAG : FSCONFIG_SET_STRING,
                     key, value, 0),
-         "overlay");
+         no_overlay);
   };
   set("lowerdir", ".");
   set("upperdir", upper.c_str());
@@ -140,9 +140,9 @@ descriptor make_layer(const std::string& layer) {
   // Ordinary users may not set the attributes of the other kind.
   set("userxattr", nullptr);
   must(::fsconfig(options.get(), FSCONFIG_CMD_CREATE, nullptr, nullptr, 0),
-       "overlay");
+       no_overlay);
   descriptor mounted(::fsmount(options.get(), FSMOUNT_CLOEXEC, 0));
-  must(mounted.get(), "overlay");
+  must(mounted.get(), no_overlay);
   return mounted;
 }
 
@@ -170,16 +170,16 @@ class process {
     return std::string(path, static_cast<std::size_t>(length));
   }
 
-  std::string mounts() const {
+  std::string text_of(const char* name) const {
     const descriptor file(
-        ::openat(directory_.get(), "self/mountinfo", O_RDONLY | O_CLOEXEC));
-    must(file.get(), "/proc/self/mountinfo");
+        ::openat(directory_.get(), name, O_RDONLY | O_CLOEXEC));
+    must(file.get(), name);
     std::string text;
     char buffer[4096];
     ssize_t count = 0;
     while ((count = ::read(file.get(), buffer, sizeof buffer)) > 0)
       text.append(buffer, static_cast<std::size_t>(count));
-    must(count, "/proc/self/mountinfo");
+    must(count, name);
     return text;
   }
 
@@ -213,10 +213,13 @@ class layers {
     const descriptor base = open_inside(root_, writable, O_DIRECTORY);
     // Without the directory there is nothing that a boot could write to.
     if (base.get() < 0) return;
+    insist_on_no_marks();
     const std::string top = self_.path_of(base);
+    // Without the layer, in which a file of an update could be such a mark.
+    const descriptor kept = open_inside(root_, downloads, O_DIRECTORY);
 
     std::vector<std::pair<std::string, descriptor>> mounted;
-    for (const auto& place : mounts_below(self_.mounts(), top))
+    for (const auto& place : mounts_below(self_.text_of("self/mountinfo"), top))
       mounted.emplace_back(place, open_inside(root_, inside(place), 0));
     over(base, base.get(), inside(top));
     for (const auto& [place, lower] : mounted) {
@@ -227,10 +230,27 @@ class layers {
       else
         over(lower, target.get(), inside(place));
     }
-    protect_downloads();
+    protect_downloads(kept);
   }
 
  private:
+  // A file system with layers marks an entry that is deleted by such a device.
+  void insist_on_no_marks() const {
+    for (const char* path :
+         {"/var/db/timezone", paths::icu_link, paths::localtime_link,
+          paths::zoneinfo_link, paths::latest_update_link,
+          paths::version_record, paths::legacy_icu_link, paths::obsolete_icu,
+          downloads}) {
+      struct stat status {};
+      const descriptor here = open_inside(root_, path, O_NOFOLLOW);
+      if (::fstat(here.get(), &status) == 0 && S_ISCHR(status.st_mode) &&
+          status.st_rdev == 0)
+        throw cannot_tell(
+            std::string(path) +
+            " is a device with the number 0, which no layer can show");
+    }
+  }
+
   static std::string inside(const std::string& place) {
     return place.substr(std::strlen("/root"));
   }
@@ -257,10 +277,10 @@ class layers {
     attach(layer, target);
   }
 
-  void protect_downloads() const {
+  void protect_downloads(const descriptor& kept) const {
     const descriptor tz = open_inside(root_, downloads, O_DIRECTORY);
-    if (tz.get() < 0) return;
-    const descriptor copy = clone_tree(tz.get(), AT_RECURSIVE);
+    if (kept.get() < 0 || tz.get() < 0) return;
+    const descriptor copy = clone_tree(kept.get(), AT_RECURSIVE);
     set_attributes(copy.get(), AT_RECURSIVE, MOUNT_ATTR_RDONLY);
     attach(copy, tz.get());
   }
@@ -275,10 +295,12 @@ class layers {
 
 place enter_throwaway_device(const std::string& root) {
   place here;
-  here.is_user_namespace = enter_namespaces();
+  enter_namespaces();
   must(::mount(nullptr, "/", nullptr, MS_REC | MS_PRIVATE, nullptr), "mount");
   const descriptor device = open_directory(root);
   const process self;
+  here.has_all_users =
+      self.text_of("self/uid_map").find("4294967295") != std::string::npos;
   here.is_running_system = self.path_of(device) == "/";
 
   // Taken before anything is covered.
@@ -306,6 +328,7 @@ void become_the_boot() {
   ::setgroups(0, nullptr);
   const rlimit none{0, 0};
   must(::setrlimit(RLIMIT_CORE, &none), "setrlimit");
+  ::umask(022);
   must(::prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0), "no_new_privs");
   __user_cap_header_struct header{_LINUX_CAPABILITY_VERSION_3, 0};
   const __user_cap_data_struct no_capability[2] = {};

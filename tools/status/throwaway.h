@@ -21,7 +21,7 @@ struct cannot_tell : std::runtime_error {
 // chroot(2).
 struct place {
   bool is_running_system = false;  // `root` is this system's
-  bool is_user_namespace = false;
+  bool has_all_users = false;      // and is in no user namespace with fewer
 };
 place enter_throwaway_device(const std::string& root);
 
