@@ -21,6 +21,7 @@
 #include <csignal>
 #include <cstdint>
 #include <cstring>
+#include <tuple>
 #include <utility>
 #include <vector>
 
@@ -326,6 +327,7 @@ void end_with_parent() { ::prctl(PR_SET_PDEATHSIG, SIGKILL); }
 void become_the_boot() {
   // Not allowed where this user is not really root, and needless there.
   ::setgroups(0, nullptr);
+  std::ignore = ::setresgid(0, 0, 0);
   const rlimit none{0, 0};
   must(::setrlimit(RLIMIT_CORE, &none), "setrlimit");
   ::umask(022);
