@@ -411,6 +411,10 @@ const hostile hostile_updates[] = {
     {"AReleaseWithBytesForATerminal",
      [] { make_file(zones + "/+VERSION", "2024b\033[0m\n"); },
      "zoneinfo/+VERSION says 2024b\\x1b[0m, another release than its name"},
+    {"AReleaseWithoutAnEnd",
+     [] { make_file(zones + "/+VERSION", std::string(1u << 20, '2')); },
+     "zoneinfo/+VERSION says " + std::string(40, '2') +
+         ", another release than its name"},
     {"NoZone",
      [] {
        wipe(zones);
