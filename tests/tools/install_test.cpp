@@ -505,6 +505,10 @@ TEST_F(Installer, RefusesANameThatIsNoVersion) {
                                  "nothing was changed\n"));
     EXPECT_EQ(link_at(tz_latest), nothing);
   }
+  expect_end(1,
+             "marlin-install: /: its name is no version such as 2024a.1.0; "
+             "nothing was changed\n",
+             {"/"});
 }
 
 TEST_F(Installer, RefusesWhatIsNoDirectory) {
