@@ -11,6 +11,7 @@ from __future__ import annotations
 import contextlib
 import datetime
 import difflib
+import json
 import os
 import shutil
 import signal
@@ -141,7 +142,7 @@ class Story:
         self.endings = []  # of scenes, in the words of the summary
         self.facts = []  # as they were found
         self.wrong = []  # where that is not as claimed
-        self.installer = ""  # what it said since the last boot
+        self.told = {}  # by make-update and marlin-install, since the last boot
 
     def bring(self, source: str, target: str):
         """Has the device hold what stands somewhere in the data."""
@@ -171,8 +172,13 @@ class Story:
                               capture_output=True)
         shutil.rmtree(unpacked)
         self.device.root = as_device(namespace.look()).root
-        self.installer = (done.stdout or done.stderr).strip()
-        self.note([f"installer: {data_set} -> {done.returncode}"])
+        made = json.loads((data.TARGET / f"{data_set}.json").read_text())
+        zones = ", ".join(made["changed"])
+        self.told = {
+            "made": [f"{version} by make-update; differ from the system's: {zones}"],
+            "installer": [(done.stdout or done.stderr).strip()]}
+        self.note([f"made: {data_set} differs in -> {zones}",
+                   f"installer: {data_set} -> {done.returncode}"])
 
     def make_real(self):
         # What is there already, from the boot before, is not made anew.
@@ -192,13 +198,13 @@ class Story:
         before = namespace.look()
         expected, reasons = self.foretold()
         print()
-        for name, told in {"installer": [self.installer],
-                           "foretold": reasons or ["no change"]}.items():
-            for text in filter(None, told):
+        self.told["foretold"] = reasons or ["no change"]
+        for name, told in self.told.items():
+            for text in told:
                 for part in screen.broken(text):
                     screen.field(name, part)
                     name = ""
-        self.installer = ""
+        self.told = {}
         was = self.rows(before)
         booted = boot.boot()
         seen = Seen(before, namespace.look(), *booted)
