@@ -640,7 +640,8 @@ def test_missing_tools(place):
 
 
 @pytest.mark.parametrize("tool", ["zic", "zdump", "derb", "icupkg"])
-@pytest.mark.parametrize("script", ["echo a\nb >&2; exit 3", "kill -SEGV $$"])
+@pytest.mark.parametrize("script", ["echo a\nb >&2; exit 3", "kill -SEGV $$",
+                                    "exec yes", "exec yes >&2"])
 def test_failing_tools(place, fake, tool, script):
     refused(update(place, environment=fake(**{tool: script})), f"{tool}: ")
     assert os.listdir(place / "out") == []
@@ -648,7 +649,9 @@ def test_failing_tools(place, fake, tool, script):
 
 def test_a_file_that_cannot_be_written(place):
     """As on a full disk, in the middle of the tree."""
-    refused(ran(["/usr/bin/prlimit", "--fsize=100000", *make_update(place)]), "")
+    (place / "rules/leapseconds").write_bytes(bytes(3 << 20))
+    refused(ran(["/usr/bin/prlimit", "--fsize=2000000", *make_update(place)]),
+            "File too large; nothing was made")
     assert os.listdir(place / "out") == []
 
 

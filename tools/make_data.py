@@ -10,6 +10,7 @@ import io
 import json
 import os
 import re
+import resource
 import shutil
 import signal
 import stat
@@ -32,6 +33,7 @@ TABLES = ("iso3166.tab", "leap-seconds.list", "leapseconds", "tzdata.zi",
 LARGEST = 16 << 20  # bytes of one input file; ten times what the largest has today
 INT_MAX = 2147483647
 SECONDS = 60  # a tool that takes longer hangs
+MOST = 4 * LARGEST  # bytes that a tool prints or packs; a small file can stand for more
 HERE = "l" if sys.byteorder == "little" else "b"
 
 
@@ -110,18 +112,30 @@ def need(*tools: str):
 
 def output(*command, folder: Path, remedy: str, **environment: str) -> str:
     """What a tool prints. One that fails is a refusal that quotes its first line."""
-    try:
-        done = subprocess.run(
-            command, cwd=folder, capture_output=True, text=True, errors="replace",
-            timeout=SECONDS, stdin=subprocess.DEVNULL,
-            env={"PATH": os.environ["PATH"], "LC_ALL": "C", "TZ": "UTC0"} | environment)
-    except subprocess.TimeoutExpired:
-        raise Refused(f"{command[0]} takes too long; {remedy}") from None
-    if done.returncode:
-        lines = done.stderr.strip() or f"it ended with status {done.returncode}"
-        line = lines.splitlines()[0].removeprefix(f"{command[0]}: ")
-        raise Refused(f"{command[0]}: {line}; {remedy}")
-    return done.stdout
+    with (tempfile.TemporaryFile("w+", errors="replace") as printed,
+          tempfile.TemporaryFile("w+", errors="replace") as errors):
+        try:
+            status = subprocess.run(
+                command, cwd=folder, stdin=subprocess.DEVNULL, stdout=printed,
+                stderr=errors, preexec_fn=limited, timeout=SECONDS,
+                env={"PATH": os.environ["PATH"], "LC_ALL": "C", "TZ": "UTC0"}
+                | environment).returncode
+        except subprocess.TimeoutExpired:
+            raise Refused(f"{command[0]} takes too long; {remedy}") from None
+        if status:
+            errors.seek(0)
+            line = errors.read(1000).strip() or f"it ended with status {status}"
+            line = line.splitlines()[0].removeprefix(f"{command[0]}: ")
+            raise Refused(f"{command[0]}: {line}; {remedy}")
+        printed.seek(0)
+        return printed.read()
+
+
+def limited():
+    """Run in the place of a tool, before it: larger files end it."""
+    _, hard = resource.getrlimit(resource.RLIMIT_FSIZE)
+    resource.setrlimit(resource.RLIMIT_FSIZE, (
+        MOST if hard == resource.RLIM_INFINITY else min(MOST, hard), hard))
 
 
 # --- Versions ---------------------------------------------------------------------
