@@ -284,6 +284,13 @@ def test_zones_come_and_go(place):
     assert facts["removed"] == ["Portugal"]
 
 
+def test_a_zone_like_an_option(place):
+    append("Z -v 0 - X\n")(place)
+    compiled = place / "system/zoneinfo.default"
+    shutil.copy(compiled / "Europe/Paris", compiled / "-v")
+    assert made(update(place, "--json"))["changed"] == ["-v", *LISBON]
+
+
 def test_a_past_change(place):
     """Cairo's local mean time differs, and nothing after 1900."""
     edit("rules/tzdata.zi", "\nZ Africa/Cairo 2:5:9 - LMT",

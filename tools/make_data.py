@@ -429,7 +429,7 @@ def differing(old: Path, new: Path, since: int, years: int) -> dict[str, list[st
 
 def clocks(tree: Path, names: list[str], since: int, until: int) -> list[str]:
     """For each zone its offset at the beginning and its changes until the end."""
-    text = output("zdump", "-i", "-t", f"{since},{until}", *names, folder=tree,
+    text = output("zdump", "-i", "-t", f"{since},{until}", "--", *names, folder=tree,
                   remedy=f"check the zones in {tree}", TZDIR=str(tree.absolute()))
     found = re.split(r'^TZ="[^\n]*\n', text, flags=re.MULTILINE)[1:]
     if len(found) != len(names):
