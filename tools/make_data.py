@@ -154,7 +154,7 @@ def version(text: str) -> tuple[int, str, int, int]:
 
 
 def release_of(text: str, where: str) -> str:
-    if not re.fullmatch("[0-9]+[a-z]+", text):
+    if not re.fullmatch("[0-9]+[a-z]+", text) or len(text) > 40:
         raise Refused(f"{where} says '{text[:40]}', which is not a release; "
                       "expected is one like 2024a")
     version(text)
@@ -299,11 +299,11 @@ def same_release(rules: Rules, icu: Icu):
 
 def fitting_schema(schema: str, icu: Icu, whose: str):
     """`schema` is that of a system."""
-    if not re.fullmatch("[0-9]+[lbe]", schema):
+    if not re.fullmatch("[0-9]{1,40}[lbe]", schema):
         raise Refused(f"{whose} is '{schema[:40]}', which is not an ICU schema; "
                       "expected is one like 44l")
     if icu.schema not in ("", schema):
-        raise Refused(f"the ICU data has the schema {icu.schema}, and {whose} is "
+        raise Refused(f"the ICU data has the schema {icu.schema[:40]}, and {whose} is "
                       f"{schema}; take ICU data that was made for {schema}")
     if icu.letter != schema[-1]:
         raise Refused(f"the ICU data has the byte order '{icu.letter}', and {whose} "
