@@ -76,3 +76,14 @@ def test_mixed_links_are_mended(zoneinfo, icutz):
         f"marlin-mend: {ZONEINFO} did not fit {ICUTZ}; marlin makes both anew")
     device.drop(ZONEINFO)
     compare("the boot after the mend", device, before, ending, log)
+
+
+def test_a_failing_mend_stops_no_boot():
+    """It is another program here, which only fails."""
+    device = activation("2023d.1.0")
+    device.drop(ICUTZ)
+    namespace.build(device)
+    before = namespace.look()
+    assert boot.boot().ending == "exit 0"
+    expected(device, Condition())
+    fail("the boot", entry_differences(device, namespace.look()), before)

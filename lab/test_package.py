@@ -307,12 +307,27 @@ def test_tmpfiles_make_the_two_directories(package, unit):
         assert directory.stat().st_mode == 0o42770
 
 
+# What the examples say about switching it on.
+MEND = {"init-script": ("  # run /", "  run /"),
+        "inittab": ("(timeout", "(/usr/libexec/marlin-mend; timeout")}
+
+
+@pytest.mark.parametrize("test", ["a_new_device_boots", "mixed_links_are_mended",
+                                  "a_failing_mend_stops_no_boot"])
 @pytest.mark.parametrize("example, arguments", [("init-script", "start"),
                                                 ("inittab", "")])
-def test_an_example_for_another_init_system_boots(package, unit, example, arguments):
-    """With the program where it was unpacked. The mounts are there, and the paths of
-    busybox may differ."""
+def test_an_example_for_another_init_system_boots(package, unit, example, arguments,
+                                                  test):
+    """With the program where it was unpacked, and the mend switched on as the example
+    says. The mounts are there, and the paths of busybox may differ."""
     text = (package.content / "usr/share/doc/marlin/examples" / example).read_text()
+    if "mend" in test:
+        off, on = MEND[example]
+        assert text.count(off) == 1
+        text = text.replace(off, on)
+    if "failing" in test:
+        text = text.replace("/usr/libexec/marlin-mend", "/bin/false")
+    assert max(map(len, text.splitlines())) < 256  # what busybox takes
     text = text.replace("/usr/libexec/marlin", f"{package.content}/usr/libexec/marlin")
     if example == "inittab":
         text = "\n".join(re.findall("^::sysinit:((?!.*mount).*)$", text, re.M))
@@ -320,7 +335,7 @@ def test_an_example_for_another_init_system_boots(package, unit, example, argume
     (place / example).write_text(text)
     (place / "marlin").write_text(f"#!/bin/sh\nexec sh {place}/{example} {arguments}\n")
     (place / "marlin").chmod(0o755)
-    boot("test_a_new_device_boots", place / "marlin")
+    boot(f"test_{test}", place / "marlin")
 
 
 @pytest.fixture(scope="module")
