@@ -1,9 +1,11 @@
 # SPDX-License-Identifier: BSD-2-Clause
 """Every system call of an installation fails, in turn, with every error number that
-such a call can return, once and for good; so do those of pruning and withdrawing.
-Afterwards the old or the new update is announced, and whole; one line tells the reason;
-the next boot takes what is announced, or stays; and the next run is undisturbed."""
+such a call can return, once and for good; so do those of pruning and withdrawing; and
+memory is refused wherever it asks the system for more. Afterwards the old or the new
+update is announced, and whole; one line tells the reason; the next boot takes what is
+announced, or stays; and the next run is undisturbed."""
 
+import re
 from errno import (EAGAIN, EDQUOT, EEXIST, EINTR, EIO, EMLINK, ENOLCK, ENOSPC,
                    ENOTDIR, ENOTEMPTY, EPERM, EROFS, EXDEV, errorcode)
 
@@ -11,10 +13,12 @@ import pytest
 
 from lab import boot
 from lab.carriers import namespace
-from lab.install import (BUSY, DONE, FAILED, NEW, NOT_NEWER, SCENES, announced, calls,
-                         hidden, names, next_boot, runs_again, traced, violations)
-from lab.paths import update_path
+from lab.install import (BUSY, DONE, FAILED, HIDDEN, NEW, NOT_NEWER, PROGRAM, SCENES,
+                         announced, calls, hidden, names, next_boot, runs_again, traced,
+                         violations)
+from lab.paths import DOWNLOADS, update_path
 from lab.test_faults import CHANGE, ERRORS, LASTING, OPEN
+from lab.test_memory import refusals
 from lab.trial import fail
 
 MORE = {
@@ -92,3 +96,36 @@ def test_a_call_that_fails(scene, call, error, when, telling, count):
     count(f"that end with {told.ending}")
     runs_again(words, before)
     next_boot(namespace.look())
+
+
+@pytest.mark.parametrize("scene", SCENES)
+def test_memory_is_refused(scene, count):
+    make, words = SCENES[scene]
+    namespace.build(make())
+    for options in refusals([PROGRAM, *words]):
+        namespace.build(make())
+        before = namespace.look()
+        told = traced(words, *options)
+        after = namespace.look()
+        found = violations(words, before, after)
+        failed = told.ending == FAILED
+        if not failed and told.ending != DONE or told.log.count("\n") != failed:
+            found.append("this is not one line and its status")
+        fail(f"{told} with {options[-1]}", found, before)
+        count(f"refusals of memory that end with {told.ending}")
+        runs_again(words, before)
+
+
+@pytest.mark.parametrize("scene, fails, name", [
+    # What another user left stands in the way of a directory of its name only.
+    ("the next update", boot.failing("unlinkat", EPERM, "1+"), HIDDEN + "new"),
+    ("the next update", [], NEW), ("pruning", [], f"({NEW}|2023d.1.0)")])
+def test_a_set_of_another_user(scene, fails, name):
+    make, words = SCENES[scene]
+    namespace.build(make())
+    before = namespace.look()
+    told = traced(words, *boot.inject("geteuid", "retval=4711", "1+"), *fails)
+    assert told.ending == FAILED
+    assert re.fullmatch(f"marlin-install: (.*: )?{DOWNLOADS}{name} belongs to another "
+                        "user, who has to remove it(; .*)?\n", told.log)
+    fail(f"{told}", violations(words, before, namespace.look()), before)

@@ -284,6 +284,13 @@ def test_zones_come_and_go(place):
     assert facts["removed"] == ["Portugal"]
 
 
+def test_a_zone_like_an_option(place):
+    append("Z -v 0 - X\n")(place)
+    compiled = place / "system/zoneinfo.default"
+    shutil.copy(compiled / "Europe/Paris", compiled / "-v")
+    assert made(update(place, "--json"))["changed"] == ["-v", *LISBON]
+
+
 def test_a_past_change(place):
     """Cairo's local mean time differs, and nothing after 1900."""
     edit("rules/tzdata.zi", "\nZ Africa/Cairo 2:5:9 - LMT",
@@ -432,6 +439,10 @@ REFUSALS = {
     "two byte orders": (other_order("metaZones.res"), "differ in byte order"),
     "character set": (damaged(BIG, 9, b"\1"), "differ in byte order"),
     "labelled schema": (write("icu/icutzformat.txt", b"44l\n"), "has the schema 44l"),
+    "long label": (write("icu/icutzformat.txt", b"4" * 99),
+                   f"has the schema {'4' * 40}, and"),
+    "system's long schema": (write("system/icu/icutzformat.txt", b"4" * 99 + b"l"),
+                             "is not an ICU schema"),
     "format of resources": (damaged("system/icu/metaZones.res", 16, b"\1"),
                             "another format of resource files"),
     "system's schema": (write("system/icu/icutzformat.txt", b"\x1b[2J l\n"),
@@ -448,6 +459,8 @@ REFUSALS = {
                      "is not a release"),
     "unknown": (edit("rules/tzdata.zi", "# version 20", "# version unknown-20"),
                 "is not a release"),
+    "long release": (edit("rules/tzdata.zi", "# version 20", "# version 20" + "2" * 99),
+                     f"says '20{'2' * 38}', which is not a release"),
     "large year": (edit("rules/tzdata.zi", "# version 20", "# version 999999999920"),
                    "is not a version"),
     "empty rules": (write("rules/tzdata.zi", b""), "has no '# version'"),
@@ -640,7 +653,8 @@ def test_missing_tools(place):
 
 
 @pytest.mark.parametrize("tool", ["zic", "zdump", "derb", "icupkg"])
-@pytest.mark.parametrize("script", ["echo a\nb >&2; exit 3", "kill -SEGV $$"])
+@pytest.mark.parametrize("script", ["echo a\nb >&2; exit 3", "kill -SEGV $$",
+                                    "exec yes", "exec yes >&2"])
 def test_failing_tools(place, fake, tool, script):
     refused(update(place, environment=fake(**{tool: script})), f"{tool}: ")
     assert os.listdir(place / "out") == []
@@ -648,7 +662,9 @@ def test_failing_tools(place, fake, tool, script):
 
 def test_a_file_that_cannot_be_written(place):
     """As on a full disk, in the middle of the tree."""
-    refused(ran(["/usr/bin/prlimit", "--fsize=100000", *make_update(place)]), "")
+    (place / "rules/leapseconds").write_bytes(bytes(3 << 20))
+    refused(ran(["/usr/bin/prlimit", "--fsize=2000000", *make_update(place)]),
+            "File too large; nothing was made")
     assert os.listdir(place / "out") == []
 
 

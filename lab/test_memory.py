@@ -97,30 +97,33 @@ def boot_without_memory(device, made, way):
     return model.Outcome(kernel, refused.lines, ending)
 
 
-@pytest.mark.parametrize("name", CHOSEN)
-def test_memory_is_refused(name, count):
-    """At each request for memory of a pass, in turn. With no reserve the program makes
-    one for every few pages."""
+def refusals(command):
+    """The options that refuse a program memory, in turn, at each of its requests from
+    its first look at the device on. Without a reserve it makes one for a few pages."""
     options = ["-E", "MALLOC_TOP_PAD_=0", "-e", f"trace={boot.TRACED},brk,mmap"]
-    real(name)
-    boot.traced(*options)
+    boot.traced(*options, command=command)
     undisturbed = list(boot.calls())
     start = boot.beginning(undisturbed)
     # A loader may have mapped what it loaded. brk(2) itself never fails: it returns
     # where the heap ends.
     mapped = sum(call.call == "mmap" for call in undisturbed[:start])
     options += boot.failing("mmap", ENOMEM, f"{mapped + 1}+")
-    for call in undisturbed[start:]:
-        if call.call == "brk":
-            count("refusals of memory")
-            way = refuse(name, call.number, options)
-            count(f"refusals after which {way}")
+    return [options + boot.inject("brk", "retval=0", call.number)
+            for call in undisturbed[start:] if call.call == "brk"]
 
 
-def refuse(name, request, options):
+@pytest.mark.parametrize("name", CHOSEN)
+def test_memory_is_refused(name, count):
+    real(name)
+    for options in refusals([boot.PROGRAM]):
+        count("refusals of memory")
+        count(f"refusals after which {refuse(name, options)}")
+
+
+def refuse(name, options):
     """The way in which the boot did without."""
     built, before = real(name)
-    booted = boot.traced(*options, *boot.inject("brk", "retval=0", request))
+    booted = boot.traced(*options)
     seen = Seen(before, namespace.look(), *booted, list(boot.calls()))
     refused = [index for index, call in enumerate(seen.calls) if call.injected]
     assert [seen.calls[index].call for index in refused[:2]] == ["brk", "mmap"]
@@ -137,4 +140,4 @@ def refuse(name, request, options):
         if not found:
             return title
         attempts += [f"if {title}:"] + found
-    return fail(f"memory refused at request {request}", attempts, before)
+    return fail(f"memory refused with {options[-1]}", attempts, before)

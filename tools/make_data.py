@@ -10,6 +10,7 @@ import io
 import json
 import os
 import re
+import resource
 import shutil
 import signal
 import stat
@@ -32,6 +33,7 @@ TABLES = ("iso3166.tab", "leap-seconds.list", "leapseconds", "tzdata.zi",
 LARGEST = 16 << 20  # bytes of one input file; ten times what the largest has today
 INT_MAX = 2147483647
 SECONDS = 60  # a tool that takes longer hangs
+MOST = 4 * LARGEST  # bytes that a tool prints or packs; a small file can stand for more
 HERE = "l" if sys.byteorder == "little" else "b"
 
 
@@ -110,18 +112,30 @@ def need(*tools: str):
 
 def output(*command, folder: Path, remedy: str, **environment: str) -> str:
     """What a tool prints. One that fails is a refusal that quotes its first line."""
-    try:
-        done = subprocess.run(
-            command, cwd=folder, capture_output=True, text=True, errors="replace",
-            timeout=SECONDS, stdin=subprocess.DEVNULL,
-            env={"PATH": os.environ["PATH"], "LC_ALL": "C", "TZ": "UTC0"} | environment)
-    except subprocess.TimeoutExpired:
-        raise Refused(f"{command[0]} takes too long; {remedy}") from None
-    if done.returncode:
-        lines = done.stderr.strip() or f"it ended with status {done.returncode}"
-        line = lines.splitlines()[0].removeprefix(f"{command[0]}: ")
-        raise Refused(f"{command[0]}: {line}; {remedy}")
-    return done.stdout
+    with (tempfile.TemporaryFile("w+", errors="replace") as printed,
+          tempfile.TemporaryFile("w+", errors="replace") as errors):
+        try:
+            status = subprocess.run(
+                command, cwd=folder, stdin=subprocess.DEVNULL, stdout=printed,
+                stderr=errors, preexec_fn=limited, timeout=SECONDS,
+                env={"PATH": os.environ["PATH"], "LC_ALL": "C", "TZ": "UTC0"}
+                | environment).returncode
+        except subprocess.TimeoutExpired:
+            raise Refused(f"{command[0]} takes too long; {remedy}") from None
+        if status:
+            errors.seek(0)
+            line = errors.read(1000).strip() or f"it ended with status {status}"
+            line = line.splitlines()[0].removeprefix(f"{command[0]}: ")
+            raise Refused(f"{command[0]}: {line}; {remedy}")
+        printed.seek(0)
+        return printed.read()
+
+
+def limited():
+    """Run in the place of a tool, before it: larger files end it."""
+    _, hard = resource.getrlimit(resource.RLIMIT_FSIZE)
+    resource.setrlimit(resource.RLIMIT_FSIZE, (
+        MOST if hard == resource.RLIM_INFINITY else min(MOST, hard), hard))
 
 
 # --- Versions ---------------------------------------------------------------------
@@ -140,7 +154,7 @@ def version(text: str) -> tuple[int, str, int, int]:
 
 
 def release_of(text: str, where: str) -> str:
-    if not re.fullmatch("[0-9]+[a-z]+", text):
+    if not re.fullmatch("[0-9]+[a-z]+", text) or len(text) > 40:
         raise Refused(f"{where} says '{text[:40]}', which is not a release; "
                       "expected is one like 2024a")
     version(text)
@@ -285,11 +299,11 @@ def same_release(rules: Rules, icu: Icu):
 
 def fitting_schema(schema: str, icu: Icu, whose: str):
     """`schema` is that of a system."""
-    if not re.fullmatch("[0-9]+[lbe]", schema):
+    if not re.fullmatch("[0-9]{1,40}[lbe]", schema):
         raise Refused(f"{whose} is '{schema[:40]}', which is not an ICU schema; "
                       "expected is one like 44l")
     if icu.schema not in ("", schema):
-        raise Refused(f"the ICU data has the schema {icu.schema}, and {whose} is "
+        raise Refused(f"the ICU data has the schema {icu.schema[:40]}, and {whose} is "
                       f"{schema}; take ICU data that was made for {schema}")
     if icu.letter != schema[-1]:
         raise Refused(f"the ICU data has the byte order '{icu.letter}', and {whose} "
@@ -415,7 +429,7 @@ def differing(old: Path, new: Path, since: int, years: int) -> dict[str, list[st
 
 def clocks(tree: Path, names: list[str], since: int, until: int) -> list[str]:
     """For each zone its offset at the beginning and its changes until the end."""
-    text = output("zdump", "-i", "-t", f"{since},{until}", *names, folder=tree,
+    text = output("zdump", "-i", "-t", f"{since},{until}", "--", *names, folder=tree,
                   remedy=f"check the zones in {tree}", TZDIR=str(tree.absolute()))
     found = re.split(r'^TZ="[^\n]*\n', text, flags=re.MULTILINE)[1:]
     if len(found) != len(names):

@@ -5,7 +5,7 @@ changes its zone.
 
 Made are a system partition's data, a download, a later one whose ICU data has another
 schema, and what a still later system brings, each a `zoneinfo` tree beside an `icu` or
-`icutz` directory; and a program that reads ICU's data.
+`icutz` directory; what make-update told of each; and a program that reads ICU's data.
 """
 
 import shutil
@@ -46,10 +46,12 @@ def make():
         releases.make_system(made.system, made.icu, system)
         releases.make_system(made.upgrade, made.icu, upgrade)
         releases.make_system(made.system, made.other_icu, other)
-        releases.make_update(made.update, system, work)
-        releases.make_update(made.refused, other, work)
-        Path(work, names().update).rename(TARGET / "update")
-        Path(work, names().refused).rename(TARGET / "refused")
+        for name, partition in (("update", system), ("refused", other)):
+            told = releases.output(*releases.tool(
+                "make-update", **releases.given(getattr(made, name)),
+                system=partition, out=work), "--json")
+            (TARGET / f"{name}.json").write_bytes(told)
+            Path(work, getattr(names(), name)).rename(TARGET / name)
         for partition in (system, upgrade):
             (partition / "zoneinfo.default").rename(partition / "zoneinfo")
             partition.rename(TARGET / partition.name)

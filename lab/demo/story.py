@@ -11,7 +11,7 @@ from __future__ import annotations
 import contextlib
 import datetime
 import difflib
-import itertools
+import json
 import os
 import shutil
 import signal
@@ -142,7 +142,7 @@ class Story:
         self.endings = []  # of scenes, in the words of the summary
         self.facts = []  # as they were found
         self.wrong = []  # where that is not as claimed
-        self.installer = ""  # what it said since the last boot
+        self.told = {}  # by make-update and marlin-install, since the last boot
 
     def bring(self, source: str, target: str):
         """Has the device hold what stands somewhere in the data."""
@@ -162,14 +162,20 @@ class Story:
     def install(self, data_set: str):
         """With marlin-install, on the device as it is."""
         self.make_real()
-        unpacked = Path("/tmp", getattr(self.names, data_set))
+        version = getattr(self.names, data_set)
+        unpacked = Path("/tmp", version)
         shutil.copytree(data.TARGET / data_set, unpacked, symlinks=True)
         done = subprocess.run([COMPANIONS / "marlin-install", unpacked],
                               capture_output=True, text=True)
         shutil.rmtree(unpacked)
         self.device.root = as_device(namespace.look()).root
-        self.installer = (done.stdout or done.stderr).strip()
-        self.note([f"installer: {data_set} -> {done.returncode}"])
+        made = json.loads((data.TARGET / f"{data_set}.json").read_text())
+        zones = ", ".join(made["changed"])
+        self.told = {
+            "made": [f"{version} by make-update; differ from the system's: {zones}"],
+            "installer": [(done.stdout or done.stderr).strip()]}
+        self.note([f"made: {data_set} differs in -> {zones}",
+                   f"installer: {data_set} -> {done.returncode}"])
 
     def make_real(self):
         # What is there already, from the boot before, is not made anew.
@@ -189,10 +195,10 @@ class Story:
         before = namespace.look()
         expected, reasons = self.foretold()
         print()
-        screen.field("installer", *screen.broken(self.installer))
-        screen.field("foretold", *itertools.chain.from_iterable(
-            map(screen.broken, reasons or ["no change"])))
-        self.installer = ""
+        self.told["foretold"] = reasons or ["no change"]
+        for name, told in self.told.items():
+            screen.field(name, *(part for text in told for part in screen.broken(text)))
+        self.told = {}
         was = self.rows(before)
         booted = boot.boot()
         seen = Seen(before, namespace.look(), *booted)

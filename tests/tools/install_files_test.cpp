@@ -20,6 +20,11 @@ TEST(JoinedPath, IsTheWayByTheTextAlone) {
   EXPECT_EQ(joined("a", ".."), "");
   EXPECT_EQ(joined("a", "../.."), "");
   EXPECT_EQ(joined("a", "../../a/b"), "");
+  EXPECT_EQ(joined("a", "."), "a/");
+  EXPECT_EQ(joined("a/b", ".."), "a/");
+  EXPECT_EQ(joined("a", "b/../c"), "a/b/../c") << "b may be missing, or a file";
+  EXPECT_EQ(joined("a", "b/"), "a/b/") << "b may be a file";
+  EXPECT_EQ(joined("a", "b/./"), "a/b/");
 }
 
 class Removal : public DeviceTest {

@@ -365,6 +365,12 @@ const hostile hostile_updates[] = {
      "zoneinfo/CET is a link that does not lead to a zone"},
     {"ALinkToADirectory", [] { make_link(zones + "/EU", "Europe"); },
      "zoneinfo/EU is a link that does not lead to a zone"},
+    {"ALinkToAFileAsADirectory",
+     [] { make_link(zones + "/CET", "Europe/Paris/"); },
+     "zoneinfo/CET is a link that does not lead to a zone"},
+    {"ALinkByWayOfNothing",
+     [] { make_link(zones + "/CET", "Asia/../Europe/Paris"); },
+     "zoneinfo/CET is a link that does not lead to a zone"},
     {"ALinkToATable", [] { make_link(zones + "/CET", "+VERSION"); },
      "zoneinfo/CET is a link that does not lead to a zone"},
     {"ALinkWithBytesForATerminal",
@@ -405,6 +411,10 @@ const hostile hostile_updates[] = {
     {"AReleaseWithBytesForATerminal",
      [] { make_file(zones + "/+VERSION", "2024b\033[0m\n"); },
      "zoneinfo/+VERSION says 2024b\\x1b[0m, another release than its name"},
+    {"AReleaseWithoutAnEnd",
+     [] { make_file(zones + "/+VERSION", std::string(1u << 20, '2')); },
+     "zoneinfo/+VERSION says " + std::string(40, '2') +
+         ", another release than its name"},
     {"NoZone",
      [] {
        wipe(zones);
@@ -437,6 +447,10 @@ const hostile hostile_updates[] = {
      "zoneinfo/Europe/Paris can be written by all"},
     {"ADirectoryThatAllMayWrite", [] { set_mode(zones + "/Europe", 0777); },
      "zoneinfo/Europe can be written by all"},
+    {"AnUpdateThatAllMayWrite", [] { set_mode(source, 01777); },
+     "the update can be written by all"},
+    {"AnUpdateThatNobodyMayEnter", [] { set_mode(source, 0700); },
+     "the update cannot be read by all"},
     {"AFileThatRunsAsSomebodyElse", [] { set_mode(paris, 04755); },
      "zoneinfo/Europe/Paris runs as somebody else"},
     {"AnotherEntry", [] { make_file(source + "/README"); },
@@ -491,6 +505,10 @@ TEST_F(Installer, RefusesANameThatIsNoVersion) {
                                  "nothing was changed\n"));
     EXPECT_EQ(link_at(tz_latest), nothing);
   }
+  expect_end(1,
+             "marlin-install: /: its name is no version such as 2024a.1.0; "
+             "nothing was changed\n",
+             {"/"});
 }
 
 TEST_F(Installer, RefusesWhatIsNoDirectory) {

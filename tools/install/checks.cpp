@@ -45,7 +45,7 @@ void check_version(const std::string& name, bool any_age) {
 
 void check_contents(const std::string& name, const contents& update) {
   if (update.release != release_in(name))
-    refuse("zoneinfo/+VERSION says " + escaped(update.release) +
+    refuse("zoneinfo/+VERSION says " + escaped(update.release.substr(0, 40)) +
            ", another release than its name");
   const std::string schema = system_schema();
   if (update.schema != schema)

@@ -82,6 +82,7 @@ class walk {
   explicit walk(receiver& to) : to_(to) {}
 
   contents all_of(int directory) {
+    check_mode("the update", status_of(directory, ".", "the update").st_mode);
     for (const auto& name : names_in(directory, 3, "the update")) {
       if (name != "icutz" && name != "zoneinfo")
         refuse(escaped(name) + " does not belong into an update");

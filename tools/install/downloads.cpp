@@ -64,6 +64,7 @@ void downloads::delete_hidden() {
 std::string downloads::incoming_path() const { return path_of(incoming); }
 
 descriptor downloads::make_incoming() {
+  insist_on_own(incoming);
   if (::mkdirat(sets_.number(), incoming, 0700) != 0)
     fail("make the directory", path_of(incoming));
   return open_directory(sets_.number(), incoming, path_of(incoming));

@@ -28,6 +28,7 @@ struct update {
 std::string name_of(std::string path) {
   while (path.size() > 1 && path.ends_with('/')) path.pop_back();
   std::string name = path.substr(path.rfind('/') + 1);
+  if (name.empty()) return path;
   if (name != "." && name != "..") return name;
   const std::unique_ptr<char, decltype(&std::free)> whole(
       ::realpath(path.c_str(), nullptr), &std::free);

@@ -19,7 +19,7 @@ int main(int argc, char** argv) {
     std::fprintf(stderr, "marlin-install: %s\n", told.line.c_str());
     return told.exit_status;
   } catch (const std::bad_alloc&) {
-    std::fputs("marlin-install: out of memory; nothing was changed\n", stderr);
+    std::fputs("marlin-install: out of memory; run it again\n", stderr);
     return status::failed;
   }
 }
