@@ -75,7 +75,10 @@ class Kernel:
         if error is not None:
             raise failure(error)
 
-    def _existing(self, path, follow):
+    @system_call
+    def _find(self, call, path, follow=True):
+        """What a call finds at its path: (directory, name, node)."""
+        self._call(call, path)
         directory, name, node = self.device.walk(path, follow)
         if node is None:
             raise failure(ENOENT)
@@ -86,15 +89,12 @@ class Kernel:
         directory.entries[name] = node
         self.changed |= {directory, node}
 
-    @system_call
     def access(self, path):
-        self._call("access", path)
-        self._existing(path, follow=True)
+        self._find("access", path)
 
     @system_call
     def readlink(self, path):
-        self._call("readlink", path)
-        node = self._existing(path, follow=False)[2]
+        node = self._find("readlink", path, follow=False)[2]
         if node.kind != "link":
             raise failure(EINVAL)
         return node.text
@@ -113,8 +113,7 @@ class Kernel:
 
     @system_call
     def unlink(self, path):
-        self._call("unlink", path)
-        directory, name, node = self._existing(path, follow=False)
+        directory, name, node = self._find("unlink", path, follow=False)
         directory.insist_on(3)
         if node.kind == "dir":
             raise failure(EISDIR)
@@ -123,8 +122,7 @@ class Kernel:
 
     @system_call
     def rmdir(self, path):
-        self._call("rmdir", path)
-        directory, name, node = self._existing(path, follow=False)
+        directory, name, node = self._find("rmdir", path, follow=False)
         directory.insist_on(3)
         if node.kind != "dir":
             raise failure(ENOTDIR)
@@ -135,8 +133,7 @@ class Kernel:
 
     @system_call
     def open(self, path):
-        self._call("open", path)
-        node = self._existing(path, follow=True)[2]
+        node = self._find("open", path)[2]
         node.insist_on(4)
         return node
 
@@ -175,15 +172,11 @@ class Kernel:
         """A descriptor is closed whatever this reports."""
         quietly(self._call, "close")
 
-    @system_call
     def stat(self, path):
-        self._call("stat", path)
-        return self._existing(path, follow=True)[2]
+        return self._find("stat", path)[2]
 
-    @system_call
     def lstat(self, path):
-        self._call("lstat", path)
-        return self._existing(path, follow=False)[2]
+        return self._find("lstat", path, follow=False)[2]
 
     def entry_status(self, directory, name):
         """lstat(2) of a name in the working directory."""
@@ -249,8 +242,7 @@ class Boot:
         self.lines = []
 
     def warn(self, form: str, *arguments):
-        text = form % tuple(
-            shown(a) if isinstance(a, str) else a for a in arguments)
+        text = form % tuple(shown(a) if isinstance(a, str) else a for a in arguments)
         self.lines.append((text, self.kernel.last_error))
 
     # --- 2. The primitives --------------------
