@@ -42,9 +42,6 @@ ENVIRONMENT = {"PATH": "/usr/bin:/bin:/usr/sbin", "LC_ALL": "C.UTF-8",
                    str(place) for place in UNPACKED.glob("usr/lib/*-linux-gnu"))}
 
 
-# --- The device -------------------------------------------------------------------
-
-
 def device_with(system: str, links: tuple[str, ...], update: str | None) -> Device:
     """A device with a system partition's data and both updates; one is in use."""
     device = Device()
@@ -79,9 +76,6 @@ def booted(expected: str):
     """Boots; the tree in use is then the expected one."""
     assert boot.boot().ending == "exit 0"
     assert os.readlink(ZONEINFO) == expected
-
-
-# --- Asking -----------------------------------------------------------------------
 
 
 @contextlib.contextmanager
@@ -188,9 +182,6 @@ def commands() -> list[str]:
         with contextlib.suppress(OSError):
             found.append(process.read_text())
     return found
-
-
-# --- The scenes -------------------------------------------------------------------
 
 
 @pytest.fixture(scope="module")
