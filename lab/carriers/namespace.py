@@ -27,23 +27,18 @@ def why_not_private() -> str:
     if INSIDE not in os.environ:
         return "this is not a private device"
     kinds = {}
-    with open("/proc/self/mountinfo", encoding="latin-1") as mounts:
-        for line in mounts:
-            before, after = line.split(" - ", 1)
-            kinds[before.split()[4]] = after.split()[0]
+    for line in Path("/proc/self/mountinfo").read_text("latin-1").splitlines():
+        before, after = line.split(" - ", 1)
+        kinds[before.split()[4]] = after.split()[0]
     places = ("/",) + PLACES
     for place in places:
         if kinds.get(place) != "tmpfs":
             return f"{place} is not a throw-away file system in memory"
     if len({os.stat(place).st_dev for place in places}) != len(places):
         return "/var/db and /usr/share are not file systems of their own"
-    with open("/proc/self/status", encoding="latin-1") as status:
-        if "CapEff:\t0000000000000000" not in status.read():
-            return "this process has capabilities, so permissions mean nothing"
+    if "CapEff:\t0000000000000000" not in Path("/proc/self/status").read_text():
+        return "this process has capabilities, so permissions mean nothing"
     return ""
-
-
-# --- Building ------------------------------------------------------------------
 
 
 def wipe():
@@ -92,9 +87,6 @@ def build_below(path: str, node: Node, exists=False):
         kinds = {"fifo": stat.S_IFIFO, "socket": stat.S_IFSOCK}
         os.mknod(raw, kinds[node.kind] | 0o600)
     os.chmod(raw, node.mode)
-
-
-# --- Looking -------------------------------------------------------------------
 
 
 def look() -> Entries:
