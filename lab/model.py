@@ -560,8 +560,7 @@ def zoneinfo_path(path):
 class Outcome:
     """What one boot comes to; the device itself has been changed."""
     def __init__(self, kernel, lines, ending):
-        self.calls = kernel.calls
-        self.changed = kernel.changed
+        self.calls, self.changed = kernel.calls, kernel.changed
         self.lines = lines
         self.ending = ending  # "exit 0", "abort" or "killed"
 
