@@ -34,10 +34,9 @@ def output(*command, **options) -> bytes:
 
 
 def find(what: str, pattern: str, text: str) -> re.Match[str]:
-    found = re.search(pattern, text, re.MULTILINE)
-    if not found:
-        raise NotOfTheForm(f"this machine has no {what} of the expected form")
-    return found
+    if found := re.search(pattern, text, re.MULTILINE):
+        return found
+    raise NotOfTheForm(f"this machine has no {what} of the expected form")
 
 
 def tool(name: str, **options: str | Path) -> list[str]:

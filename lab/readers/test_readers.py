@@ -47,15 +47,11 @@ def device_with(system: str, links: tuple[str, ...], update: str | None) -> Devi
     device = Device()
     for name, place in (("zoneinfo", SYSTEM_ZONEINFO), ("icu", SYSTEM_ICU)):
         device.put(place, namespace.description_of(data.TARGET / system / name))
+    wanted = dict(LINKS[name] for name in links)
     Path("/etc/localtime").unlink(missing_ok=True)
-    os.symlink(LOCALTIME, "/etc/localtime")
-    for name in links:
-        link, target = LINKS[name]
-        if link.startswith("/etc/"):
-            Path(link).unlink()
-            os.symlink(target, link)
-        else:
-            device.link(link, target)
+    os.symlink(wanted.pop("/etc/localtime", LOCALTIME), "/etc/localtime")
+    for link, target in wanted.items():
+        device.link(link, target)
     for update_set in ("update", "refused"):
         device.put(update_path(getattr(data.names(), update_set)),
                    namespace.description_of(data.TARGET / update_set))
