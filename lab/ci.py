@@ -22,10 +22,9 @@ from lab.places import BUILD, PROJECT
 LONGEST_DOOR = 40  # lines; more of them are logic, which belongs into lab/
 
 
-def run(*command, words="", **options):
+def run(*command, words=""):
     """Runs a command in the project's folder; `words` go to its standard input."""
-    status = subprocess.run(command, cwd=PROJECT, input=words, text=True,
-                            **options).returncode
+    status = subprocess.run(command, cwd=PROJECT, input=words, text=True).returncode
     if status:
         stop(1, f"exit status {status}: {shlex.join(map(str, command))}")
 
@@ -109,8 +108,7 @@ STAGES = {
     "readers": ("real programs read what the document says; its recipe",
                 door("readers")),
     "bench": ("the cost of a boot has not grown", door("bench", "--check")),
-    "package": ("the package, and the boot unit in it",
-                door("package")),
+    "package": ("the package, and the boot unit in it", door("package")),
     "arm64": ("arm64: build without a warning, all tests under qemu-user",
               door("test", "arm64-dev")),
     "device": ("an emulated device: sequences of boots, power cuts",

@@ -11,25 +11,15 @@ Only where several ways would do are the calls those that the program chose: how
 much it reads at a time, that it asks what kind of file it has open, the walk. In
 goes a device; out come the device afterwards, the lines that are printed, how the
 process ends, and every file-system call on the way, in order, any of which can be
-made to fail.
-
-The sections, from the bottom up:
-  1. the file-system calls, which can be made to fail
-  2. the four primitives, and the C library's remove(3)
-  3. the first word of a file
-  4. the walk through a directory of ICU data
-  5. version texts
-  6. components and data sets
-  7. the links that are read
-  8. the legacy link, local time, the record
-  9. the pass
+made to fail. The sections go from the bottom up.
 """
 
 import functools
 import os
 import re
-from errno import EEXIST, EINVAL, EISDIR, ENOENT, ENAMETOOLONG, ENOTDIR
-from errno import ENOTEMPTY, ERANGE
+from contextlib import suppress
+from errno import (EEXIST, EINVAL, EISDIR, ENAMETOOLONG, ENOENT, ENOTDIR, ENOTEMPTY,
+                   ERANGE)
 from typing import NamedTuple
 
 from lab import lines
@@ -76,6 +66,7 @@ class Kernel:
         # A walk that cannot be started takes a lack of memory, not a failing call.
         self.walk_error = lambda path: None
 
+    @system_call
     def _call(self, name, path=None):
         if len(self.calls) + 1 == self.killed_before:
             raise Killed()
@@ -84,21 +75,26 @@ class Kernel:
         if error is not None:
             raise failure(error)
 
-    def _existing(self, path, follow):
+    @system_call
+    def _find(self, call, path, follow=True):
+        """What a call finds at its path: (directory, name, node)."""
+        self._call(call, path)
         directory, name, node = self.device.walk(path, follow)
         if node is None:
             raise failure(ENOENT)
         return directory, name, node
 
-    @system_call
+    def _make(self, directory, name, node):
+        directory.insist_on(3)
+        directory.entries[name] = node
+        self.changed |= {directory, node}
+
     def access(self, path):
-        self._call("access", path)
-        self._existing(path, follow=True)
+        self._find("access", path)
 
     @system_call
     def readlink(self, path):
-        self._call("readlink", path)
-        node = self._existing(path, follow=False)[2]
+        node = self._find("readlink", path, follow=False)[2]
         if node.kind != "link":
             raise failure(EINVAL)
         return node.text
@@ -113,15 +109,11 @@ class Kernel:
         directory, name, node = self.device.walk(path, follow=False)
         if node is not None:
             raise failure(EEXIST)
-        directory.insist_on(3)
-        made = Node("link", text=target)
-        directory.entries[name] = made
-        self.changed |= {directory, made}
+        self._make(directory, name, Node("link", text=target))
 
     @system_call
     def unlink(self, path):
-        self._call("unlink", path)
-        directory, name, node = self._existing(path, follow=False)
+        directory, name, node = self._find("unlink", path, follow=False)
         directory.insist_on(3)
         if node.kind == "dir":
             raise failure(EISDIR)
@@ -130,8 +122,7 @@ class Kernel:
 
     @system_call
     def rmdir(self, path):
-        self._call("rmdir", path)
-        directory, name, node = self._existing(path, follow=False)
+        directory, name, node = self._find("rmdir", path, follow=False)
         directory.insist_on(3)
         if node.kind != "dir":
             raise failure(ENOTDIR)
@@ -142,8 +133,7 @@ class Kernel:
 
     @system_call
     def open(self, path):
-        self._call("open", path)
-        node = self._existing(path, follow=True)[2]
+        node = self._find("open", path)[2]
         node.insist_on(4)
         return node
 
@@ -153,10 +143,8 @@ class Kernel:
         self._call("create", path)
         directory, name, node = self.device.walk(path, follow=True)
         if node is None:
-            directory.insist_on(3)
             node = Node("file", 0o644)  # 0666 as this device's umask cuts it
-            directory.entries[name] = node
-            self.changed |= {directory, node}
+            self._make(directory, name, node)
             return node
         if node.kind == "dir":
             raise failure(EISDIR)
@@ -172,34 +160,24 @@ class Kernel:
             raise failure(EISDIR)
         return node.text[position:position + size]
 
-    @system_call
     def write(self, node, text):
         self._call("write")
         node.text += text
         self.changed.add(node)
 
-    @system_call
     def fstat(self):
         self._call("fstat")
 
     def close(self):
         """A descriptor is closed whatever this reports."""
-        try:
-            self._call("close")
-        except OSError as failed:
-            self.last_error = failed.errno
+        quietly(self._call, "close")
 
-    @system_call
     def stat(self, path):
-        self._call("stat", path)
-        return self._existing(path, follow=True)[2]
+        return self._find("stat", path)[2]
 
-    @system_call
     def lstat(self, path):
-        self._call("lstat", path)
-        return self._existing(path, follow=False)[2]
+        return self._find("lstat", path, follow=False)[2]
 
-    @system_call
     def entry_status(self, directory, name):
         """lstat(2) of a name in the working directory."""
         self._call("lstat", name)
@@ -212,7 +190,6 @@ class Kernel:
         if node is not None:
             node.insist_on(1)
 
-    @system_call
     def getdents(self, node):
         self._call("getdents")
         return list(node.entries)
@@ -240,7 +217,6 @@ def shown(text):
 
 
 UNSET_VERSION = (-1, "", -1, -1)
-WHITE_SPACE = " \t\n\v\f\r"
 INT_MAX = 2147483647
 LONG_MAX = 9223372036854775807
 # How much is read at a time; the outcome does not depend on it.
@@ -266,8 +242,7 @@ class Boot:
         self.lines = []
 
     def warn(self, form: str, *arguments):
-        text = form % tuple(
-            shown(a) if isinstance(a, str) else a for a in arguments)
+        text = form % tuple(shown(a) if isinstance(a, str) else a for a in arguments)
         self.lines.append((text, self.kernel.last_error))
 
     # --- 2. The primitives --------------------
@@ -282,11 +257,7 @@ class Boot:
             raise Thrown from failed
 
     def exists(self, path):
-        try:
-            self.kernel.access(path)
-        except OSError:
-            return False
-        return True
+        return quietly(self.kernel.access, path)
 
     def read_symlink(self, path):
         try:
@@ -311,10 +282,7 @@ class Boot:
             self.kernel.unlink(path)
         except OSError as failed:
             if failed.errno == EISDIR:
-                try:
-                    self.kernel.rmdir(path)
-                except OSError:
-                    pass
+                quietly(self.kernel.rmdir, path)
 
     # --- 3. The first word of a file --------------------
 
@@ -335,7 +303,7 @@ class Boot:
         except OSError:
             return ""
         text = ""
-        try:
+        with suppress(OSError):
             while True:
                 some = self.kernel.read(file, READ_SIZE, len(text))
                 text += some
@@ -343,11 +311,8 @@ class Boot:
                     text, max(0, len(text) - len(some) - 1))
                 if not some or word_has_ended:
                     break
-        except OSError:
-            pass
         self.kernel.close()
-        word = text.lstrip(WHITE_SPACE)
-        return re.split(r"[ \t-\r]", word, maxsplit=1)[0]
+        return re.match(r"[ \t-\r]*([^ \t-\r]*)", text)[1]
 
     # --- 4. The walk through a directory of ICU data --------------------
 
@@ -417,12 +382,10 @@ class Boot:
             last_error = kernel.last_error
             try:
                 for name in kernel.getdents(directory):
-                    try:
+                    with suppress(OSError):
                         node = (kernel.entry_status(directory, name)
                                 if moves else kernel.lstat(root + "/" + name))
                         entries.append((name, node))
-                    except OSError:
-                        pass
                 kernel.getdents(directory)  # the end of the list
             except OSError as failed:
                 if failed.errno == ENOENT:
@@ -466,24 +429,16 @@ class Boot:
             self.warn(lines.BAD_PATH, path)
             raise Thrown
         version = self.parse_version(version_text)
-        if path == "":
-            schema = self.first_word(SYSTEM_ICU + "/icutzformat.txt")
-        else:
-            schema = self.icu_schema(path)
+        schema = (self.first_word(SYSTEM_ICU + "/icutzformat.txt") if path == ""
+                  else self.icu_schema(path))
         return DataSet(path, version_text, version, schema)
 
     def activate(self, data_set):
-        self.activate_zoneinfo(data_set)
-        self.activate_icu(data_set)
-
-    def activate_zoneinfo(self, data_set):
         try:
             self.remove(ZONEINFO)
         except Thrown:
             self.warn(lines.ZONEINFO_NOT_UNLINKED)
         self.create_symlink(zoneinfo_path(data_set.path), ZONEINFO)
-
-    def activate_icu(self, data_set):
         try:
             self.remove(ICUTZ)
             self.remove(LEGACY_ICUTZ)
@@ -495,15 +450,10 @@ class Boot:
     def reset_to_system_partition(self):
         self.activate(self.data_set(""))
 
-    # --- 7. The links that are read --------------------
-
-    def latest_update_path(self):
-        return self.read_symlink(TZ_LATEST)
+    # --- 7. The link that is in use --------------------
 
     def current_dataset_path(self):
-        return self.dataset_path_from_link(self.read_symlink(ZONEINFO))
-
-    def dataset_path_from_link(self, target):
+        target = self.read_symlink(ZONEINFO)
         if len(target) >= 21 and target[:20] == DOWNLOADS:
             last_slash = target.rindex("/")
             if last_slash > 20:
@@ -553,10 +503,7 @@ class Boot:
             file = self.kernel.create(RECORD)
         except OSError:
             return
-        try:
-            self.kernel.write(file, old.version_text + "_" + new.version_text)
-        except OSError:
-            pass
+        quietly(self.kernel.write, file, old.version_text + "_" + new.version_text)
         self.kernel.close()
 
     # --- 9. The pass --------------------
@@ -574,7 +521,7 @@ class Boot:
 
     def select_data_set(self):
         system = self.data_set("")
-        latest = self.latest_update_path()
+        latest = self.read_symlink(TZ_LATEST)
         try:
             current_path = self.current_dataset_path()
         except Thrown:
@@ -613,8 +560,7 @@ def zoneinfo_path(path):
 class Outcome:
     """What one boot comes to; the device itself has been changed."""
     def __init__(self, kernel, lines, ending):
-        self.calls = kernel.calls
-        self.changed = kernel.changed
+        self.calls, self.changed = kernel.calls, kernel.changed
         self.lines = lines
         self.ending = ending  # "exit 0", "abort" or "killed"
 

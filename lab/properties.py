@@ -22,25 +22,13 @@ from lab.seen import Entries, Seen, as_device
 
 # Every line, by a letter; the first text that fits counts.
 LETTERS = {
-    "r": lines.READ_SYMLINK,
-    "c": lines.CREATE_SYMLINK,
-    "u": lines.REMOVE,
-    "m": lines.NOT_MIGRATED,
-    "l": lines.LEGACY_NOT_REMOVED,
-    "z": lines.ZONEINFO_NOT_UNLINKED,
-    "i": lines.ICU_NOT_UNLINKED,
-    "v": lines.VERSION_GROUPS,
-    "w": lines.VERSION,
-    "n": lines.NO_SCHEMA,
-    "b": lines.BAD_LINK,
-    "p": lines.BAD_PATH,
-    "I": lines.INVALID_LINKS,
-    "S": lines.INCOMPATIBLE,
-    "U": lines.NO_DATA,
-    "N": lines.NOT_NEWER,
-    "C": lines.CORRECTING,
-    "D": lines.LOCALTIME_INVALID % DEFAULT_ZONE,
-}
+    "r": lines.READ_SYMLINK, "c": lines.CREATE_SYMLINK, "u": lines.REMOVE,
+    "m": lines.NOT_MIGRATED, "l": lines.LEGACY_NOT_REMOVED,
+    "z": lines.ZONEINFO_NOT_UNLINKED, "i": lines.ICU_NOT_UNLINKED,
+    "v": lines.VERSION_GROUPS, "w": lines.VERSION, "n": lines.NO_SCHEMA,
+    "b": lines.BAD_LINK, "p": lines.BAD_PATH, "I": lines.INVALID_LINKS,
+    "S": lines.INCOMPATIBLE, "U": lines.NO_DATA, "N": lines.NOT_NEWER,
+    "C": lines.CORRECTING, "D": lines.LOCALTIME_INVALID % DEFAULT_ZONE}
 PATTERNS = {letter: re.compile(lines.pattern(text), re.DOTALL)
             for letter, text in LETTERS.items()}
 LINE = re.compile(f"{lines.NAME}(.*?): (?:%s)\n" % "|".join(
@@ -63,8 +51,7 @@ OUTCOMES = {
     "reset": START + LOST + REFUSED + ZONE,
     "activation": START + DATA_SET + ACTIVATED + ZONE,
     "reset and activation": START + LOST + ACTIVATED + ZONE,
-    "last resort": f"{START}(r|({DATA_SET}|{LOST})(p|{ACTIVATED}c)?)"
-    f"U{RESET}{ZONE}",
+    "last resort": f"{START}(r|({DATA_SET}|{LOST})(p|{ACTIVATED}c)?)U{RESET}{ZONE}",
     # The last resort fails, without a word where the system's release has a
     # number that is too great; or the repair of the local time fails.
     "abort": f"{START}[^UCD]*(U({VERSION}(uz)?c)?|(U{RESET})?(r|Cc?)?Dc)",
@@ -236,10 +223,8 @@ class Judged:
 
 def shortcomings(boot: Judged) -> list[str]:
     """What does not hold of an undisturbed boot of whatever device."""
-    rules = [
-        of_the_log, of_the_legacy_link, of_obsolete_icu, of_activation, of_the_record,
-        of_everything_else
-    ]
+    rules = [of_the_log, of_the_legacy_link, of_obsolete_icu, of_activation,
+             of_the_record, of_everything_else]
     if boot.ending == "exit 0" and boot.system:
         rules += [of_the_choice, of_zoneinfo, of_localtime]
     return [f"does not hold: {what}"

@@ -35,17 +35,10 @@ from lab.doors import Options, build_program, need, pytest, stop, unprivileged
 from lab.places import BUILD, PROJECT
 
 PYTHON = ["/usr/bin/python3", "-B", "-m"]
-TRIALS = {
-    "faults": ["test_faults.py", "test_memory.py"],
-    "kills": ["test_kills.py", "test_windows.py"],
-    "states": ["test_states.py"],
-    "load": ["test_load.py"],
-    "log": ["test_log.py"],
-    "status": ["test_status.py"],
-    "install": ["test_install_faults.py", "test_install_kills.py",
-                "test_install_races.py"],
-    "make": ["test_make.py"],
-}
+TRIALS = {  # lab/test_NAME.py, each
+    "faults": ["faults", "memory"], "kills": ["kills", "windows"],
+    "states": ["states"], "load": ["load"], "log": ["log"], "status": ["status"],
+    "install": ["install_faults", "install_kills", "install_races"], "make": ["make"]}
 OTHERS = {  # the whole, and with --quick
     "fuzz": (["lab.fuzz", "--seconds", "600"], ["lab.fuzz", "--seconds", "60"]),
     "sanitize": (["lab.sanitize"], ["lab.sanitize", "--sanitizers"]),
@@ -110,7 +103,7 @@ def main() -> int:
         return subprocess.call(trials("alone", "-rs", *alone), cwd=PROJECT)
     results = [
         prove(name, trials(name, *["--quick"] * chosen.quick,
-                           *(f"lab/{file}" for file in TRIALS[name]))
+                           *(f"lab/test_{test}.py" for test in TRIALS[name]))
               if name in TRIALS else PYTHON + OTHERS[name][chosen.quick])
         for name in chosen.proofs or [*TRIALS, *OTHERS]]
     print("\n" + "\n".join(figure for _, figure in results))

@@ -21,9 +21,8 @@ from lab.places import BUILD, PROJECT
 TARGET = BUILD / "releases"
 RULES = Path("/usr/share/zoneinfo/tzdata.zi")
 # Lisbon's last line.
-LISBON = r"^(Z Europe/Lisbon .*\n(?:[^RLZ].*\n)*?0 (\S+) WE%sT)$"
-RESOURCES = ("metaZones.res", "timezoneTypes.res", "windowsZones.res",
-             "zoneinfo64.res")
+LISBON = r"(?m)^(Z Europe/Lisbon .*\n(?:[^RLZ].*\n)*?0 (\S+) WE%sT)$"
+RESOURCES = "metaZones.res timezoneTypes.res windowsZones.res zoneinfo64.res".split()
 
 
 class NotOfTheForm(Exception):
@@ -35,10 +34,9 @@ def output(*command, **options) -> bytes:
 
 
 def find(what: str, pattern: str, text: str) -> re.Match[str]:
-    found = re.search(pattern, text, re.MULTILINE)
-    if not found:
-        raise NotOfTheForm(f"this machine has no {what} of the expected form")
-    return found
+    if found := re.search(pattern, text, re.MULTILINE):
+        return found
+    raise NotOfTheForm(f"this machine has no {what} of the expected form")
 
 
 def tool(name: str, **options: str | Path) -> list[str]:
@@ -66,13 +64,9 @@ def once(target: Path, inputs: list, make):
     made_from.write_text(inputs)
 
 
-# --- Names ------------------------------------------------------------------------
-
-
 def own() -> str:
     """The release of this machine's rules."""
-    with open(RULES, encoding="ascii") as rules:
-        return find("release", r"\A# version (\d{4}[a-z]+)\b", rules.readline())[1]
+    return find("release", r"\A# version (\d{4}[a-z]+)\b", RULES.read_text())[1]
 
 
 def after(release: str) -> str:
@@ -132,9 +126,6 @@ def make_all():
     (TARGET / "names").write_text(json.dumps(made._asdict()))
 
 
-# --- Contents ---------------------------------------------------------------------
-
-
 def make(place: Path, release: str, lisbon_from: int | None = None):
     """A release, as tzdata.zi and as ICU's files in the directory icu."""
     place.mkdir(parents=True)
@@ -142,13 +133,11 @@ def make(place: Path, release: str, lisbon_from: int | None = None):
     if lisbon_from:
         find("zone of Lisbon", LISBON, rules)
         # From Western to Central European Time when a year begins, as in 1992.
-        rules = re.sub(LISBON, rf"\1 {lisbon_from}\n1 \2 CE%sT", rules,
-                       flags=re.MULTILINE)
+        rules = re.sub(LISBON, rf"\1 {lisbon_from}\n1 \2 CE%sT", rules)
     (place / "tzdata.zi").write_text(rules)
-    icu = place / "icu"
+    icu, source = place / "icu", place / "zoneinfo64.txt"
     icu.mkdir()
     icu_files(icu)
-    source = place / "zoneinfo64.txt"
     source.write_text(icu_text(icu, release, lisbon_from))
     output("genrb", "-q", "-d", icu, source)
 
@@ -170,15 +159,13 @@ def icu_text(folder: Path, release: str, lisbon_from: int | None) -> str:
     """The source of zoneinfo64.res, with what is different in a release."""
     text = output("derb", "-c", "-s", folder, "zoneinfo64.res").decode("utf-8-sig")
     # What derb does not tell: without it ICU would look for a parent.
-    text = re.sub("^zoneinfo64{", "zoneinfo64:table(nofallback){", text,
-                  flags=re.MULTILINE)
+    text = re.sub("(?m)^zoneinfo64{", "zoneinfo64:table(nofallback){", text)
     find("release of ICU's data", '^ +TZVersion *{ *"[^"]+"', text)
-    text = re.sub('(^ +TZVersion *{ *")[^"]+', rf"\g<1>{release}", text,
-                  flags=re.MULTILINE)
+    text = re.sub('(?m)(^ +TZVersion *{ *")[^"]+', rf"\g<1>{release}", text)
     if lisbon_from is None:
         return text
-    names = re.findall('"([^"]+)"', find("names of zones", r"^ +Names\{([^}]*)\}",
-                                         text)[1])
+    listed = find("names of zones", r"^ +Names\{([^}]*)\}", text)[1]
+    names = re.findall('"([^"]+)"', listed)
     # Each zone is a table, or a number that stands for another.
     zones = list(re.finditer(r"^        (?:\{\n.*?^        \}|:int \{.*?\})", text,
                              re.MULTILINE | re.DOTALL))

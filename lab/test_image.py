@@ -2,13 +2,9 @@
 """The image of docs/integration.md is made and boots; what systemd itself shows there.
 Takes root, a network and minutes: see scripts/readers."""
 
-import contextlib
-import os
 import re
-import select
-import subprocess
-import time
 
+import pexpect
 import pytest
 
 from lab import releases
@@ -16,35 +12,17 @@ from lab.doors import package
 from lab.places import PROJECT
 
 SECONDS = 400
-PROMPT = b":~# "
 
 
-class Console:
+class Console(pexpect.spawn):
     """The serial line of a system."""
-
-    def __init__(self, running: subprocess.Popen):
-        self.running = running
-        self.text = b""
-
-    def until(self, words: bytes) -> str:
-        """What is said until these words."""
-        end = time.monotonic() + SECONDS
-        while words not in self.text:
-            ready = select.select([self.running.stdout], [], [], 1)[0]
-            more = os.read(self.running.stdout.fileno(), 65536) if ready else b""
-            if ready and not more or time.monotonic() > end:
-                pytest.fail(f"never said {words!r}: {self.text[-3000:]!r}")
-            self.text += more
-        said, _, self.text = self.text.partition(words)
-        return said.decode(errors="replace")
 
     def answer(self, command: str) -> str:
         """What a command prints, on one line, and its status."""
         # As it is typed, the end is not yet what is waited for.
-        line = f'echo "A:$({command} 2>&1):$?:""Z"'
-        self.running.stdin.write(line.encode() + b"\n")
-        self.running.stdin.flush()
-        return self.until(b":Z\r").rpartition("A:")[2].replace("\r", "")
+        self.sendline(f'echo "A:$({command} 2>&1):$?:""Z"')
+        self.expect_exact(":Z\r")
+        return self.before.rpartition("A:")[2].replace("\r", "")
 
 
 @pytest.fixture(scope="module")
@@ -57,22 +35,15 @@ def console(tmp_path_factory):
                                out=place / "system"))
     package("release", place)
     text = (PROJECT / "docs/integration.md").read_text()
-    recipe = re.search(r"<!-- image -->\n```\n(.*?)```\n<!-- end -->", text,
-                       re.DOTALL)[1]
+    recipe = re.search(r"(?s)<!-- image -->\n```\n(.*?)```\n<!-- end -->", text)[1]
     make, boot = recipe.split("qemu-system", 1)
     releases.output("/bin/sh", "-euc", make, cwd=place)
-    with subprocess.Popen(["/bin/sh", "-euc", f"exec qemu-system{boot}"], cwd=place,
-                          stdin=subprocess.PIPE, stdout=subprocess.PIPE) as running:
-        there = Console(running)
-        try:
-            there.until(b"login: ")
-            running.stdin.write(b"root\n")
-            running.stdin.flush()
-            there.until(PROMPT)
-            yield there
-        finally:
-            with contextlib.suppress(ProcessLookupError):
-                running.kill()
+    with Console("/bin/sh", ["-euc", f"exec qemu-system{boot}"], SECONDS, cwd=place,
+                 encoding="utf-8", codec_errors="replace") as there:
+        there.expect_exact("login: ")
+        there.sendline("root")
+        there.expect_exact(":~# ")
+        yield there
 
 
 def test_marlin_ran(console):

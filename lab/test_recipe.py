@@ -28,8 +28,7 @@ def given(tmp_path):
 
 def test_the_recipe(given):
     text = (PROJECT / "docs/integration.md").read_text()
-    recipe = re.search(r"<!-- recipe -->\n```\n(.*?)```\n<!-- end -->", text,
-                       re.DOTALL)[1]
+    recipe = re.search(r"(?s)<!-- recipe -->\n```\n(.*?)```\n<!-- end -->", text)[1]
     done = subprocess.run(
         ["/bin/sh", "-euc", recipe], cwd=given, capture_output=True, text=True,
         env={**os.environ, "marlin": str(PROJECT)})
@@ -58,7 +57,7 @@ def test_the_signature(tool, tmp_path):
                                 minisign)
         sign = ("minisign -G -W -p key.pub -s key.sec\n"
                 "minisign -S -s key.sec -m update.tar\n")
-    assert f"{tool}" in script
+    assert tool in script
     for given, here in (("/etc/update.pub", "key.pub"), ("/run/update", "update"),
                         ("marlin-install", "ls -d")):
         script = script.replace(given, here)

@@ -17,7 +17,7 @@ from pathlib import Path
 
 PROJECT = Path(__file__).resolve().parents[1]
 sys.path.insert(0, str(PROJECT))
-from lab import lines  # noqa: E402
+from lab import ci, lines  # noqa: E402
 from lab.doors import Options  # noqa: E402
 
 os.chdir(PROJECT)
@@ -35,8 +35,7 @@ def matching_lines(path: Path, pattern: str) -> Iterator[str]:
 def comments_in(path: Path) -> list[str]:
     """Each comment as one line, so that a name may stand on the next one."""
     blocks = re.findall(r"(?:^ *//.*\n)+", path.read_text(), re.M)
-    return [" ".join(re.sub(r"^ *//", "", block, flags=re.M).split())
-            for block in blocks]
+    return [" ".join(re.sub(r"(?m)^ *//", "", block).split()) for block in blocks]
 
 
 def differences(left: set[str], where_left: str, right: set[str],
@@ -53,23 +52,19 @@ def source_rules() -> Iterator[str]:
     above = {"support": "driver|dataset|tools|tests", "dataset": "driver|tools|tests",
              "driver": "tools|tests"}
     for path in PRODUCT:
-        upwards = rf'#include "({above[path.parts[0]]})/'
-        for line in matching_lines(path, upwards):
+        for line in matching_lines(path, rf'#include "({above[path.parts[0]]})/'):
             yield f"{line}: a dependency must not point upwards"
         # Two functions have this name.
         unqualified = r"^(?!.*//)(?!bool remove\().*(?<!fsutil::)(?<!std::)\bremove\("
         for line in matching_lines(path, unqualified):
             yield f"{line}: must be fsutil::remove() or std::remove()"
 
-    for root, folders, files in os.walk("."):
-        folders[:] = [name for name in folders if name[0] != "." and name != "build"]
-        for path in (Path(root, name) for name in files):
-            is_source = (path.suffix in (".c", ".cmake", ".cpp", ".h", ".py", ".sh")
-                         or path.name == "CMakeLists.txt" or os.access(path, os.X_OK))
-            if is_source and not any(
-                    "SPDX-License-Identifier: BSD-2-Clause" in line
-                    for line in path.read_text().splitlines()[:3]):
-                yield f"{path}: no licence line"
+    for path in (Path(name) for name in ci.files("*") if name[0] != "."):
+        is_source = (path.suffix in (".c", ".cmake", ".cpp", ".h", ".py", ".sh")
+                     or path.name == "CMakeLists.txt" or os.access(path, os.X_OK))
+        if is_source and not re.match(
+                "(.*\n){0,2}.*SPDX-License-Identifier: BSD-2-Clause", path.read_text()):
+            yield f"{path}: no licence line"
 
 
 def deliberate() -> Iterator[str]:

@@ -48,9 +48,6 @@ def debugfs(image: Path, *requests: str, write=False) -> list[str]:
     return re.split(r"debugfs: .*\n", printed)[1:]
 
 
-# --- Building ----------------------------------------------------------------------
-
-
 def build(image: Path, root: Node, megabytes: int, *options: str, owner=0):
     """Makes an image that holds this tree, of which everything is the owner's."""
     image.unlink(missing_ok=True)
@@ -62,8 +59,6 @@ def build(image: Path, root: Node, megabytes: int, *options: str, owner=0):
     _, *paths = (path for path, _ in root.everything(""))
     debugfs(image, *(f'sif "{path}" uid {owner}' for path in paths), write=True)
 
-
-# --- Looking -----------------------------------------------------------------------
 
 LISTED = re.compile(r"^/(\d+)/(\d+)/\d+/\d+/(.*)/(\d*)/$", re.MULTILINE)
 LONGEST_IN_INODE = 59  # a link's target that is longer has a block

@@ -18,8 +18,7 @@ INSIDE = "MARLIN_PRIVATE_DEVICE"  # in the environment of what runs there
 def insist_on_private_device():
     """Called first by everything that builds, boots or looks at a device: looking
     changes permissions as well, where it has to. Ends the process elsewhere."""
-    reason = why_not_private()
-    if reason:
+    if reason := why_not_private():
         raise SystemExit(f"refusing to touch this machine: {reason}")
 
 
@@ -28,23 +27,18 @@ def why_not_private() -> str:
     if INSIDE not in os.environ:
         return "this is not a private device"
     kinds = {}
-    with open("/proc/self/mountinfo", encoding="latin-1") as mounts:
-        for line in mounts:
-            before, after = line.split(" - ", 1)
-            kinds[before.split()[4]] = after.split()[0]
+    for line in Path("/proc/self/mountinfo").read_text("latin-1").splitlines():
+        before, after = line.split(" - ", 1)
+        kinds[before.split()[4]] = after.split()[0]
     places = ("/",) + PLACES
     for place in places:
         if kinds.get(place) != "tmpfs":
             return f"{place} is not a throw-away file system in memory"
     if len({os.stat(place).st_dev for place in places}) != len(places):
         return "/var/db and /usr/share are not file systems of their own"
-    with open("/proc/self/status", encoding="latin-1") as status:
-        if "CapEff:\t0000000000000000" not in status.read():
-            return "this process has capabilities, so permissions mean nothing"
+    if "CapEff:\t0000000000000000" not in Path("/proc/self/status").read_text():
+        return "this process has capabilities, so permissions mean nothing"
     return ""
-
-
-# --- Building ------------------------------------------------------------------
 
 
 def wipe():
@@ -76,6 +70,9 @@ def build(device: Device):
 
 def build_below(path: str, node: Node, exists=False):
     raw = encoded(path)
+    if node.kind == "link":
+        os.symlink(encoded(node.text), raw)
+        return
     if node.kind == "dir":
         if not exists:
             os.mkdir(raw)
@@ -83,23 +80,13 @@ def build_below(path: str, node: Node, exists=False):
             build_below(path + "/" + name, child)
         node.entries = {name: node.entries[name]
                         for name in map(decoded, os.listdir(raw))}
-        os.chmod(raw, node.mode)
     elif node.kind == "file":
-        descriptor = os.open(raw, os.O_WRONLY | os.O_CREAT | os.O_EXCL, 0o600)
-        content = encoded(node.text)
-        while content:
-            content = content[os.write(descriptor, content):]
-        os.fchmod(descriptor, node.mode)
-        os.close(descriptor)
-    elif node.kind == "link":
-        os.symlink(encoded(node.text), raw)
+        with open(raw, "xb") as file:
+            file.write(encoded(node.text))
     else:
         kinds = {"fifo": stat.S_IFIFO, "socket": stat.S_IFSOCK}
         os.mknod(raw, kinds[node.kind] | 0o600)
-        os.chmod(raw, node.mode)
-
-
-# --- Looking -------------------------------------------------------------------
+    os.chmod(raw, node.mode)
 
 
 def look() -> Entries:

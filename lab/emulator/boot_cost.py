@@ -65,16 +65,17 @@ def print_boot(title: str, console: Console):
 
 def measured(console: Console) -> dict[str, list[tuple]]:
     """Names, with the time of each run, and the requests and KiB that it read."""
-    begun, ended, figures = {}, {}, {}
+    times, figures = {}, {}
     for at, text in console.lines:
         if match := re.fullmatch(r"device: (.*) (begins|ends)", text):
-            (begun if match[2] == "begins" else ended)[match[1]] = at
+            times[match.groups()] = at
         elif match := re.fullmatch(
                 r"device: (.*) read from (\d+) (\d+) to (\d+) (\d+)", text):
             name, *counts = match.groups()
             requests, size, requests_then, size_then = map(int, counts)
+            took = times[name, "ends"] - times[name, "begins"]
             figures.setdefault(name, []).append(
-                (ended[name] - begun[name], requests_then - requests, size_then - size))
+                (took, requests_then - requests, size_then - size))
     return figures
 
 

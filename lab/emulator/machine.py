@@ -5,6 +5,7 @@ The system partition is read-only and holds the program; "/var" is a disk of its
 The console is a file, in which every line begins with the kernel's time.
 """
 
+import contextlib
 import functools
 import os
 import re
@@ -41,32 +42,25 @@ NO_FILLER = "rm -rf /var/filler*\n"
 LINKS = (ZONEINFO, ICUTZ, LOCALTIME, TZ_LATEST)
 
 
-# --- Its memory and disks ------------------------------------------------------------
-
-
-def cpio(entries) -> bytes:
-    """An archive as the kernel unpacks it. Entries: name, mode, content."""
-    archive = bytearray()
-    for inode, (name, mode, content) in enumerate(
-            [*entries, ("TRAILER!!!", 0, b"")], 1):
-        encoded = name.encode() + b"\0"
-        fields = (inode, mode, 0, 0, 1, 0, len(content), 0, 0, 0, 0, len(encoded), 0)
-        archive += b"070701" + b"".join(b"%08X" % field for field in fields) + encoded
-        archive += bytes(-len(archive) % 4)
-        archive += content
-        archive += bytes(-len(archive) % 4)
-    return bytes(archive)
-
-
-def first_memory() -> bytes:
-    """What the kernel starts from: enough to mount the disks."""
-    return cpio([
-        *((name, 0o40755, b"")
-          for name in ("bin", "dev", "device", "modules", "proc", "sys")),
+def first_memory(script: str) -> bytes:
+    """The cpio archive that the kernel unpacks at first: enough to mount the disks, and
+    what the device is to do when it is up."""
+    entries = [
+        *((name, 0o40755, b"") for name in "bin dev device modules proc sys".split()),
         ("bin/busybox", 0o100755, part("bin/busybox").read_bytes()),
         ("init", 0o100755, (GUEST / "init").read_bytes()),
         *((f"modules/{name.rpartition('/')[2]}.ko", 0o100644,
-           part(f"kernel/{name}.ko").read_bytes()) for name in MODULES)])
+           part(f"kernel/{name}.ko").read_bytes()) for name in MODULES),
+        ("script", 0o100644, script.encode()), ("TRAILER!!!", 0, b"")]
+    archive = bytearray()
+    for inode, (name, mode, content) in enumerate(entries, 1):
+        encoded = name.encode() + b"\0"
+        fields = (inode, mode, 0, 0, 1, 0, len(content), 0, 0, 0, 0, len(encoded), 0)
+        archive += b"070701" + b"".join(b"%08X" % field for field in fields)
+        for text in (encoded, content):
+            archive += text
+            archive += bytes(-len(archive) % 4)
+    return bytes(archive)
 
 
 def system_partition(device: Device) -> Node:
@@ -106,14 +100,11 @@ def compile_zones(device: Device):
                 device.find(f"{tree}/{zone}").text = text
 
 
-# --- Its console ---------------------------------------------------------------------
-
-
 def shown_links(device: Device) -> list[str]:
     """What a boot that ends with this device says of its links."""
-    nodes = ((path, device.find(path)) for path in LINKS)
-    return [f"{os.path.basename(path)} -> {node.text if node else 'none'}"
-            for path, node in nodes]
+    contents = device.contents()
+    return [f"{os.path.basename(path)} -> {contents.get(path, 'none')}"
+            for path in LINKS]
 
 
 def ending(status: int) -> str:
@@ -153,9 +144,6 @@ class Console:
             and text.startswith((lines.NAME, "terminate called"))))
 
 
-# --- Its boots -----------------------------------------------------------------------
-
-
 def relink(before: dict[str, str], after: dict[str, str]) -> str:
     """What the device's shell does to links so that one description becomes the
     other; an announcement is replaced as installers of updates do it."""
@@ -163,6 +151,11 @@ def relink(before: dict[str, str], after: dict[str, str]) -> str:
     return "".join(removed + [
         f"ln -s {text} {path}.next && mv -T {path}.next {path}\n"
         for path, text in after.items() if before.get(path) != text])
+
+
+def plain(name: str, path: Path) -> str:
+    """An image as the emulator's block device of this name."""
+    return f"driver=raw,node-name={name},file.driver=file,file.filename={path}"
 
 
 class Machine:
@@ -181,15 +174,11 @@ class Machine:
         """Makes both disks of a described device, with what is to stand in "/var"
         beside its own; the options are of mke2fs."""
         self.device = device
-        self.build_system()
+        compile_zones(device)
+        image.build(self.system, system_partition(device), 14, "-O", "^has_journal")
+        self.built = image.digest(self.system)
         root = Node("dir", 0o755, entries={"db": device.find("/var/db"), **beside})
         image.build(self.var, root, megabytes, *options, owner=owner)
-
-    def build_system(self):
-        compile_zones(self.device)
-        image.build(self.system, system_partition(self.device), 14,
-                    "-O", "^has_journal")
-        self.built = image.digest(self.system)
 
     def look(self, var: Path | None = None) -> Entries:
         """Everything on the device, or on it with another disk. Raises if anything at
@@ -200,20 +189,16 @@ class Machine:
                 **image.look(var or self.var, "/db", "/var/db")}
 
     def command(self, script="", options="", disk="", serial="mon:stdio") -> list[str]:
-        extra = cpio([("script", 0o100644, script.encode())]) if script else b""
-        self.memory.write_bytes(first_memory() + extra)
-        disk = disk or ("driver=raw,node-name=var,"
-                        f"file.driver=file,file.filename={self.var}")
-        parameters = f"console=ttyAMA0 loglevel=5 printk.devkmsg=on panic=-1 {options}"
+        self.memory.write_bytes(first_memory(script))
         return ["qemu-system-aarch64", "-M", "virt", "-cpu", "cortex-a57", "-m", "256",
                 "-nodefaults", "-no-reboot", "-display", "none", "-serial", serial,
                 "-kernel", str(part("vmlinuz-*")), "-initrd", str(self.memory),
-                "-append", parameters,
-                "-blockdev", "driver=raw,node-name=system,read-only=on,"
-                             f"file.driver=file,file.filename={self.system}",
+                "-append",
+                f"console=ttyAMA0 loglevel=5 printk.devkmsg=on panic=-1 {options}",
+                "-blockdev", f"{plain('system', self.system)},read-only=on",
+                "-blockdev", disk or plain("var", self.var),
                 "-device", "virtio-blk-device,drive=var",
-                "-device", "virtio-blk-device,drive=system",
-                "-blockdev", disk]
+                "-device", "virtio-blk-device,drive=system"]
 
     def start(self, script="", options="", disk="", more=()) -> subprocess.Popen:
         """`script` is what the device does when it is up, in its shell's language;
@@ -232,13 +217,11 @@ class Machine:
             then()
         script = relink(before, self.device.contents()) + script
         emulator = self.start(script, **how)
-        try:
+        with contextlib.suppress(subprocess.TimeoutExpired):
             emulator.wait(seconds)
-        except subprocess.TimeoutExpired:
-            emulator.kill()
-            emulator.wait()
+        emulator.kill()
         console = Console(self.console)
-        if emulator.returncode != 0 or "shut down" not in console.said:
+        if emulator.wait() != 0 or "shut down" not in console.said:
             raise console.failure("the device did not shut down")
         return console
 

@@ -20,7 +20,7 @@ from lab import model, properties
 from lab.carriers import image
 from lab.device import Device, sound_device
 from lab.emulator import power_log
-from lab.emulator.machine import LINKS, Console, Machine, shown_links
+from lab.emulator.machine import LINKS, Console, Machine, plain, shown_links
 from lab.paths import (FORMER_ZONEINFO, ICUTZ, LEGACY_ICUTZ, LOCALTIME, RECORD,
                        TZ_LATEST, ZONEINFO, update_path)
 from lab.seen import Entries, as_device
@@ -64,13 +64,10 @@ def insist(found: list[str]):
         raise RuntimeError("; ".join(found))
 
 
-# --- The state that a cut left -----------------------------------------------------
-
-
 def number_of(device: Device, path: str) -> int | None:
     """The number of the update that a link names; None for no update."""
-    node = device.find(path)
-    found = re.match(r"/var/db/timezone/tz/2024a\.1\.(\d+)", node.text if node else "")
+    target = device.contents().get(path, "")
+    found = re.match(r"/var/db/timezone/tz/2024a\.1\.(\d+)", target)
     return int(found[1]) if found else None
 
 
@@ -79,13 +76,12 @@ def described(device: Device) -> str:
     zoneinfo, icutz = number_of(device, ZONEINFO), number_of(device, ICUTZ)
     if not device.find(ZONEINFO):
         pair = "zoneinfo missing, icutz " + ("missing" if icutz is None else "there")
+    elif zoneinfo == icutz:
+        pair = "the system's" if icutz is None else "one update's"
     elif zoneinfo is None:
-        pair = ("the system's" if icutz is None else
-                "MIXED: zoneinfo system, icutz update")
+        pair = "MIXED: zoneinfo system, icutz update"
     elif icutz is None:
         pair = "MIXED: zoneinfo update, icutz missing"
-    elif zoneinfo == icutz:
-        pair = "one update's"
     else:
         older = "older" if icutz < zoneinfo else "newer"
         pair = f"MIXED: zoneinfo update, icutz of an {older} one"
@@ -95,13 +91,13 @@ def described(device: Device) -> str:
 def kind_of_record(device: Device) -> str:
     """A record is written and never synced, so the disk may know of the file but not
     of its bytes yet; the next activation writes it anew."""
-    record = device.find(RECORD)
+    record = device.contents().get(RECORD)
     if record is None:
         return "none"
-    if not record.text.strip("\0"):
-        return "of NUL bytes" if record.text else "empty"
-    if not re.fullmatch(r"(2023c\.1\.0|2024a\.1\.\d+)_2024a\.1\.\d+", record.text):
-        raise RuntimeError(f"the record holds {record.text!r}")
+    if not record.strip("\0"):
+        return "of NUL bytes" if record else "empty"
+    if not re.fullmatch(r"(2023c\.1\.0|2024a\.1\.\d+)_2024a\.1\.\d+", record):
+        raise RuntimeError(f"the record holds {record!r}")
     return "whole"
 
 
@@ -133,9 +129,6 @@ def within_pass(console: Console) -> bool:
     return bool(passes) and passes[-1].endswith("begins")
 
 
-# --- The cuts ----------------------------------------------------------------------
-
-
 class Victim:
     """A device whose power is cut again and again; `found` is what the next boot
     finds."""
@@ -165,8 +158,7 @@ class Victim:
         the device asks of its disk and changes only a copy of it. What the device said,
         and how many blocks were lost."""
         machine, log = self.machine, self.machine.directory / "log"
-        scratch = self.machine.directory / "scratch.img"
-        shutil.copyfile(machine.var, scratch)
+        scratch = shutil.copyfile(machine.var, machine.directory / "scratch.img")
         log.write_bytes(b"")
         mounted, syncs = self.random.choice(OTHERS)
         emulator = machine.start(
@@ -191,17 +183,20 @@ class Victim:
 
     def look_after_cut(self) -> Entries:
         """The disk as a boot would find it."""
-        found = self.machine.directory / "found.img"
-        shutil.copyfile(self.machine.var, found)
+        found = shutil.copyfile(self.machine.var, self.machine.directory / "found.img")
         image.replay_journal(found)
         image.check(found)
         return self.machine.look(found)
 
     @contextlib.contextmanager
-    def telling(self):
-        """Has a failure tell what was said last, and the seed."""
+    def on_trial(self):
+        """Has a failure tell what was said last, and the seed. The state that the last
+        cut left is booted as well, and shut down."""
         try:
             yield
+            console = self.machine.boot(options="mend" * self.mend)
+            check_recovery(console, self.found, self.mend)
+            image.check(self.machine.var)
         except RuntimeError as reason:
             print(Console(self.machine.console).text[-6000:])
             raise RuntimeError(f"with seed {self.seed}: {reason}") from reason
@@ -224,11 +219,9 @@ class Victim:
 
     def stays_mixed_without_mend(self) -> bool:
         """What the next boot would make of the links that the last cut left."""
-        copy = self.machine.directory / "unmended.img"
-        shutil.copyfile(self.machine.var, copy)
-        console = self.machine.boot(disk="driver=raw,node-name=var,file.driver=file,"
-                                         f"file.filename={copy}")
-        check_recovery(console, self.found)
+        machine = self.machine
+        copy = shutil.copyfile(machine.var, machine.directory / "unmended.img")
+        check_recovery(machine.boot(disk=plain("var", copy)), self.found)
         device = as_device(self.found)
         model.boot(device)
         return "MIXED" in described(device)
@@ -251,10 +244,6 @@ def run_cuts(count: int, victim: Victim, table, totals):
         print(f"cut {number}/{count}, {time.monotonic() - started:.0f} s: "
               f"{'inside the pass' if inside else 'between passes'}, "
               f"{lost} blocks lost; {state}; record {record}", flush=True)
-    # The state that the last cut left is booted as well, and shut down.
-    options = "mend" if victim.mend else ""
-    check_recovery(victim.machine.boot(options=options), victim.found, victim.mend)
-    image.check(victim.machine.var)
 
 
 def print_table(table, totals):
@@ -279,7 +268,7 @@ def run(count: int, seed: int | None = None, mend=False):
     table, totals = collections.Counter(), collections.Counter()
     victim = Victim(seed, mend)
     try:
-        with victim.telling():
+        with victim.on_trial():
             run_cuts(count, victim, table, totals)
     finally:
         print_table(table, totals)

@@ -34,8 +34,7 @@ def show():
     device = as_device(machine.look())
     for text in shown_links(device):
         print(f"  timezone/{text}")
-    record = device.find(RECORD)
-    print(f"  timezone/TZVersionDiffRecord: {record.text if record else 'none'}")
+    print("  timezone/TZVersionDiffRecord:", device.contents().get(RECORD, "none"))
 
 
 def shell() -> int:

@@ -15,10 +15,8 @@ import pytest
 from lab import lines
 from lab.carriers import image
 from lab.device import Device, Node, sound_device
-from lab.emulator.machine import (NO_BLOCK, NO_FILLER, NO_INODE, Machine,
-                                  shown_links)
-from lab.paths import (ICUTZ, RECORD, SYSTEM_ZONEINFO, TIMEZONE, ZONEINFO,
-                       update_path)
+from lab.emulator.machine import NO_BLOCK, NO_FILLER, NO_INODE, Machine, shown_links
+from lab.paths import ICUTZ, RECORD, SYSTEM_ZONEINFO, TIMEZONE, ZONEINFO, update_path
 from lab.seen import Seen
 from lab.trial import differences, fail
 
@@ -47,11 +45,9 @@ def activate(device: Device):
 class Scene:
 
     def __init__(self, machine: Machine):
-        self.machine = machine
-        self.boots = 0
+        self.machine, self.boots = machine, 0
 
     def on(self, device: Device, *options: str) -> Device:
-        self.device = device
         self.machine.build(device, *options)
         self.nodes = dict(device.everything())
         return device
@@ -60,7 +56,7 @@ class Scene:
         """Boots, and compares. `printed` are texts, or pairs of a text and the error
         number that ends the line. The reader's zone tells its data; without it nobody
         looks through the links. `then` and `how` are those of Machine.boot."""
-        machine, device = self.machine, self.device
+        machine, device = self.machine, self.machine.device
         before = machine.look()
         shown = shown_links(device) + [f"reader sees zone {reader}"]
         console = machine.boot(then=then, **how)

@@ -19,7 +19,7 @@ from pathlib import Path
 
 from lab import boot, releases
 from lab.demo import data
-from lab.doors import Options, build_program, locked, need, say, stop
+from lab.doors import Options, build_program, locked, need, pytest, say, stop
 from lab.places import BUILD, PROJECT
 from lab.private_device import ISOLATION, machine
 from lab.readers.programs import GLIBC, HOME, ICU, MUSL, UNPACKED
@@ -53,12 +53,11 @@ def unpack():
 
 
 def make():
-    sources = PROJECT / "lab/readers"
     unpack()
-    releases.output("gcc", "-O1", sources / "clock.c", "-o", GLIBC)
-    releases.output("musl-gcc", "-O1", "-static", sources / "clock.c", "-o", MUSL)
-    releases.output("g++", "-O1", sources / "icu.cpp", "-o", ICU, "-licui18n",
-                    "-licuuc")
+    sources, output = PROJECT / "lab/readers", releases.output
+    output("gcc", "-O1", sources / "clock.c", "-o", GLIBC)
+    output("musl-gcc", "-O1", "-static", sources / "clock.c", "-o", MUSL)
+    output("g++", "-O1", sources / "icu.cpp", "-o", ICU, "-licui18n", "-licuuc")
 
 
 def inside(*command: str) -> list[str]:
@@ -86,8 +85,7 @@ def main() -> int:
     need("private-device")
     if status := subprocess.call([PROJECT / "scripts/private-device", "--probe"]):
         return status
-    need("build", "demo", "prove", "pytest", "readers",
-         *["image"] * chosen.image)
+    need("build", "demo", "prove", "pytest", "readers", *["image"] * chosen.image)
     build_program()
     with locked(data.TARGET.parent):
         data.prepare()
@@ -98,14 +96,11 @@ def main() -> int:
                               make)
             except (releases.NotOfTheForm, subprocess.CalledProcessError) as failed:
                 stop(1, str(failed))
-    pytest = ["/usr/bin/python3", "-B", "-m", "pytest", "-c", "lab/pytest.ini",
-              f"--rootdir={PROJECT}", "-p", "no:cacheprovider", "-q"]
-    statuses = []
-    if outside:
-        statuses.append(subprocess.call([*pytest, *outside], cwd=PROJECT))
+    run = pytest("-p", "no:cacheprovider", "-q")
+    commands = [[*run, *outside]] if outside else []
     if others:
-        statuses.append(subprocess.call(inside(*pytest, *others), cwd=PROJECT))
-    return int(any(statuses))
+        commands.append(inside(*run, *others))
+    return int(any([subprocess.call(command, cwd=PROJECT) for command in commands]))
 
 
 sys.exit(main())

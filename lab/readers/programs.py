@@ -67,8 +67,7 @@ CALENDAR = ("while read -r moment; do systemd-analyze calendar --base-time=@0 "
 
 
 def by_name(moment: int) -> str:
-    return (f"select to_char(to_timestamp({moment}) at time zone '{ZONE}', "
-            "'HH24:MI');")
+    return f"select to_char(to_timestamp({moment}) at time zone '{ZONE}', 'HH24:MI');"
 
 
 def at(moment: int) -> str:

@@ -42,23 +42,16 @@ ENVIRONMENT = {"PATH": "/usr/bin:/bin:/usr/sbin", "LC_ALL": "C.UTF-8",
                    str(place) for place in UNPACKED.glob("usr/lib/*-linux-gnu"))}
 
 
-# --- The device -------------------------------------------------------------------
-
-
 def device_with(system: str, links: tuple[str, ...], update: str | None) -> Device:
     """A device with a system partition's data and both updates; one is in use."""
     device = Device()
     for name, place in (("zoneinfo", SYSTEM_ZONEINFO), ("icu", SYSTEM_ICU)):
         device.put(place, namespace.description_of(data.TARGET / system / name))
+    wanted = dict(LINKS[name] for name in links)
     Path("/etc/localtime").unlink(missing_ok=True)
-    os.symlink(LOCALTIME, "/etc/localtime")
-    for name in links:
-        link, target = LINKS[name]
-        if link.startswith("/etc/"):
-            Path(link).unlink()
-            os.symlink(target, link)
-        else:
-            device.link(link, target)
+    os.symlink(wanted.pop("/etc/localtime", LOCALTIME), "/etc/localtime")
+    for link, target in wanted.items():
+        device.link(link, target)
     for update_set in ("update", "refused"):
         device.put(update_path(getattr(data.names(), update_set)),
                    namespace.description_of(data.TARGET / update_set))
@@ -79,9 +72,6 @@ def booted(expected: str):
     """Boots; the tree in use is then the expected one."""
     assert boot.boot().ending == "exit 0"
     assert os.readlink(ZONEINFO) == expected
-
-
-# --- Asking -----------------------------------------------------------------------
 
 
 @contextlib.contextmanager
@@ -188,9 +178,6 @@ def commands() -> list[str]:
         with contextlib.suppress(OSError):
             found.append(process.read_text())
     return found
-
-
-# --- The scenes -------------------------------------------------------------------
 
 
 @pytest.fixture(scope="module")
