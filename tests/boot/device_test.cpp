@@ -47,22 +47,17 @@ TEST_F(PrivateDevice, IsRecognisedByItsOwnFileSystems) {
 }
 
 TEST_F(PrivateDevice, ShowsEveryChangeInASnapshot) {
-  make_file("/var/db/file", "content");
+  const auto changes = [](const std::function<void()>& act) {
+    const auto before = look_at_everything();
+    EXPECT_EQ(look_at_everything(), before);
+    act();
+    EXPECT_FALSE(look_at_everything() == before);
+  };
+  changes([] { make_file("/var/db/file", "content"); });
+  changes([] { make_file("/var/db/file", "Content"); });
+  changes([] { wipe("/var/db/file"); });
   make_link("/var/db/link", "target");
-  const auto before = look_at_everything();
-  EXPECT_EQ(look_at_everything(), before);
-
-  make_file("/var/db/file", "Content");
-  EXPECT_FALSE(look_at_everything() == before);
-  wipe("/var/db/file");
-  EXPECT_FALSE(look_at_everything() == before);
-}
-
-TEST_F(PrivateDevice, ShowsALinkThatWasMadeAnewWithTheSameTarget) {
-  make_link("/var/db/link", "target");
-  const auto before = look_at_everything();
-  make_link("/var/db/link", "target");
-  EXPECT_FALSE(look_at_everything() == before);
+  changes([] { make_link("/var/db/link", "target"); });
 }
 
 TEST_F(PrivateDevice, TellsALinkAFileADirectoryAndNothingApart) {
@@ -85,21 +80,17 @@ TEST_F(PrivateDevice, ReportsHowAProgramEnded) {
   EXPECT_EQ(killed.signal, 9);
 }
 
-TEST_F(PrivateDevice, ComparesAFailureWithItsErrorText) {
+TEST_F(PrivateDevice, ComparesALineWithOrWithoutItsErrorText) {
   const std::vector<std::string> printed = {
       "marlin: remove: x: Input/output error"};
   EXPECT_THAT(printed, lines(failure("remove: x", EIO)));
   EXPECT_THAT(printed, Not(lines(failure("remove: x", EPERM))));
   EXPECT_THAT(printed, Not(lines(failure("remove: y", EIO))));
-}
-
-TEST_F(PrivateDevice, ComparesAWarningUpToItsErrorText) {
-  const std::vector<std::string> printed = {"marlin: so: and so: Success"};
-  EXPECT_THAT(printed, lines(failure("so: and so", any_error)));
-  EXPECT_THAT(printed, Not(lines(failure("so", any_error))));
+  EXPECT_THAT(printed, lines(failure("remove: x", any_error)));
+  EXPECT_THAT(printed, Not(lines(failure("remove", any_error))));
   EXPECT_THAT(printed, Not(no_lines()));
-  EXPECT_THAT(printed, Not(lines(failure("so: and so", any_error),
-                                 failure("so: and so", any_error))));
+  EXPECT_THAT(printed, Not(lines(failure("remove: x", any_error),
+                                 failure("remove: x", any_error))));
 }
 
 TEST_F(PrivateDevice, NoticesThatNothingWasThrown) {

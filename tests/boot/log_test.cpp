@@ -19,8 +19,7 @@ class Log : public DeviceTest {
   static void expect_the_boot_of_a_damaged_device(
       const std::function<void()>& in_the_child) {
     install_system("2023c", "44l");
-    install_update("2024a.1.0", "44l");
-    announce("2024a.1.0");
+    install_and_announce("2024a.1.0", "44l");
     point_zoneinfo_at("nonsense");
     make_file(local_time, "not a link");
 

@@ -6,6 +6,7 @@
 
 #include <cerrno>
 #include <csignal>
+#include <tuple>
 
 #include "tests/device/device.h"
 
@@ -43,14 +44,11 @@ TEST_F(StartupPass, TouchesNothingOnADeviceThatWasNeverUpdated) {
   boot_changes_nothing_and_prints(no_lines());
 }
 
-TEST_F(StartupPass, TouchesNothingWhileAnUpdateIsActive) {
-  install_and_use("2024a.1.0", "44l");
-  boot_changes_nothing_and_prints(no_lines());
-}
-
-TEST_F(StartupPass, KeepsAnUpdateOfTheSystemsOwnVersion) {
-  install_and_use("2023c.1.0", "44l");
-  boot_changes_nothing_and_prints(no_lines());
+TEST_F(StartupPass, TouchesNothingWhileAnUpdateIsActiveThatIsNotOlder) {
+  for (const std::string version : {"2024a.1.0", "2023c.1.0"}) {
+    install_and_use(version, "44l");
+    boot_changes_nothing_and_prints(no_lines());
+  }
 }
 
 TEST_F(StartupPass, KeepsARecordOnBootsThatActivateNothing) {
@@ -98,18 +96,13 @@ TEST_F(StartupPass, ReportsTheActiveUpdateAnnouncedAgainOnEveryBoot) {
   }
 }
 
-TEST_F(StartupPass, RefusesAnUpdateThatIsNotNewer) {
-  install_update("2023b.1.0", "44l");
-  install_update("2023c.01.0", "44l");
-  for (const std::string version : {"2023b.1.0", "2023c.01.0"}) {
-    announce(version);
+TEST_F(StartupPass, RefusesAnUpdateThatIsNotNewerOrOfAnotherSchema) {
+  for (const auto& [version, schema] :
+       {std::pair("2023b.1.0", "44l"), std::pair("2023c.01.0", "44l"),
+        std::pair("2024a.1.0", "45l")}) {
+    install_and_announce(version, schema);
     boot_changes_nothing_and_prints(lines(refused(version, "2023c.1.0")));
   }
-}
-
-TEST_F(StartupPass, RefusesAnUpdateOfAnotherSchema) {
-  install_and_announce("2024a.1.0", "45l");
-  boot_changes_nothing_and_prints(lines(refused("2024a.1.0", "2023c.1.0")));
 }
 
 TEST_F(StartupPass, RefusesAnUpdateWithoutIcuData) {
@@ -223,20 +216,17 @@ TEST_F(StartupPass, StillRefusesAnUpdateAfterResettingBadLinks) {
 
 // --- A current set that cannot be used any more
 
-TEST_F(StartupPass, ResetsAnUpdateThatASystemUpgradeOvertook) {
-  install_and_use("2024b.1", "44l");
-  install_system("2024b", "44l");
-  boot_prints(lines(incompatible()));
-  expect_links_at_system();
-  EXPECT_EQ(file_at(record), nothing);
-  boot_changes_nothing_and_prints(no_lines());
-}
-
-TEST_F(StartupPass, ResetsAnUpdateOfAnotherSchemaThanTheSystems) {
-  install_and_use("2024a.1.0", "44l");
-  install_system("2023c", "45l");
-  boot_prints(lines(incompatible()));
-  expect_links_at_system();
+TEST_F(StartupPass, ResetsAnUpdateThatIsOlderThanTheSystemOrOfAnotherSchema) {
+  for (const auto& [version, release, schema] :
+       {std::tuple("2024b.1", "2024b", "44l"),
+        std::tuple("2024a.1.0", "2023c", "45l")}) {
+    install_and_use(version, "44l");
+    install_system(release, schema);
+    boot_prints(lines(incompatible()));
+    expect_links_at_system();
+    EXPECT_EQ(file_at(record), nothing);
+    boot_changes_nothing_and_prints(no_lines());
+  }
 }
 
 TEST_F(StartupPass, ResetsAnUpdateThatIsGone) {
@@ -306,11 +296,15 @@ TEST_F(StartupPass, TakesTheSystemsSchemaForTheUpdateAlsoAfterAReset) {
 
 // --- The last resort
 
-TEST_F(StartupPass, ResetsValidLinksWhenTheAnnouncementIsAFile) {
+TEST_F(StartupPass,
+       ResetsValidLinksAndRepairsTheLocalTimeWhenTheAnnouncementIsAFile) {
   install_and_use("2024a.1.0", "44l");
   make_file(tz_latest);
-  boot_prints(lines(cannot_read(tz_latest, EINVAL), unable_to_locate(EINVAL)));
+  wipe(local_time);
+  boot_prints(lines(cannot_read(tz_latest, EINVAL), unable_to_locate(EINVAL),
+                    resetting_localtime()));
   expect_links_at_system();
+  EXPECT_EQ(link_at(local_time), default_localtime);
 }
 
 TEST_F(StartupPass, ReadsTheAnnouncementBeforeTheCurrentLinks) {
@@ -361,14 +355,6 @@ TEST_F(StartupPass, UndoesAnActivationThatStopsHalfway) {
   EXPECT_EQ(file_at(record), nothing);
 }
 
-TEST_F(StartupPass, StillRepairsTheLocalTimeAfterTheLastResort) {
-  make_file(tz_latest);
-  wipe(local_time);
-  boot_prints(lines(cannot_read(tz_latest, EINVAL), unable_to_locate(EINVAL),
-                    resetting_localtime()));
-  EXPECT_EQ(link_at(local_time), default_localtime);
-}
-
 TEST_F(StartupPass, EndsWithADefaultLocalTimeWhenTheCorrectedLinkFails) {
   // In the second boot the old link stays until the fallback deletes it; the
   // first that is deleted is "/var/db/icu".
@@ -399,8 +385,13 @@ TEST_F(StartupPass, EndsAbnormallyWhenTheLastResortFails) {
 
 TEST_F(StartupPass, EndsAbnormallyWhenTheSystemsOwnNumbersDoNotFit) {
   install_system("2147483648a", "44l");
-  expect_nothing_changed_by(
-      [] { boot_aborts_after(unable_to_locate(), of_the_runtime); });
+  make_file(old_icu);
+  const auto aborts = [] {
+    boot_aborts_after(unable_to_locate(), of_the_runtime);
+  };
+  aborts();
+  EXPECT_EQ(link_at(old_icu), nothing) << "it goes before a boot can end";
+  expect_nothing_changed_by(aborts);
 }
 
 TEST_F(StartupPass, EndsAbnormallyWhenTheLocalTimeCannotBeReset) {
@@ -422,13 +413,18 @@ TEST_F(StartupPass, EndsAbnormallyWithoutATimezoneDirectory) {
 }
 
 TEST_F(StartupPass, EndsAbnormallyInADirectoryThatCannotBeWritten) {
+  const auto aborts_after = [](const auto&... reason) {
+    const auto reset = failed_reset(EACCES);
+    set_mode(timezone_root, 0555);
+    expect_nothing_changed_by([&] {
+      boot_aborts_after(reason..., reset, unable_to_locate(EEXIST), reset);
+    });
+    set_mode(timezone_root, 0755);
+  };
   point_zoneinfo_at("nonsense");
-  set_mode(timezone_root, 0555);
-  const auto reset = failed_reset(EACCES);
-  expect_nothing_changed_by([&] {
-    boot_aborts_after(bad_zoneinfo_link("nonsense"), invalid_links(), reset,
-                      unable_to_locate(EEXIST), reset);
-  });
+  aborts_after(bad_zoneinfo_link("nonsense"), invalid_links());
+  install_and_use("2022a.1.0", "44l");
+  aborts_after(incompatible());
 }
 
 TEST_F(StartupPass, NeedsNoWritableDirectoryWhenThereIsNothingToDo) {
@@ -437,15 +433,6 @@ TEST_F(StartupPass, NeedsNoWritableDirectoryWhenThereIsNothingToDo) {
 }
 
 // --- The first steps
-
-TEST_F(StartupPass, MovesTheLegacyLinkBeforeLookingAtAnyData) {
-  install_and_use("2024a.1.0", "44l");
-  wipe(icutz);
-  make_link(legacy_icutz, update("2024a.1.0") + "/icutz");
-  boot_prints(no_lines());
-  expect_links_at_update("2024a.1.0");
-  EXPECT_EQ(link_at(legacy_icutz), nothing);
-}
 
 TEST_F(StartupPass, DeletesADanglingLegacyLinkWithTheNextReset) {
   make_link(legacy_icutz, "/var/db/gone");
@@ -468,9 +455,8 @@ TEST_F(StartupPass, RemovesTheObsoleteIcuLinkFileOrEmptyDirectory) {
   removes_it();
 }
 
-TEST_F(StartupPass, QuietlyLeavesANonEmptyObsoleteIcuDirectoryAtEveryBoot) {
+TEST_F(StartupPass, QuietlyLeavesAnObsoleteIcuDirectoryThatIsNotEmpty) {
   make_file(old_icu + "/file");
-  boot_changes_nothing_and_prints(no_lines());
   boot_changes_nothing_and_prints(no_lines());
 }
 
@@ -534,23 +520,6 @@ TEST_F(StartupPass, MovesALegacyLinkThatResolvesThroughTheObsoleteIcu) {
   EXPECT_EQ(link_at(icutz), old_icu);
   EXPECT_EQ(link_at(legacy_icutz), nothing);
   EXPECT_EQ(link_at(old_icu), nothing);
-}
-
-TEST_F(StartupPass, RemovesTheObsoleteIcuBeforeAnythingThatCanEndTheBoot) {
-  make_file(old_icu);
-  install_system("2147483648a", "44l");
-  EXPECT_EQ(boot().signal, SIGABRT);
-  EXPECT_EQ(link_at(old_icu), nothing);
-}
-
-TEST_F(StartupPass, TakesTheLastResortWhenTheResetOfAnOldSetFails) {
-  install_and_use("2024a.1.0", "44l");
-  install_system("2025a", "44l");
-  set_mode(timezone_root, 0555);
-  const auto reset = failed_reset(EACCES);
-  expect_nothing_changed_by([&] {
-    boot_aborts_after(incompatible(), reset, unable_to_locate(EEXIST), reset);
-  });
 }
 
 TEST_F(StartupPass, KeepsARecordThroughEveryReset) {

@@ -55,21 +55,21 @@ TEST_F(UntrustedData, OfAnyKindInPlaceOfAVersionFileIsHarmless) {
   expect_activation();
 }
 
-TEST_F(UntrustedData, OfAFifoInPlaceOfTheFormatFileCountsAsNone) {
-  make_fifo(system_icu + "/icutzformat.txt");
-  boot_prints(lines(refused("2024a.1.0", "2023c.1.0")));
-}
-
-TEST_F(UntrustedData, OfAFifoInPlaceOfTheSystemsVersionCountsAsNone) {
+TEST_F(UntrustedData, OfAFifoInPlaceOfAFileOfTheSystemOrTheRecordCountsAsNone) {
+  const auto none = unparsed(".1.0");
   make_fifo(system_tree + "/+VERSION");
-  boot_prints(lines(unparsed(".1.0"), unparsed(".1.0")));
+  boot_prints(lines(none, none));
   EXPECT_EQ(file_at(record), ".1.0_2024a.1.0");
-}
 
-TEST_F(UntrustedData, OfAFifoInPlaceOfTheRecordIsLeftAlone) {
   make_fifo(record);
-  expect_activation();
+  point_links_at_system();
+  boot_prints(lines(none, none));
+  expect_links_at_update("2024a.1.0");
   EXPECT_EQ(file_at(record), "(something else)");
+
+  make_fifo(system_icu + "/icutzformat.txt");
+  point_links_at_system();
+  boot_prints(lines(none, none, refused("2024a.1.0", ".1.0")));
 }
 
 // The lines of a boot's trace that open a version, the format or the record.

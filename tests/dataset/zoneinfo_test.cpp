@@ -26,28 +26,14 @@ TEST_F(Zoneinfo, OfAnEmptyPathIsTheSystemTree) {
 }
 
 TEST_F(Zoneinfo, OfAnUpdateIsTheTreeInItsDirectory) {
-  make_file(update_path + "/zoneinfo/+VERSION", "\n  2016a and more\n");
+  make_file(update_path + "/zoneinfo/+VERSION", "\n  2016a,x and more\n");
   const mln_zoneinfo tree(update_path);
   EXPECT_EQ(tree.dataset_path, update_path);
   EXPECT_EQ(tree.zoneinfo_path, "/var/db/timezone/tz/2016a.1.0/zoneinfo");
-  EXPECT_EQ(tree.version(), "2016a");
-}
-
-TEST_F(Zoneinfo, DoesNotLookForATrailingSlash) {
-  EXPECT_EQ(mln_zoneinfo(update_path + "/").zoneinfo_path,
-            "/var/db/timezone/tz/2016a.1.0//zoneinfo");
-}
-
-TEST_F(Zoneinfo, TakesAVersionWordThatOnlyWhiteSpaceEnds) {
-  make_file(system_tree + "/+VERSION", "2016a,x y");
-  EXPECT_EQ(mln_zoneinfo().version(), "2016a,x");
+  EXPECT_EQ(tree.version(), "2016a,x");
 }
 
 TEST_F(Zoneinfo, WithoutAVersionFileIsQuietlyWithoutAVersion) {
-  EXPECT_EQ(quietly([] { return mln_zoneinfo().version(); }), "");
-  make_file(system_tree + "/+VERSION", "");
-  EXPECT_EQ(quietly([] { return mln_zoneinfo().version(); }), "");
-  make_file(system_tree + "/+VERSION", "2016a", 0);
   EXPECT_EQ(quietly([] { return mln_zoneinfo().version(); }), "");
 }
 
@@ -73,7 +59,7 @@ TEST_F(ZoneinfoActivate, LinksTheSystemTree) {
   EXPECT_EQ(link_at(zoneinfo), "/usr/share/zoneinfo.default");
 }
 
-TEST_F(ZoneinfoActivate, LinksAnUpdatesTree) {
+TEST_F(ZoneinfoActivate, LinksAnUpdatesTreeEvenIfItDoesNotExist) {
   point_zoneinfo_at("/var/db/anything");
   quietly([] { mln_zoneinfo(update_path).activate(); });
   EXPECT_EQ(link_at(zoneinfo), "/var/db/timezone/tz/2016a.1.0/zoneinfo");
@@ -89,11 +75,6 @@ TEST_F(ZoneinfoActivate, MakesALinkThatIsRightAnew) {
 
   set_mode(timezone_root, 0555);
   printed_before_throwing(EEXIST, [] { mln_zoneinfo().activate(); });
-}
-
-TEST_F(ZoneinfoActivate, LinksATreeThatDoesNotExist) {
-  mln_zoneinfo("/var/db/timezone/tz/none").activate();
-  EXPECT_EQ(link_at(zoneinfo), "/var/db/timezone/tz/none/zoneinfo");
 }
 
 TEST_F(ZoneinfoActivate, OverADirectoryReportsBothFailuresAndThrows) {

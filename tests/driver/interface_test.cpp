@@ -108,8 +108,7 @@ TEST_F(Interface, OfComponents) {
   expect_links_at_update("2024a.1.0");
 }
 
-class without_activate : public mln_dataset_component {
- public:
+struct without_activate : mln_dataset_component {
   bool compatible_schema(const mln_dataset_component&) const override {
     return true;
   }
@@ -117,27 +116,22 @@ class without_activate : public mln_dataset_component {
  protected:
   ~without_activate() = default;
 };
-class without_compatible_schema : public mln_dataset_component {
- public:
+struct without_compatible_schema : mln_dataset_component {
   void activate() const override {}
 
  protected:
   ~without_compatible_schema() = default;
 };
-class with_a_third : public mln_dataset_component {
- public:
+struct with_a_third : mln_dataset_component {
   virtual void third() const = 0;
 
  protected:
   ~with_a_third() = default;
 };
 
-TEST_F(Interface, OfTheVirtualOperationsIsPure) {
+TEST_F(Interface, OfTheVirtualOperationsIsPureAndHasSlotsInTheirOrder) {
   static_assert(std::is_abstract_v<without_activate>);
   static_assert(std::is_abstract_v<without_compatible_schema>);
-}
-
-TEST_F(Interface, OfTheVirtualOperationsHasSlotsInTheirOrder) {
   EXPECT_EQ(slot_of(&with_a_third::third), 2) << "there are more than two";
   EXPECT_EQ(slot_of(&mln_dataset_component::compatible_schema), 0);
   EXPECT_EQ(slot_of(&mln_dataset_component::activate), 1);
@@ -152,12 +146,11 @@ TEST_F(Interface, OfReadingKeepsWhatWasFound) {
   wipe(system_tree);
   wipe(system_icu);
   wipe(update("2024a.1.0") + "/icutz");
-  EXPECT_THAT(printed_by([&] {
-                tree.read_version();
-                system.initialize();
-                icu.initialize();
-              }),
-              no_lines());
+  quietly([&] {
+    tree.read_version();
+    system.initialize();
+    icu.initialize();
+  });
   EXPECT_EQ(tree.version_string, "2023c");
   EXPECT_EQ(system.schema, "44l");
   EXPECT_EQ(icu.schema, "44l");
@@ -165,6 +158,8 @@ TEST_F(Interface, OfReadingKeepsWhatWasFound) {
 
 TEST_F(Interface, OfDataSets) {
   static_assert(!std::is_polymorphic_v<mln_dataset>);
+  static_assert(!std::is_copy_constructible_v<mln_dataset> &&
+                !std::is_copy_assignable_v<mln_dataset>);
   const mln_dataset system;
   mln_dataset update("/var/db/timezone/tz/2024a.1.0");
   EXPECT_TRUE(stand_in_order(update.version, update.version_string, update.path,

@@ -106,13 +106,6 @@ TEST_F(WithoutMemory, TheMigrationEndsWhenItsOwnPathsDoNotFit) {
   EXPECT_EQ(link_at(legacy_icutz), "/var/db");
 }
 
-TEST_F(WithoutMemory, ThePassEndsWhereTheMigrationDoes) {
-  EXPECT_THAT(printed_by_refused(
-                  [] { EXPECT_THROW(run_startup_pass(), std::bad_alloc); }),
-              no_lines());
-  EXPECT_EQ(link_at(zoneinfo), nothing);
-}
-
 TEST_F(WithoutMemory, TheRecordIsLeftAloneAndItsCallerTold) {
   make_file(record, "2022a.1.0_2023c.1.0");
   const std::string from = "2023c.1.0";

@@ -18,12 +18,11 @@ std::string shown(const mln_version& version) {
 const std::string unset = "-1||-1|-1";
 
 TEST(VersionParse, FillsFourFields) {
-  EXPECT_THAT(printed_by([] {
-                EXPECT_EQ(shown(mln_version("2016a")), "2016|a|-1|-1");
-                EXPECT_EQ(shown(mln_version("2016a.1.0")), "2016|a|1|0");
-                EXPECT_EQ(shown(mln_version("2016ab.7")), "2016|ab|7|-1");
-              }),
-              no_lines());
+  quietly([] {
+    EXPECT_EQ(shown(mln_version("2016a")), "2016|a|-1|-1");
+    EXPECT_EQ(shown(mln_version("2016a.1.0")), "2016|a|1|0");
+    EXPECT_EQ(shown(mln_version("2016ab.7")), "2016|ab|7|-1");
+  });
 }
 
 TEST(VersionParse, StartsUnset) { EXPECT_EQ(shown(mln_version()), unset); }
@@ -47,16 +46,12 @@ TEST(VersionParse, PrintsATextUpToItsFirstNul) {
               lines(unparsed("2016a", any_error)));
 }
 
-TEST(VersionParse, OfAMalformedTextUnsetsAnEarlierValue) {
-  mln_version version("2016a.1.0");
-  printed_by([&] { version.parse("nonsense"); });
-  EXPECT_EQ(shown(version), unset);
-}
-
-TEST(VersionParse, OfAShorterTextUnsetsTheNumbersThatItLacks) {
+TEST(VersionParse, UnsetsWhatAnEarlierTextSet) {
   mln_version version("2016a.1.2");
   version.parse("2017b");
   EXPECT_EQ(shown(version), "2017|b|-1|-1");
+  printed_by([&] { version.parse("nonsense"); });
+  EXPECT_EQ(shown(version), unset);
 }
 
 TEST(VersionParse, TakesTheLargestNumber) {
@@ -67,14 +62,9 @@ TEST(VersionParse, TakesTheLargestNumber) {
 }
 
 TEST(VersionParse, ThrowsOutOfRangeForALargerNumber) {
-  EXPECT_THAT(printed_by([] {
-                EXPECT_THROW(mln_version("2147483648a"), std::out_of_range);
-                EXPECT_THROW(mln_version("1a.2147483648"), std::out_of_range);
-                EXPECT_THROW(mln_version("1a.1.4294967296"), std::out_of_range);
-                EXPECT_THROW(mln_version("99999999999999999999999a"),
-                             std::out_of_range);
-              }),
-              no_lines());
+  for (const char* text : {"2147483648a", "1a.2147483648", "1a.1.4294967296",
+                           "99999999999999999999999a"})
+    quietly([&] { EXPECT_THROW(mln_version{text}, std::out_of_range); });
 }
 
 TEST(VersionParse, LeavesTheErrnoOfTheStandardConversion) {
@@ -136,13 +126,6 @@ TEST(VersionOrder, HasTheUnsetValueBelowEveryParsedOne) {
   EXPECT_FALSE(mln_version() > oldest);
   EXPECT_FALSE(mln_version() > mln_version());
   EXPECT_TRUE(mln_version() == mln_version());
-}
-
-TEST(VersionOrder, HasAllUnparseableTextsEqual) {
-  printed_by([] {
-    EXPECT_TRUE(mln_version("x") == mln_version("2016A"));
-    EXPECT_FALSE(mln_version("x") > mln_version("2016A"));
-  });
 }
 
 TEST(VersionEquality, AsksForAllFourFields) {
