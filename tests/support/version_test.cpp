@@ -50,6 +50,7 @@ TEST(VersionParse, UnsetsWhatAnEarlierTextSet) {
   mln_version version("2016a.1.2");
   version.parse("2017b");
   EXPECT_EQ(shown(version), "2017|b|-1|-1");
+  version.parse("2016a.1.2");
   printed_by([&] { version.parse("nonsense"); });
   EXPECT_EQ(shown(version), unset);
 }
