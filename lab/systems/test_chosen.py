@@ -19,8 +19,9 @@ MIXED = {f"mixed {number}": links for number, links in enumerate([
     (SYSTEM_ZONEINFO, f"{update_path('gone')}/icutz")])}
 MENDED = f"marlin-mend: {ZONEINFO} did not fit {ICUTZ}; marlin makes both anew\n"
 
-# Two differences from the unit, on purpose: a call that it refuses kills here, so that
-# no refusal goes unnoticed, and a missing directory does not keep it from starting.
+# Different from the unit, on purpose: a call that it refuses kills here, so that no
+# refusal goes unnoticed; a missing directory does not keep it from starting; the log is
+# a file, to be compared to the byte; and it is started by hand, many times.
 PREPARE = f"""
 cp {MEND} /run/mend.conf
 cd /run/systemd/system
