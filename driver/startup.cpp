@@ -55,9 +55,10 @@ void select_dataset() {
 
   const mln_dataset update(latest);
   // Deliberate: an update has to be newer than the data set that the links
-  // named at boot, even if they have just been reset, and of the system's
-  // schema; the record then starts from the active data set. Therefore an
-  // update that is older than the system's data can follow a reset. Pinned by
+  // named at boot, even if they have just been reset, because its installer
+  // could compare it only with that; the record starts from the active data
+  // set. Therefore an update that is older than the system's data can follow a
+  // reset. Pinned by
   // StartupPass.StillComparesWithTheOldCurrentSetAfterAReset and
   // StartupPass.RecordsTheSystemVersionFirstAfterAReset.
   if (update.compatible_with(system) && update > current) {
