@@ -1,7 +1,9 @@
 # SPDX-License-Identifier: BSD-2-Clause
-"""Everything that boots the program many times and judges it.
+"""Everything that boots the program many times and judges it, in floors; each imports
+only from those above it in this list.
 
-`device` describes a device, a module of `carriers` makes it real, `boot` runs the
-program there under one of the `conditions`, `seen` is what that left, and `trial`
-compares it with what `model` and `properties` expect.
+`words` describe a device and what is seen of it, `carriers` make one real and boot it,
+`oracles` say what must happen. On these stand `arm64_device` and `debian_systems`,
+which boot in an emulator, `demo` and `readers`, `bench`, the `proofs`, a file for each
+claim, and at the bottom the `doors` that scripts/ opens.
 """

@@ -12,15 +12,17 @@ import pytest
 
 sys.path.insert(0, os.path.dirname(os.path.dirname(os.path.abspath(__file__))))
 
-from lab import devices, properties, test_kills  # noqa: E402
 from lab.carriers import namespace  # noqa: E402
-from lab.places import BUILD  # noqa: E402
+from lab.oracles import properties  # noqa: E402
+from lab.proofs import kills  # noqa: E402
+from lab.words import chosen_devices  # noqa: E402
+from lab.words.places import BUILD  # noqa: E402
 
 TALLY = {}
 # Of tests that scripts/prove cannot run.
-DOORS = {"lab/emulator/": "device --tests", "lab/systems/": "device --systems",
-         "lab/readers/": "readers",
-         "lab/test_recipe": "readers", "lab/test_image": "readers --image"}
+DOORS = {"lab/arm64_device/": "device --tests",
+         "lab/debian_systems/": "device --systems", "lab/proofs/readers": "readers",
+         "lab/proofs/recipe": "readers", "lab/proofs/image": "readers --image"}
 os.environ["PYTEST_CACHE"] = str(BUILD / "prove" / "pytest")  # for pytest.ini
 
 
@@ -93,13 +95,13 @@ def never_seen() -> list[str]:
     """What a run of this size has to have met, and has not."""
     wanted = []
     if TALLY.get("test_a_kill", 0) >= 200:
-        wanted += [f"kills leave {window.name}" for window in test_kills.WINDOWS]
+        wanted += [f"kills leave {window.name}" for window in kills.WINDOWS]
     if TALLY.get("test_a_kill_of_the_installer", 0) >= 600:
         wanted += ["kills that leave the new update announced",
                    "kills that leave the old announcement"]
     if TALLY.get("states", 0) >= 2000:
         wanted += [f"of them: {outcome}" for outcome in properties.OUTCOMES]
-    if TALLY.get("test_memory_is_refused", 0) == len(devices.CHOSEN):
+    if TALLY.get("test_memory_is_refused", 0) == len(chosen_devices.CHOSEN):
         wanted.append("refusals after which a walk is not started")
     return [title for title in wanted if not TALLY.get(title)]
 

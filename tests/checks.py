@@ -17,8 +17,9 @@ from pathlib import Path
 
 PROJECT = Path(__file__).resolve().parents[1]
 sys.path.insert(0, str(PROJECT))
-from lab import ci, lines  # noqa: E402
-from lab.doors import Options  # noqa: E402
+from lab.doors import ci  # noqa: E402
+from lab.words import lines  # noqa: E402
+from lab.words.command import Options  # noqa: E402
 
 os.chdir(PROJECT)
 PRODUCT = [path for folder in ("driver", "dataset", "support")
@@ -130,7 +131,8 @@ def manual_pages() -> Iterator[str]:
     diagnostics = re.search(r"^\.Sh DIAGNOSTICS\n(.*?)^\.Sh ", marlin, re.M | re.S)[1]
     told = set(re.findall(r"^\.It (.*)", diagnostics, re.M))
     yield from differences(texts, "the program", told, "DIAGNOSTICS")
-    yield from differences(texts, "the program", set(lines.FORMATS), "lab/lines.py")
+    yield from differences(texts, "the program", set(lines.FORMATS),
+                           "lab/words/lines.py")
 
     # What marlin-status knows of a boot: its lines, and why it does what.
     known = Path("tools/status/explanation.cpp").read_text()

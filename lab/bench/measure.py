@@ -24,12 +24,12 @@ from pathlib import Path
 
 from lab.bench.peak import peak
 from lab.carriers import namespace
-from lab.device import Device, sound_device
-from lab.devices import activation
-from lab.install import SOURCE, icu_data, put_update, zone
-from lab.paths import (DOWNLOADS, ICUTZ, LOCALTIME, RECORD, SYSTEM_ZONEINFO, TZ_LATEST,
-                       ZONEINFO, update_path)
-from lab.seen import as_device
+from lab.oracles.installer import SOURCE, icu_data, put_update, zone
+from lab.words.chosen_devices import activation
+from lab.words.device import Device, sound_device
+from lab.words.paths import (DOWNLOADS, ICUTZ, LOCALTIME, RECORD, SYSTEM_ZONEINFO,
+                             TZ_LATEST, ZONEINFO, update_path)
+from lab.words.seen import as_device
 
 ICU = f"{update_path('2024a.1.0')}/icutz"
 # All that the programs get, and this only because the script needs its tools. Each

@@ -9,10 +9,10 @@ import time
 
 from lab.bench.peak import peak
 from lab.carriers.namespace import build_below
-from lab.device import Device, decoded, sound_device
-from lab.devices import activation
-from lab.paths import update_path
-from lab.places import BUILD
+from lab.words.chosen_devices import activation
+from lab.words.device import Device, decoded, sound_device
+from lab.words.paths import update_path
+from lab.words.places import BUILD
 
 STATUS = BUILD / "bench" / "static" / "tools" / "marlin-status"
 TREE = BUILD / "bench" / "device"

@@ -18,8 +18,8 @@ import tempfile
 from pathlib import Path
 
 from lab.carriers.namespace import build_below
-from lab.device import Node, decoded, encoded
-from lab.seen import KINDS, Entries, Entry
+from lab.words.device import Node, decoded, encoded
+from lab.words.seen import Entries, Entry, KINDS
 
 ENVIRONMENT = {**os.environ, "PATH": os.environ["PATH"] + ":/usr/sbin:/sbin"}
 

@@ -7,9 +7,9 @@ import os
 import stat
 from pathlib import Path
 
-from lab.device import Device, Node, decoded, encoded
-from lab.paths import PLACES
-from lab.seen import Entries, Entry, as_device, kind_and_mode
+from lab.words.device import Device, Node, decoded, encoded
+from lab.words.paths import PLACES
+from lab.words.seen import Entries, Entry, as_device, kind_and_mode
 
 INSIDE = "MARLIN_PRIVATE_DEVICE"  # in the environment of what runs there
 

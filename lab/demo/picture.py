@@ -12,8 +12,9 @@ import re
 import subprocess
 from pathlib import Path
 
-from lab.doors import Options, need, say, stop
-from lab.places import PROJECT, shown
+from lab.carriers.building import need
+from lab.words.command import Options, say, stop
+from lab.words.places import PROJECT, shown
 
 TITLE = "What scripts/demo shows"
 HEADINGS = re.compile(r"── \S*(3  |In short)")  # each behind a colour

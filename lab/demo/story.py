@@ -21,13 +21,14 @@ import time
 from collections.abc import Iterable
 from pathlib import Path
 
-from lab import boot, lines
-from lab.carriers import namespace
-from lab.demo import data, screen
-from lab.device import Device
-from lab.paths import (DOWNLOADS, FORMER_ZONEINFO, ICUTZ, LOCALTIME, RECORD, SYSTEM_ICU,
-                       SYSTEM_ZONEINFO, TIMEZONE, TZ_LATEST, ZONEINFO, update_path)
-from lab.seen import Entries, Seen, as_device
+from lab.carriers import boot, namespace, real_data
+from lab.demo import screen
+from lab.words import lines
+from lab.words.device import Device
+from lab.words.paths import (DOWNLOADS, FORMER_ZONEINFO, ICUTZ, LOCALTIME, RECORD,
+                             SYSTEM_ICU, SYSTEM_ZONEINFO, TIMEZONE, TZ_LATEST, ZONEINFO,
+                             update_path)
+from lab.words.seen import Entries, Seen, as_device
 
 ROWS = {"zoneinfo": ZONEINFO, "icutz": ICUTZ, "localtime": LOCALTIME,
         "tz_latest": TZ_LATEST, "record": RECORD}
@@ -137,7 +138,7 @@ class Story:
 
     def __init__(self):
         self.device = Device()  # as it is to be at the next boot
-        self.names = data.names()
+        self.names = real_data.names()
         self.year = self.names.year
         self.endings = []  # of scenes, in the words of the summary
         self.facts = []  # as they were found
@@ -146,7 +147,7 @@ class Story:
 
     def bring(self, source: str, target: str):
         """Has the device hold what stands somewhere in the data."""
-        self.device.put(target, namespace.description_of(data.TARGET / source))
+        self.device.put(target, namespace.description_of(real_data.TARGET / source))
 
     def install_system(self, data_set: str):
         self.bring(f"{data_set}/zoneinfo", SYSTEM_ZONEINFO)
@@ -164,12 +165,12 @@ class Story:
         self.make_real()
         version = getattr(self.names, data_set)
         unpacked = Path("/tmp", version)
-        shutil.copytree(data.TARGET / data_set, unpacked, symlinks=True)
+        shutil.copytree(real_data.TARGET / data_set, unpacked, symlinks=True)
         done = subprocess.run([COMPANIONS / "marlin-install", unpacked],
                               capture_output=True, text=True)
         shutil.rmtree(unpacked)
         self.device.root = as_device(namespace.look()).root
-        made = json.loads((data.TARGET / f"{data_set}.json").read_text())
+        made = json.loads((real_data.TARGET / f"{data_set}.json").read_text())
         zones = ", ".join(made["changed"])
         self.told = {
             "made": [f"{version} by make-update; differ from the system's: {zones}"],
@@ -252,7 +253,7 @@ class Story:
         if rows["localtime"].startswith(f"{ZONEINFO}/"):
             zone = rows["localtime"].removeprefix(f"{ZONEINFO}/")
             rows["ICU clock"] = " ".join(output(
-                str(data.ICU_PROGRAM), seconds, zone, ICU_DATA=SYSTEM_ICU,
+                str(real_data.ICU_PROGRAM), seconds, zone, ICU_DATA=SYSTEM_ICU,
                 ICU_TIMEZONE_FILES_DIR=ICUTZ).split()[:2])
         return rows
 

@@ -7,8 +7,8 @@ from collections.abc import Callable
 from dataclasses import dataclass, field
 from pathlib import Path
 
-from lab.paths import FORMER_ZONEINFO, ICUTZ, LOCALTIME, SYSTEM_ICU, ZONEINFO
-from lab.places import BUILD
+from lab.words.paths import FORMER_ZONEINFO, ICUTZ, LOCALTIME, SYSTEM_ICU, ZONEINFO
+from lab.words.places import BUILD
 
 HOME = BUILD / "readers"
 UNPACKED = HOME / "debian"  # Debian packages that are not installed for this

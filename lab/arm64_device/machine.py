@@ -1,0 +1,234 @@
+# SPDX-License-Identifier: BSD-2-Clause
+"""An emulated arm64 device: its disks, its boots, and its console.
+
+The system partition is read-only and holds the program; "/var" is a disk of its own.
+The console is a file, in which every line begins with the kernel's time.
+"""
+
+import contextlib
+import functools
+import os
+import re
+import shutil
+import subprocess
+import tempfile
+import time
+from collections.abc import Callable
+from pathlib import Path
+
+from lab.arm64_device.parts import COMPANIONS, PROGRAM, WORK, part
+from lab.carriers import image
+from lab.carriers.boot import Booted, ending_of
+from lab.words import lines
+from lab.words.device import Device, Node, decoded
+from lab.words.paths import ICUTZ, LOCALTIME, SYSTEM_ZONEINFO, TZ_LATEST, ZONEINFO
+from lab.words.seen import Entries
+
+GUEST = Path(__file__).parent / "guest"
+MODULES = ("drivers/virtio/virtio_ring", "drivers/virtio/virtio",
+           "drivers/virtio/virtio_mmio", "drivers/block/virtio_blk",
+           "fs/overlayfs/overlay")
+# What fills the disk of "/var", in the language of the device's shell.
+NO_BLOCK = """
+dd if=/dev/zero of=/var/filler bs=65536 2>/dev/null
+dd if=/dev/zero of=/var/filler2 bs=4096 2>/dev/null
+"""
+NO_INODE = """
+mkdir /var/filler
+i=0
+while touch /var/filler/$i 2>/dev/null; do i=$((i + 1)); done
+"""
+NO_FILLER = "rm -rf /var/filler*\n"
+LINKS = (ZONEINFO, ICUTZ, LOCALTIME, TZ_LATEST)
+
+
+def first_memory(script: str) -> bytes:
+    """The cpio archive that the kernel unpacks at first: enough to mount the disks, and
+    what the device is to do when it is up."""
+    entries = [
+        *((name, 0o40755, b"") for name in "bin dev device modules proc sys".split()),
+        ("bin/busybox", 0o100755, part("bin/busybox").read_bytes()),
+        ("init", 0o100755, (GUEST / "init").read_bytes()),
+        *((f"modules/{name.rpartition('/')[2]}.ko", 0o100644,
+           part(f"kernel/{name}.ko").read_bytes()) for name in MODULES),
+        ("script", 0o100644, script.encode()), ("TRAILER!!!", 0, b"")]
+    archive = bytearray()
+    for inode, (name, mode, content) in enumerate(entries, 1):
+        encoded = name.encode() + b"\0"
+        fields = (inode, mode, 0, 0, 1, 0, len(content), 0, 0, 0, 0, len(encoded), 0)
+        archive += b"070701" + b"".join(b"%08X" % field for field in fields)
+        for text in (encoded, content):
+            archive += text
+            archive += bytes(-len(archive) % 4)
+    return bytes(archive)
+
+
+def system_partition(device: Device) -> Node:
+    """The program, a shell, and the system's own data."""
+    system = Device()
+    for path in ("/dev", "/proc", "/run", "/sys", "/tmp"):
+        system.directory(path)
+    system.file("/bin/busybox", decoded(part("bin/busybox").read_bytes()), 0o755)
+    for program in (PROGRAM, *COMPANIONS):
+        system.file(f"/sbin/{program.name}", decoded(program.read_bytes()), 0o755)
+    system.file("/sbin/boot", decoded((GUEST / "boot").read_bytes()), 0o755)
+    system.file("/etc/passwd", "owner:x:1:1::/:/run/bin/sh\n")
+    system.put("/usr/share", device.find("/usr/share"))
+    return system.root
+
+
+@functools.cache
+def zones(name: str) -> dict[str, str]:
+    """Zone files, by path in a tree, with abbreviations that begin with a name."""
+    with tempfile.TemporaryDirectory() as tree:
+        image.run("zic", "-d", tree, "-", input=(
+            f"Zone America/Los_Angeles -8:00 - {name}L\n"
+            f"Zone Europe/Paris 1:00 - {name}P\n").encode())
+        return {zone: decoded(Path(tree, zone).read_bytes())
+                for zone in ("America/Los_Angeles", "Europe/Paris")}
+
+
+def compile_zones(device: Device):
+    """Has the zones of every tree tell, as their abbreviation, where they come from:
+    U24AP is Paris in an update to 2024a."""
+    for path, node in list(device.everything()):
+        tree, is_version, _ = path.rpartition("/+VERSION")
+        if is_version:
+            letter = "S" if tree == SYSTEM_ZONEINFO else "U"
+            name = f"{letter}{node.text[2:4]}{node.text[4:].strip().upper()}"
+            for zone, text in zones(name).items():
+                device.find(f"{tree}/{zone}").text = text
+
+
+def shown_links(device: Device) -> list[str]:
+    """What a boot that ends with this device says of its links."""
+    contents = device.contents()
+    return [f"{os.path.basename(path)} -> {contents.get(path, 'none')}"
+            for path in LINKS]
+
+
+def ending(status: int) -> str:
+    """As in Seen; the device's shell tells a signal as a status above 128."""
+    return ending_of(status - 128 if status > 128 else status << 8)
+
+
+class Console:
+    """What a boot printed: lines with the kernel's time in seconds."""
+
+    def __init__(self, path: Path):
+        self.text = path.read_text(errors="replace") if path.exists() else ""
+        # Whole ones only: the power may have been cut within a line.
+        matches = re.findall(r"^\[ *(\d+\.\d+)\] ?(.*)\n", self.text, re.MULTILINE)
+        self.lines = [(float(at), text) for at, text in matches]
+        self.said = [text.removeprefix("device: ") for _, text in self.lines
+                     if text.startswith("device: ")]
+        self.told = [text.removeprefix("told ") for text in self.said
+                     if text.startswith("told ")]  # by a program on the device
+
+    def failure(self, what: str) -> RuntimeError:
+        return RuntimeError(f"{what}:\n{self.text[-6000:]}")
+
+    def find(self, start: str) -> tuple[float, str]:
+        """The time and the rest of the device's first line that begins so."""
+        for at, text in self.lines:
+            if text.startswith("device: " + start):
+                return at, text.removeprefix("device: " + start)
+        raise self.failure(f"the console never said: {start}")
+
+    def booted(self) -> Booted:
+        """The boot's own pass; the kernel may have printed in between."""
+        begin, _ = self.find("pass begins")
+        end, status = self.find("pass ended with status ")
+        return Booted(ending(int(status)), "".join(
+            f"{text}\n" for at, text in self.lines if begin <= at <= end
+            and text.startswith((lines.NAME, "terminate called"))))
+
+
+def relink(before: dict[str, str], after: dict[str, str]) -> str:
+    """What the device's shell does to links so that one description becomes the
+    other; an announcement is replaced as installers of updates do it."""
+    removed = [f"rm {path}\n" for path in before if path not in after]
+    return "".join(removed + [
+        f"ln -s {text} {path}.next && mv -T {path}.next {path}\n"
+        for path, text in after.items() if before.get(path) != text])
+
+
+def plain(name: str, path: Path) -> str:
+    """An image as the emulator's block device of this name."""
+    return f"driver=raw,node-name={name},file.driver=file,file.filename={path}"
+
+
+class Machine:
+    """One device, in a directory of its own. `device` describes it."""
+
+    def __init__(self, name: str):
+        self.directory = WORK / name
+        shutil.rmtree(self.directory, ignore_errors=True)
+        self.directory.mkdir(parents=True)
+        self.system, self.var, self.memory, self.console = (
+            self.directory / part for part in
+            ("system.img", "var.img", "memory", "console"))
+
+    def build(self, device: Device, *options: str, megabytes=32, owner=0,
+              **beside: Node):
+        """Makes both disks of a described device, with what is to stand in "/var"
+        beside its own; the options are of mke2fs."""
+        self.device = device
+        compile_zones(device)
+        image.build(self.system, system_partition(device), 14, "-O", "^has_journal")
+        self.built = image.digest(self.system)
+        root = Node("dir", 0o755, entries={"db": device.find("/var/db"), **beside})
+        image.build(self.var, root, megabytes, *options, owner=owner)
+
+    def look(self, var: Path | None = None) -> Entries:
+        """Everything on the device, or on it with another disk. Raises if anything at
+        all on the system partition has changed since it was built."""
+        if image.digest(self.system) != self.built:
+            raise RuntimeError("the system partition was changed")
+        return {**image.look(self.system, "/usr/share", "/usr/share"),
+                **image.look(var or self.var, "/db", "/var/db")}
+
+    def command(self, script="", options="", disk="", serial="mon:stdio") -> list[str]:
+        self.memory.write_bytes(first_memory(script))
+        return ["qemu-system-aarch64", "-M", "virt", "-cpu", "cortex-a57", "-m", "256",
+                "-nodefaults", "-no-reboot", "-display", "none", "-serial", serial,
+                "-kernel", str(part("vmlinuz-*")), "-initrd", str(self.memory),
+                "-append",
+                f"console=ttyAMA0 loglevel=5 printk.devkmsg=on panic=-1 {options}",
+                "-blockdev", f"{plain('system', self.system)},read-only=on",
+                "-blockdev", disk or plain("var", self.var),
+                "-device", "virtio-blk-device,drive=var",
+                "-device", "virtio-blk-device,drive=system"]
+
+    def start(self, script="", options="", disk="", more=()) -> subprocess.Popen:
+        """`script` is what the device does when it is up, in its shell's language;
+        `options` are the kernel's, or var=OPTIONS of the mount; `disk` is the
+        emulator's block device instead of the plain image, `more` are words for it."""
+        self.console.unlink(missing_ok=True)
+        command = self.command(script, options, disk, f"file:{self.console}")
+        return subprocess.Popen([*command, *more], stdin=subprocess.DEVNULL)
+
+    def boot(self, then: Callable[[], object] | None = None, script="", seconds=120,
+             **how) -> Console:
+        """One boot from power on to power off. `then` changes links in the
+        description after the pass, and the device's shell does the same."""
+        before = self.device.contents()
+        if then:
+            then()
+        script = relink(before, self.device.contents()) + script
+        emulator = self.start(script, **how)
+        with contextlib.suppress(subprocess.TimeoutExpired):
+            emulator.wait(seconds)
+        emulator.kill()
+        console = Console(self.console)
+        if emulator.wait() != 0 or "shut down" not in console.said:
+            raise console.failure("the device did not shut down")
+        return console
+
+    def wait_for(self, emulator: subprocess.Popen, text: str, seconds=120):
+        """Until the console says so."""
+        end = time.monotonic() + seconds
+        while text not in Console(self.console).said:
+            if time.monotonic() > end or emulator.poll() is not None:
+                raise Console(self.console).failure(f"the console never said: {text}")
+            time.sleep(0.05)

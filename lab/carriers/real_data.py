@@ -1,0 +1,59 @@
+# SPDX-License-Identifier: BSD-2-Clause
+"""The data of the demonstration, made by make-system and make-update. Real except for
+the names of the releases and what releases.py, beside this, invents: in the later ones
+Lisbon changes its zone.
+
+Made are a system partition's data, a download, a later one whose ICU data has another
+schema, and what a still later system brings, each a `zoneinfo` tree beside an `icu` or
+`icutz` directory; what make-update told of each; and a program that reads ICU's data.
+"""
+
+import shutil
+import subprocess
+import sys
+import tempfile
+from pathlib import Path
+
+from lab.carriers import releases
+from lab.words.places import BUILD, PROJECT
+
+TARGET = BUILD / "demo/data"
+ICU_PROGRAM = TARGET / "icu-clock"
+ICU_SOURCE = PROJECT / "lab/readers/icu.cpp"
+
+
+def prepare():
+    try:
+        releases.prepare()
+        releases.once(TARGET, [
+            releases.TARGET / "inputs", shutil.which("zic"), __file__, ICU_SOURCE,
+            *sorted(PROJECT.glob("tools/make*"))], make)
+    except (releases.NotOfTheForm, subprocess.CalledProcessError) as failed:
+        sys.exit(f"demo: {failed}")
+
+
+def names() -> releases.Names:
+    """With the versions of updates, as 2025c.1.0, in place of their releases."""
+    found = releases.names()
+    return found._replace(update=f"{found.update}.1.0", refused=f"{found.refused}.1.0")
+
+
+def make():
+    made = releases.names()
+    with tempfile.TemporaryDirectory(dir=TARGET) as work:
+        system, upgrade, other = (Path(work, name) for name in
+                                  ("system", "upgrade", "other"))
+        releases.make_system(made.system, made.icu, system)
+        releases.make_system(made.upgrade, made.icu, upgrade)
+        releases.make_system(made.system, made.other_icu, other)
+        for name, partition in (("update", system), ("refused", other)):
+            told = releases.output(*releases.tool(
+                "make-update", **releases.given(getattr(made, name)),
+                system=partition, out=work), "--json")
+            (TARGET / f"{name}.json").write_bytes(told)
+            Path(work, getattr(names(), name)).rename(TARGET / name)
+        for partition in (system, upgrade):
+            (partition / "zoneinfo.default").rename(partition / "zoneinfo")
+            partition.rename(TARGET / partition.name)
+    releases.output("g++", "-O1", ICU_SOURCE, "-o", ICU_PROGRAM, "-licui18n",
+                    "-licuuc")

@@ -1,0 +1,104 @@
+# SPDX-License-Identifier: BSD-2-Clause
+"""What a program can do in marlin's place, under the unit as it ships, with the lean
+example beside it, and under no restriction; and what a profile adds to that."""
+
+import re
+
+import pytest
+
+from lab.debian_systems.machine import Seen, System, UNIT, message
+from lab.debian_systems.scene import (ZONE, device, fail, insist, install_update_here,
+                                      linked, names)
+from lab.words import lines
+from lab.words.paths import LOCALTIME, RECORD, ZONEINFO
+
+LEAN = "/usr/share/doc/marlin/examples/lean.conf"
+APPARMOR = "/usr/share/doc/marlin/examples/apparmor"
+# All else is refused. The program is the owner of what is root's, and this is.
+DONE = {"write /var/db/entry", "write /var/db/timezone/entry",
+        "read /etc/shadow", "read /run/secret"}
+
+
+def results(seen: Seen, unit: str) -> dict[str, str]:
+    """What the probe printed, by what it tried."""
+    return dict(map(str.strip, message(entry).split(":", 1))
+                for entry in seen.said_by(_SYSTEMD_UNIT=unit)
+                if ":" in message(entry))
+
+
+LIMITS = {"limit memory": str(640 << 20), "limit core": "0"}
+REFUSED = "Operation not permitted"
+BARE = """[Unit]
+DefaultDependencies=no
+[Service]
+Type=oneshot
+ExecStart=/usr/libexec/marlin
+"""
+
+
+def shortcomings(tried: dict[str, str], may: set[str], free: dict[str, str]):
+    """What came out wrong. `free` is what came of the same without restrictions, where
+    everything can be opened and no call is refused."""
+    for what, unrestricted in free.items():
+        result = tried.get(what, "not tried")
+        if what.startswith("call "):
+            right = result == REFUSED != unrestricted
+        elif what.startswith(("read ", "write ")):
+            right = unrestricted == "done" and result != "not tried" and (
+                (result == "done") == (what in may))
+        else:
+            right = result == LIMITS.get(what, result)
+        if not right:
+            yield f"{what}: {result}; without restrictions: {unrestricted}"
+
+
+def test_the_probe_is_refused():
+    system = System("probe", f"""
+        cp usr/lib/lab/probe/marlin usr/libexec/marlin
+        {linked(device())}
+        chmod 640 etc/shadow
+        echo 'f /run/secret 0600 - - - secret' >etc/tmpfiles.d/secret.conf""")
+    seen = system.boot(f"""
+        cd /run/systemd/system
+        grep -v ^Refuse /usr/lib/systemd/system/{UNIT} >lean.service
+        mkdir lean.service.d
+        cp {LEAN} lean.service.d
+        grep -Ev '^(Refuse|InaccessiblePaths)' /usr/lib/systemd/system/{UNIT} \
+          >open.service
+        printf %s '{BARE}' >bare.service
+        systemctl daemon-reload
+        systemctl start lean.service open.service bare.service""")
+    capabilities = {what: result.strip() for what, result in results(
+        seen, "open.service").items() if what.startswith("Cap")}
+    assert set(capabilities.values()) == {"0" * 16} and len(capabilities) == 5
+    free = results(seen, "bare.service")
+    assert list(free)[-1] == "call mmap of writable code"
+    lean = {what for what in DONE if what.startswith("write")}
+    fail(seen, [f"{unit}: {text}" for unit, may in (
+        (UNIT, DONE), ("lean.service", lean))
+                for text in shortcomings(results(seen, unit), may, free)])
+
+
+@pytest.mark.parametrize("enforced", [True, False], ids=["enforced", "not loaded"])
+def test_a_record_that_is_a_link(enforced):
+    """Only the profile forbids to write to what it names, and nothing else."""
+    other, update = "/var/db/other", names().update
+    system = System(f"apparmor-{enforced}", f"""
+        {install_update_here()} {linked(device(announced=True))}
+        echo kept >.{other}
+        ln -s {other} .{RECORD}
+        ln -sfn /usr/share/zoneinfo/{ZONE} .{LOCALTIME}
+        mkdir -p etc/systemd/system/{UNIT}.d
+        echo '[Unit]\nAfter=apparmor.service' >etc/systemd/system/{UNIT}.d/order.conf
+        rm etc/systemd/system/apparmor.service
+        rm -f etc/apparmor.d/[a-z]*.*
+        {f"cp .{APPARMOR} etc/apparmor.d/usr.libexec.marlin" if enforced else ""}""")
+    seen = system.boot("dmesg | grep DENIED >/run/lab/seen/denied",
+                       "sysctl.kernel.printk_ratelimit=0")
+    made = device(active=True, announced=True)
+    made.link(RECORD, other)
+    insist(seen, [lines.CORRECTING % f"{ZONEINFO}/{ZONE}"], made, reader="14:00 CEST")
+    denied = re.findall(' name="([^"]*)"', seen.text("denied"))
+    assert denied == [other] * enforced, seen.text("denied")
+    assert seen.text(other) == ("kept\n" if enforced else
+                                f"{names().system}.1.0_{update}")

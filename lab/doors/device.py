@@ -1,0 +1,90 @@
+# SPDX-License-Identifier: BSD-2-Clause
+"""Builds the program for arm64 and boots it on an emulated device: a real kernel, a
+read-only system partition, an ext4 disk for "/var". Without an option it shows an
+update being announced at one boot and activated at the next: the console, what readers
+of time-zone data see, and the links. With --systems it boots whole Debian systems
+instead, with the package installed.
+
+What is needed is installed, as root, and a kernel is fetched into the folder "build".
+Exit status: 0 when all is as expected, otherwise 1; 2 for bad use; 77 when a device
+cannot be emulated here.
+"""
+
+import argparse
+import os
+import subprocess
+import sys
+
+from lab.words.command import Options, number
+from lab.words.places import PROJECT
+
+
+def main() -> int:
+    parser = Options(prog="scripts/device", description=__doc__,
+                     formatter_class=argparse.RawDescriptionHelpFormatter)
+    mode = parser.add_mutually_exclusive_group()
+    mode.add_argument("--shell", action="store_true", help="a prompt on the device, "
+                      'after the pass; "poweroff -f" ends it')
+    mode.add_argument("--tests", nargs="*", metavar="TEST", help="every chosen device, "
+                      "sequences of boots on one disk, ten power cuts; or these tests")
+    mode.add_argument("--power-cuts", type=number, metavar="N", help="cuts the "
+                      "power at N random instants, and checks what is left")
+    mode.add_argument("--boot-cost", action="store_true",
+                      help="measures the part of a boot that the pass takes")
+    mode.add_argument("--install-cuts", type=number, metavar="N", help="the "
+                      "same while updates are installed")
+    parser.add_argument("--mend", action="store_true", help="of --power-cuts: each "
+                        "boot first removes links that are of two sets")
+    mode.add_argument("--systems", nargs="*", metavar="TEST", help="Debian systems "
+                      "with the package: the boot unit, other inits; or these tests")
+    mode.add_argument("--unit-cost", action="store_true",
+                      help="measures what each restriction of the boot unit costs")
+    parser.add_argument("--quick", action="store_true",
+                        help="of the systems only those that scripts/ci boots")
+    parser.add_argument("--on", choices=("amd64", "arm64", "debian-11", "debian-13"),
+                        default="amd64", help="of --systems and --unit-cost: another "
+                        "system than Debian 12 on amd64; arm64 is half as fast")
+    parser.add_argument("--seed", type=int, help="of what chance decides in cuts")
+    options = parser.parse_args()
+    if subprocess.call([PROJECT / "scripts/packages", "pytest"]):
+        return 77
+    os.environ["MARLIN_SYSTEMS"] = options.on
+    # After the options are understood: these take pytest.
+    import pytest
+    from lab.arm64_device import boot_cost, install_cuts, parts, power_cuts, show
+    from lab.debian_systems import cost, parts as systems
+    run = ["-c", "lab/pytest.ini", f"--rootdir={PROJECT}", "-n", "2", "--dist"]
+    try:
+        if options.systems is not None:
+            systems.prepare()
+            return pytest.main([*run, "load", "--durations=0", *(
+                ["-m", "not rest"] if options.quick else []),
+                *(options.systems or ["lab/debian_systems"])])
+        if options.unit_cost:
+            cost.measure()
+            return 0
+        parts.prepare()
+        if options.tests is not None:
+            return pytest.main([*run, "loadfile",
+                                *(options.tests or ["lab/arm64_device"])])
+        if options.shell:
+            return show.shell()
+        if options.power_cuts:
+            power_cuts.run(options.power_cuts, options.seed, options.mend)
+        elif options.install_cuts:
+            install_cuts.run(options.install_cuts, options.seed)
+        elif options.boot_cost:
+            boot_cost.measure()
+        else:
+            show.show()
+    except parts.Unavailable as reason:
+        print(f"SKIPPED: {reason}", file=sys.stderr)
+        return 77
+    except RuntimeError as reason:
+        print(f"FAILED: {reason}")
+        return 1
+    return 0
+
+
+if __name__ == "__main__":
+    sys.exit(main())

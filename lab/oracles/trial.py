@@ -1,0 +1,149 @@
+# SPDX-License-Identifier: BSD-2-Clause
+"""One device, one condition, one boot: compared with the model, call by call where it
+is traced. A trial that fails tells the device in words and where it differs."""
+
+from __future__ import annotations
+
+import functools
+import os
+from itertools import zip_longest
+
+import pytest
+
+from lab.carriers import boot, namespace
+from lab.oracles import model
+from lab.oracles.conditions import Condition
+from lab.words import lines
+from lab.words.chosen_devices import CHOSEN
+from lab.words.device import Device, Node, described
+from lab.words.seen import Call, Entries, Seen, as_device
+
+
+def fail(what: str, found: list[str], before: Entries):
+    """Ends the test if anything is wrong, which is `found`; `before` is the device at
+    the start."""
+    if found:
+        pytest.fail("\n  ".join([what, *found]) + "\nThe device at the start:\n" +
+                    as_device(before).in_words(), pytrace=False)
+
+
+def real(name: str) -> tuple[Device, Entries]:
+    """A chosen device, made real, and how it looks."""
+    device = CHOSEN[name]()
+    namespace.build(device)
+    return device, namespace.look()
+
+
+@functools.cache
+def undisturbed(name: str) -> Seen:
+    """An undisturbed boot of a chosen device, with all its calls."""
+    namespace.build(CHOSEN[name]())
+    return Seen({}, {}, *boot.traced(), list(boot.calls()))
+
+
+def trial(device: Device, condition: Condition | None = None,
+          tell="the boot", again=False) -> tuple[model.Outcome, Seen]:
+    """Boots a described device, really and in the model, which changes `device`; fails
+    where they differ. With a condition the calls are compared as well. `again`: the
+    device is still there from the boot before."""
+    if not again:
+        namespace.build(device)
+    nodes = dict(device.everything())
+    before = namespace.look()
+    outcome = expected(device, condition or Condition())
+    if condition is None:
+        booted, calls = boot.boot(), []
+    else:
+        booted = boot.traced("-e", f"trace={boot.TRACED}", *condition.options(outcome))
+        calls = boot.pass_of(list(boot.calls()))
+    seen = Seen(before, namespace.look(), *booted, calls)
+    found = differences(device, nodes, outcome, seen)
+    if condition is not None:
+        found += call_differences(outcome, calls)
+        tell = condition.name
+    fail(tell, found, before)
+    return outcome, seen
+
+
+def expected(device: Device, condition: Condition) -> model.Outcome:
+    """The model's boot; its `failed` are the numbers of the calls that failed."""
+    outcome = model.boot(device, condition.fault, condition.killed_before)
+    outcome.failed = [number for number, call in enumerate(outcome.calls, start=1)
+                      if condition.fault(number, *call) is not None]
+    condition.amend(device, outcome)
+    return outcome
+
+
+def differences(device: Device, nodes: dict[str, Node], outcome: model.Outcome,
+                seen: Seen) -> list[str]:
+    """Where a boot was not as the model says; `nodes` are the description's as they
+    were before it."""
+    return (log_differences(outcome, seen) + entry_differences(device, seen.after) +
+            touched(device, nodes, outcome, seen))
+
+
+def entry_differences(device: Device, entries: Entries) -> list[str]:
+    """Where the real device is not as described. The description learns again in
+    which order directories are listed."""
+    found = []
+    nodes = dict(device.everything())
+    for path in sorted(nodes.keys() | entries.keys()):
+        if path not in entries:
+            found.append(f"{path} is missing: expected {described(nodes[path])}")
+        elif path not in nodes:
+            found.append(f"{path} is there: {described(entries[path])}")
+        else:
+            node, here = nodes[path], entries[path]
+            if described(node) != described(here):
+                found.append(f"{path} is {described(here)}, expected {described(node)}")
+            elif node.kind == "dir" and set(here.names) == set(node.entries):
+                node.entries = {name: node.entries[name] for name in here.names}
+    return found
+
+
+def touched(device: Device, nodes: dict[str, Node], outcome: model.Outcome,
+            seen: Seen) -> list[str]:
+    """Entries that were changed or made anew, though no call of the model's boot has
+    to do with them."""
+    now, changed = dict(device.everything()), seen.changed()
+    return [f"{path} was changed or made anew" for path, node in nodes.items()
+            if now.get(path) is node and node not in outcome.changed
+            and path in seen.before and path in seen.after and path in changed]
+
+
+def log_differences(outcome: model.Outcome, seen: Seen | boot.Booted) -> list[str]:
+    """Where the printed lines or the ending are not what the model says."""
+    found = []
+    if seen.ending != outcome.ending:
+        found.append(f"ended with {seen.ending}, expected {outcome.ending}")
+    rest = seen.log
+    for text, error in outcome.lines:
+        start = f"{lines.NAME}{text}: "
+        if not rest.startswith(start):
+            return found + [f"expected the line {start!r}, got {first_line(rest)!r}"]
+        ending, _, rest = rest[len(start):].partition("\n")
+        if error is not None and ending != os.strerror(error):
+            found.append(f"{start!r} ends in {ending!r}, "
+                         f"expected {os.strerror(error)!r}")
+        if ending not in lines.ERROR_TEXTS:
+            found.append(f"{start!r} ends in {ending!r}, which is no error's text")
+    # The runtime's own words on an exception that nobody caught may follow.
+    if rest and (outcome.ending != "abort" or rest.startswith(lines.NAME)):
+        found.append(f"expected no further line, got {first_line(rest)!r}")
+    return found
+
+
+def first_line(text: str) -> str:
+    return text.partition("\n")[0]
+
+
+def call_differences(outcome: model.Outcome, calls: list[Call]) -> list[str]:
+    """Where the calls are not the model's, or other calls failed than were to."""
+    made = [(call.name, call.path) for call in calls]
+    for number, (wanted, got) in enumerate(zip_longest(outcome.calls, made), start=1):
+        if wanted != got:
+            return [f"call {number} is {got or 'missing'}, expected {wanted or 'none'}"]
+    injected = [number for number, call in enumerate(calls, start=1) if call.injected]
+    if injected != outcome.failed:
+        return [f"failed were the calls {injected}, not {outcome.failed}"]
+    return []

@@ -1,0 +1,79 @@
+# SPDX-License-Identifier: BSD-2-Clause
+"""usage: scripts/coverage
+
+Measures which lines and branches of driver/, dataset/ and support/ the tests run
+through, those of the program that they boot included. Fails unless all of them are.
+Not counted as branches are the edges on which exceptions leave a call, and whether the
+address of a reference is null, which the compiler asks before a dynamic_cast.
+
+The report is build/coverage/report/index.html. Exit status: 0 when everything is
+covered, 1 when a test fails or something is not, 2 for bad use.
+"""
+
+import json
+import os
+import shutil
+from concurrent.futures import ThreadPoolExecutor
+from pathlib import Path
+
+from lab.carriers.building import build, locked, need, quietly
+from lab.words.command import Options, stop
+from lab.words.places import BUILD, shown
+
+FOLDER = BUILD / "coverage"
+REPORT = FOLDER / "report"
+LOG = FOLDER / "log"
+
+
+def gcovr(*options):
+    quietly(LOG, "gcovr", "--root", ".", "--filter", "driver/", "--filter", "dataset/",
+            "--filter", "support/", *options)
+
+
+def run_tests(program: Path):
+    """Left out: a million texts through std::regex, with every step counted, which show
+    nothing more than a few; a boot that may not write more than five bytes into any
+    file, so not its counters either; whole lists of calls, at the end of which the
+    counters are written."""
+    quietly(LOG.with_name(f"log of {program.name}"), program, "--gtest_brief=1",
+            "--gtest_filter=-*OnAMillion*:*CannotBeWrittenWhole*:WholeListOfCalls.*")
+
+
+def measure():
+    shutil.rmtree(REPORT, ignore_errors=True)
+    build("coverage")
+    for counters in FOLDER.rglob("*.gcda"):
+        counters.unlink()
+    with ThreadPoolExecutor(os.cpu_count()) as together:
+        list(together.map(run_tests, FOLDER.glob("tests/*_test")))
+    REPORT.mkdir()
+    # An object that was built but never ran counts as well: all of it is missing.
+    gcovr("--object-directory", FOLDER, "--exclude-directories", ".*/CompilerIdCXX",
+          "--exclude-throw-branches", "--exclude-unreachable-branches",
+          "--exclude-branches-by-pattern", r".*dynamic_cast<[^>]*\*>\(&",
+          "--html-details", REPORT / "index.html", "--json", REPORT / "data.json",
+          "--json-summary", REPORT / "summary.json", FOLDER)
+
+
+def main():
+    Options(__doc__).parse_args()
+    need("build", "private-device", "test", "coverage")
+    with locked(FOLDER):
+        measure()
+        figures = json.loads((REPORT / "summary.json").read_text())
+    told, complete = [], True
+    for kind, name in (("line", "lines"), ("branch", "branches")):
+        covered, total = figures[f"{kind}_covered"], figures[f"{kind}_total"]
+        told.append(f"{covered} of {total} {name}")
+        complete = complete and covered == total > 0
+    if not complete:
+        for option in ([], ["--branches"]):
+            gcovr("--add-tracefile", REPORT / "data.json", *option)
+            print(LOG.read_text(), end="")
+    print("coverage:", ", ".join(told), flush=True)
+    if not complete:
+        stop(1, f"not complete; see {shown(REPORT / 'index.html')}")
+
+
+if __name__ == "__main__":
+    main()

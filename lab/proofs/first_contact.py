@@ -1,0 +1,237 @@
+# SPDX-License-Identifier: BSD-2-Clause
+"""What a newcomer meets: doors that explain themselves, a machine that lacks something,
+a checkout in an odd place. No test installs anything."""
+
+import os
+import re
+import shutil
+import subprocess
+from pathlib import Path
+
+import pytest
+
+from lab.carriers import building, private_device, releases
+from lab.words.places import PROJECT
+
+DOORS = sorted(door for door in (PROJECT / "scripts").iterdir()
+               if os.access(door, os.X_OK) and door.is_file())
+REFUSAL = "bwrap: No permissions to create a new namespace"
+
+
+def run(*words, **environment) -> subprocess.CompletedProcess:
+    return subprocess.run(
+        words, env={**os.environ, **environment}, stdin=subprocess.DEVNULL,
+        capture_output=True, text=True, cwd="/")
+
+
+def told(done: subprocess.CompletedProcess, status: int) -> str:
+    """The one line with which a command has ended."""
+    assert (done.returncode, done.stdout) == (status, ""), done.stdout + done.stderr
+    assert done.stderr.count("\n") == 1, done.stderr
+    return done.stderr
+
+
+@pytest.fixture
+def fakes(tmp_path):
+    """fakes(name=script...) tells a PATH on which these programs come first."""
+    def path(**scripts):
+        for name, script in scripts.items():
+            program = tmp_path / "fakes" / name.replace("_", "-")
+            program.parent.mkdir(exist_ok=True)
+            program.write_text(f"#!/bin/sh\n{script}\n")
+            program.chmod(0o755)
+        return f"{tmp_path}/fakes:{os.environ['PATH']}"
+    return path
+
+
+def copied(place: Path, *names: str) -> Path:
+    """A checkout with all that git has of it, or of these."""
+    for name in names or [entry.name for entry in PROJECT.iterdir()
+                          if entry.name not in ("build", ".git")]:
+        copy = shutil.copytree if (PROJECT / name).is_dir() else shutil.copy
+        (place / name).parent.mkdir(parents=True, exist_ok=True)
+        copy(PROJECT / name, place / name)
+    return place
+
+
+@pytest.mark.parametrize("door", [*DOORS, PROJECT / ".ci/run"],
+                         ids=lambda door: door.name)
+def test_doors_explain_themselves(door, tmp_path):
+    done = run(door, "--help", MARLIN_BUILD=str(tmp_path))
+    assert (done.returncode, done.stderr) == (0, "")
+    assert re.match(f"usage: scripts/{door.name}|usage: scripts/ci", done.stdout)
+    line = told(run(door, "--no-such-thing", MARLIN_BUILD=str(tmp_path)), 2)
+    assert line.endswith("; see --help\n")
+    assert not list(tmp_path.iterdir())
+
+
+# --- A machine that lacks something -----------------------------------------------
+
+
+@pytest.mark.parametrize("words", [["--probe"], ["true"]])
+def test_a_device_that_cannot_be_had_is_explained(words, fakes):
+    path = fakes(bwrap=f"echo '{REFUSAL}' >&2; exit 1")
+    line = told(run(PROJECT / "scripts/private-device", *words, PATH=path), 77)
+    assert line.startswith(f"private-device: {REFUSAL}; allow it ")
+
+
+def test_a_missing_bubblewrap_is_named(fakes, tmp_path):
+    path = fakes(realpath='exec /usr/bin/realpath "$@"',
+                 dirname='exec /usr/bin/dirname "$@"').partition(":")[0]
+    assert "Debian package bubblewrap" in told(
+        run(PROJECT / "scripts/private-device", "true", PATH=path), 77)
+
+
+@pytest.mark.parametrize("setting, value, user, advice", [
+    ("kernel/unprivileged_userns_clone", "0", 1000,
+     "sysctl -w kernel.unprivileged_userns_clone=1"),
+    ("user/max_user_namespaces", "0", 1000, "sysctl -w user.max_user_namespaces=10000"),
+    ("kernel/apparmor_restrict_unprivileged_userns", "1", 1000,
+     "sysctl -w kernel.apparmor_restrict_unprivileged_userns=0"),
+    ("kernel/apparmor_restrict_unprivileged_userns", "0", 1000, "seccomp=unconfined"),
+    ("kernel/unprivileged_userns_clone", "0", 0, "--cap-add SYS_ADMIN"),
+])
+def test_the_remedy_fits_the_machine(setting, value, user, advice, tmp_path,
+                                     monkeypatch):
+    file = tmp_path / setting
+    file.parent.mkdir()
+    file.write_text(f"{value}\n")
+    monkeypatch.setattr(private_device, "SETTINGS", str(tmp_path))
+    monkeypatch.setattr(os, "geteuid", lambda: user)
+    assert advice in private_device.remedy()
+
+
+@pytest.mark.parametrize("door, says", [
+    ("test", r"\ntest: ([1-9]\d\d+) of \1 tests skipped.*\n$"), ("demo", r"\n$")])
+def test_nothing_is_built_where_there_can_be_no_device(door, says, fakes, tmp_path):
+    path = fakes(bwrap=f"echo '{REFUSAL}' >&2; exit 1")
+    done = run(PROJECT / "scripts" / door, PATH=path,
+               MARLIN_BUILD=str(tmp_path / "made"))
+    assert (done.returncode, done.stdout) == (77, "")
+    assert re.match(f"private-device: {REFUSAL}; allow it .*{says}", done.stderr)
+    assert not list((tmp_path / "made").iterdir())
+
+
+@pytest.mark.parametrize("preset, skipped, status", [
+    ("dev", "", 0), ("dev", "Calls.A", 77), ("arm64-dev", "Calls.A", 0),
+    ("arm64-dev", "Calls.A LinkRepair.B", 77), ("asan", "Calls.A", 77),
+    ("asan", "UntrustedData.A", 0)])
+def test_skipped_tests_do_not_count_as_passed(preset, skipped, status, fakes, tmp_path,
+                                              monkeypatch, capsys):
+    results = "".join(f"{number}/9 Test #{number}: {name} ...***Skipped   0.01 sec\n"
+                      for number, name in enumerate(skipped.split(), start=1))
+    (tmp_path / "printed").write_text(
+        f"{results}\n100% tests passed, 0 tests failed out of 9\n")
+    monkeypatch.setenv("PATH", fakes(ctest=f"cat '{tmp_path}/printed'"))
+    assert building.run_tests(tmp_path, ".",
+                              *building.MAY_SKIP[preset]) == status
+    printed = capsys.readouterr().out
+    number = len(skipped.split())
+    assert ("100%" in printed) == (number == 0)
+    assert (f"out of 9, {number} of 9 skipped" in printed) == (number > 0)
+
+
+@pytest.mark.parametrize("root", ["su", "sudo"])
+def test_whoever_is_not_root_is_told_a_command_that_works(root, fakes, tmp_path):
+    tools = ("awk", "dirname", "realpath", "sed")
+    log = tmp_path / "log"
+    path = fakes(
+        **{tool: f'exec /usr/bin/{tool} "$@"' for tool in tools}, id="echo 1000",
+        dpkg_query="echo installed/g++ not-installed/ninja-build",
+        apt_get=f'echo "$@" >>"{log}"', **{root: (
+            'shift; exec /bin/sh -c "$@"' if root == "su" else 'exec /bin/"$@"')},
+    ).partition(":")[0]
+    line = told(run(PROJECT / "scripts/packages", "build", PATH=path), 1)
+    assert run("/bin/sh", "-c", line.partition(": to install what is missing: ")[2],
+               PATH=path).returncode == 0
+    assert log.read_text().splitlines() == [
+        "update", "install -y --no-install-recommends cmake ninja-build "
+        "nlohmann-json3-dev"]
+
+
+def test_every_purpose_is_listed():
+    listed = re.findall("^([^#:]+):", (PROJECT / "scripts/packages.list").read_text(),
+                        re.MULTILINE)
+    assert len(listed) == len(set(listed))
+    for source in (PROJECT / "lab").rglob("*.py"):
+        for words in re.findall(r"\bneed\(([^)]*)\)", source.read_text()):
+            assert set(re.findall('"([^"]*)"', words)) <= set(listed), source
+
+
+# --- A checkout in an odd place ---------------------------------------------------
+
+
+def test_a_private_device_is_made_from_any_place(tmp_path):
+    place = copied(tmp_path / "it's a \"$HOME\";\\ place", "scripts/private-device",
+                   "lab/carriers/private_device.py")
+    link = tmp_path / "link"
+    link.symlink_to(place / "scripts/private-device")
+    written = tmp_path / "to be; written"
+    written.mkdir()
+    script = ('test "$PWD" = "$1" && test -r lab/carriers/private_device.py && '
+              'touch "$2/here" && ! touch "$1/here" && ! touch /etc/here && '
+              'test -z "$(ls /var/db /usr/share 2>&1 | grep -v :)" && '
+              'test "$(grep -c : /proc/net/dev)" = 1 && '
+              'grep -q "CapEff:.00*$" /proc/self/status && exit 7')
+    done = run(link, "--writable", written, "--", "sh", "-c", script, "sh",
+               place, written)
+    assert done.returncode == 7, done.stderr
+    assert (written / "here").exists()
+
+
+def test_a_folder_that_somebody_else_made_is_refused(tmp_path):
+    parts = tmp_path / "emulator/packages"
+    parts.mkdir(parents=True)
+    refusal = f"{parts} is there, and not made by this; remove it"
+    assert refusal in told(run(PROJECT / "scripts/device", MARLIN_BUILD=str(tmp_path)),
+                           77)
+    with pytest.raises(releases.NotOfTheForm, match="not made by this"):
+        releases.once(parts, [], parts.rmdir)
+
+
+def test_a_signal_that_python_ignores_ends_a_command():
+    done = run(PROJECT / "scripts/private-device", "sh", "-c", "kill -PIPE $$; exit 3")
+    assert done.returncode == 128 + 13
+
+
+@pytest.mark.parametrize("words", [
+    [], ["--"], ["--readable"], ["--writable", "/no/such/folder", "true"],
+    ["--readable", "/etc/passwd", "true"], ["--probe", "true"]])
+def test_bad_use_of_a_private_device(words):
+    assert "see --help" in told(run(PROJECT / "scripts/private-device", *words), 2)
+
+
+@pytest.mark.parametrize("odd", [*"\n\"#*;<>?\\|'&^`", "${"])
+def test_a_place_in_which_nothing_can_be_built_is_refused(odd, tmp_path):
+    place = f"{tmp_path}/a{odd}b"
+    assert repr(odd) in told(run(PROJECT / "scripts/test", MARLIN_BUILD=place), 1)
+    assert not list(tmp_path.iterdir())
+
+
+def test_a_build_folder_has_an_absolute_path():
+    assert "absolute" in told(run(PROJECT / "scripts/test", MARLIN_BUILD="build"), 1)
+
+
+def test_a_checkout_that_cannot_be_written(tmp_path):
+    """Built elsewhere, in a place with an odd name, twice at once, through a link."""
+    checkout = copied(tmp_path / "a $HOME, read-only: 100% [plâce]")
+    link = tmp_path / "link"
+    link.symlink_to(checkout / "scripts/test")
+    read_only = ("bwrap", "--dev-bind", "/", "/", "--ro-bind", checkout, checkout)
+    assert "MARLIN_BUILD" in told(run(*read_only, link, MARLIN_BUILD=""), 1)
+
+    build = tmp_path / "another $place"
+    environment = {**os.environ, "MARLIN_BUILD": str(build)}
+    both = [subprocess.Popen([*read_only, link, "dev", "-R", "FirstWord"], text=True,
+                             env=environment, stdout=subprocess.PIPE,
+                             stderr=subprocess.PIPE) for _ in range(2)]
+    ended = [(*each.communicate(), each.returncode) for each in both]
+    for out, err, status in ended:
+        assert status == 0, out + err
+        assert re.search("100% tests passed, 0 tests failed out of [1-9]", out)
+    errors = "".join(err for _, err, _ in ended)
+    assert len(re.findall(r"^Building .* \(\d+ steps, about \d+ s\)$", errors,
+                          re.MULTILINE)) == 1
+    assert len(re.findall("^Waiting: ", errors, re.MULTILINE)) == 1
+    assert not (checkout / "build").exists()
+    shutil.rmtree(build)

@@ -1,0 +1,73 @@
+# SPDX-License-Identifier: BSD-2-Clause
+"""The image of docs/integration.md is made and boots; what systemd itself shows there.
+Takes root, a network and minutes: see scripts/readers."""
+
+import re
+
+import pexpect
+import pytest
+
+from lab.carriers import releases
+from lab.carriers.building import package
+from lab.words.places import PROJECT
+
+SECONDS = 400
+
+
+class Console(pexpect.spawn):
+    """The serial line of a system."""
+
+    def answer(self, command: str) -> str:
+        """What a command prints, on one line, and its status."""
+        # As it is typed, the end is not yet what is waited for.
+        self.sendline(f'echo "A:$({command} 2>&1):$?:""Z"')
+        self.expect_exact(":Z\r")
+        return self.before.rpartition("A:")[2].replace("\r", "")
+
+
+@pytest.fixture(scope="module")
+def console(tmp_path_factory):
+    """A system from the recipe, logged in."""
+    place = tmp_path_factory.mktemp("image")
+    release = releases.names().system
+    given = releases.given(release)
+    releases.run(releases.tool("make-system", **given, schema=releases.icu_schema(),
+                               out=place / "system"))
+    package("release", place)
+    text = (PROJECT / "docs/integration.md").read_text()
+    recipe = re.search(r"(?s)<!-- image -->\n```\n(.*?)```\n<!-- end -->", text)[1]
+    make, boot = recipe.split("qemu-system", 1)
+    releases.output("/bin/sh", "-euc", make, cwd=place)
+    with Console("/bin/sh", ["-euc", f"exec qemu-system{boot}"], SECONDS, cwd=place,
+                 encoding="utf-8", codec_errors="replace") as there:
+        there.expect_exact("login: ")
+        there.sendline("root")
+        there.expect_exact(":~# ")
+        yield there
+
+
+def test_marlin_ran(console):
+    told = console.answer("journalctl -q -o cat -u marlin")
+    for words in ("Bad zoneinfo link", "localtime link invalid; resetting to America"):
+        assert words in told
+    assert console.answer("readlink /var/db/timezone/zoneinfo") == (
+        "/usr/share/zoneinfo.default:0")
+    assert console.answer("date -d @1782900000 +%H:%M-%Z") == "03:00-PDT:0"
+
+
+def test_systemd(console):
+    """As docs/readers.md tells. PID 1 has started before there was a link."""
+    console.answer("systemd-run --on-calendar='2040-07-01 12:00' --unit=noon true")
+    timer = "TZ=UTC systemctl show noon.timer -p NextElapseUSecRealtime"
+    assert " 2040-07-01 19:00:00 UTC" in console.answer(timer)
+    assert console.answer("timedatectl show -p Timezone") == "Timezone=:0"
+    console.answer("ln -sfn /usr/share/zoneinfo/Europe/Lisbon /etc/localtime")
+    # It reads the link when it starts.
+    console.answer("systemctl stop systemd-timedated")
+    assert console.answer("timedatectl show -p Timezone") == "Timezone=Europe/Lisbon:0"
+    assert " 2040-07-01 11:00:00 UTC" in console.answer(timer)
+    assert console.answer("timedatectl set-timezone Europe/Paris") == ":0"
+    assert console.answer("readlink /etc/localtime") == (
+        "../usr/share/zoneinfo/Europe/Paris:0")
+    assert console.answer("readlink /var/db/timezone/localtime") == (
+        "/var/db/timezone/zoneinfo/America/Los_Angeles:0")

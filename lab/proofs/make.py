@@ -1,0 +1,686 @@
+# SPDX-License-Identifier: BSD-2-Clause
+"""What make-system and make-update make, what they refuse, and that the boot program
+takes it."""
+
+import functools
+import io
+import itertools
+import json
+import os
+import random
+import re
+import shlex
+import shutil
+import signal
+import subprocess
+import tarfile
+import tempfile
+import time
+import zoneinfo
+from datetime import datetime, timezone
+from pathlib import Path
+
+import pytest
+
+from lab.carriers import boot, namespace, releases
+from lab.oracles import model
+from lab.words.device import Device
+from lab.words.paths import (DOWNLOADS, ICUTZ, RECORD, SYSTEM_ICU, SYSTEM_ZONEINFO,
+                             ZONEINFO, update_path)
+from tools import make_data
+
+LISBON = ["Europe/Lisbon", "Portugal"]
+SINCE = "2025-06-01"
+NAMES = releases.names()
+VERSION = f"{NAMES.update}.1.0"
+
+
+@pytest.fixture
+def tmp_path():
+    """On this private device; pytest's own is elsewhere."""
+    with tempfile.TemporaryDirectory() as folder:
+        yield Path(folder)
+
+
+@pytest.fixture
+def place(tmp_path):
+    """A directory with what make-update is given: rules, ICU data, a system."""
+    source = releases.TARGET / NAMES.update
+    (tmp_path / "rules").mkdir()
+    shutil.copy(source / "tzdata.zi", tmp_path / "rules")
+    shutil.copytree(source / "icu", tmp_path / "icu")
+    have_system(tmp_path, NAMES.system)
+    (tmp_path / "out").mkdir()
+    return tmp_path
+
+
+@functools.cache
+def system_of(release: str) -> Path:
+    """A system's data, made once by this worker."""
+    place = Path(f"/tmp/systems/{release}")
+    place.parent.mkdir(exist_ok=True)
+    releases.make_system(release, NAMES.icu, place)
+    return place
+
+
+def have_system(place: Path, release: str):
+    shutil.rmtree(place / "system", ignore_errors=True)
+    shutil.copytree(system_of(release), place / "system")
+
+
+def make_update(place: Path, **options) -> list[str]:
+    """The command for what is there; options replace its own."""
+    return releases.tool("make-update", **{
+        "rules": place / "rules", "icu": place / "icu", "system": place / "system",
+        "out": place / "out", "since": SINCE, **options})
+
+
+def update(place: Path, *more: str, environment=None, **options):
+    return ran([*make_update(place, **options), *more], environment)
+
+
+def system(place: Path, *more: str, schema=NAMES.icu):
+    return ran([*releases.tool("make-system", rules=place / "rules", icu=place / "icu",
+                               schema=schema, out=place / "out/new"), *more])
+
+
+def ran(command: list[str], environment=None) -> subprocess.CompletedProcess:
+    return subprocess.run(command, capture_output=True, text=True, errors="replace",
+                          env={**os.environ, **(environment or {})})
+
+
+def made(done: subprocess.CompletedProcess) -> dict:
+    assert (done.returncode, done.stderr) == (0, "")
+    return json.loads(done.stdout)
+
+
+def refused(done: subprocess.CompletedProcess, words: str, status=1):
+    """One clear line, and no more."""
+    assert done.returncode == status, done.stderr
+    assert done.stdout == ""
+    assert done.stderr.count("\n") == 1 and done.stderr.endswith("\n"), done.stderr
+    assert done.stderr[:-1].isprintable()
+    assert done.stderr.startswith(("make-update: ", "make-system: "))
+    assert words in done.stderr
+
+
+def tree(root: Path) -> dict[str, tuple]:
+    """Everything below a directory: kind and mode, and content."""
+    return {str(path.relative_to(root)): (
+                oct(path.lstat().st_mode), path.read_bytes() if path.is_file() else b"")
+            for path in [root, *root.rglob("*")]}
+
+
+# --- What is made -----------------------------------------------------------------
+
+
+def test_an_update(place):
+    facts = made(update(place, "--json"))
+    assert facts == {
+        "version": VERSION, "schema": NAMES.icu,
+        "system": f"{NAMES.system}.1.0", "years": 10, "since": SINCE,
+        "directory": f"{place}/out/{NAMES.update}.1.0",
+        "changed": LISBON, "added": [], "removed": []}
+    assert os.listdir(place / "out") == [VERSION]
+    found = tree(place / "out" / VERSION)
+    assert set(os.listdir(facts["directory"])) == {"zoneinfo", "icutz"}
+    assert found["zoneinfo/+VERSION"][1] == f"{NAMES.update}\n".encode()
+    assert set(os.listdir(f"{facts['directory']}/icutz")) == {
+        f"icutz{NAMES.icu}.dat", *releases.RESOURCES}
+    # As the icu-devtools that made it read it again.
+    listed = ran(["/usr/sbin/icupkg", "-l",
+                  f"{facts['directory']}/icutz/icutz{NAMES.icu}.dat"])
+    assert listed.stdout.split() == list(releases.RESOURCES)
+    for name in releases.RESOURCES:
+        assert found[f"icutz/{name}"][1] == (place / "icu" / name).read_bytes()
+    assert found["zoneinfo/tzdata.zi"][1] == (place / "rules/tzdata.zi").read_bytes()
+    assert {mode for mode, _ in found.values()} == {"0o40755", "0o100644"}
+
+
+def test_what_people_are_told(place):
+    done = update(place)
+    assert done.stdout == (
+        f"{place}/out/{NAMES.update}.1.0: {NAMES.update}.1.0 for systems with "
+        f"{NAMES.system}.1.0 and the ICU schema {NAMES.icu}\n"
+        f"zones that differ from the system's from {SINCE} on: 2\n"
+        "  Europe/Lisbon\n  Portugal\n"
+        "zones that are new: none\nzones that are gone: none\n")
+
+
+def test_a_system(place):
+    out = place / "out/new"
+    facts = made(system(place, "--json"))
+    assert facts == {"version": VERSION, "schema": NAMES.icu,
+                     "directory": str(out)}
+    assert set(os.listdir(out)) == {"zoneinfo.default", "icu"}
+    assert (out / "icu/icutzformat.txt").read_text() == f"{NAMES.icu}\n"
+    assert (out / "zoneinfo.default/+VERSION").read_text() == f"{NAMES.update}\n"
+    made(update(place, "--json"))
+    assert tree(out / "zoneinfo.default") == tree(
+        place / "out" / f"{NAMES.update}.1.0/zoneinfo")
+
+
+def test_the_same_bytes(place, monkeypatch):
+    """Whatever the umask, the locale, the zone, the order of directories, and the
+    folder from which it is started."""
+    made(update(place, "--json"))
+    first = tree(place / "out")
+    other = place / "other"
+    for part in ("icu", "system", "rules"):
+        for path in sorted((place / part).rglob("*"), reverse=True):
+            if path.is_file():
+                copy = other / path.relative_to(place)
+                copy.parent.mkdir(parents=True, exist_ok=True)
+                shutil.copyfile(path, copy)
+                os.utime(copy, (1, 1))
+    (other / "out").mkdir()
+    monkeypatch.chdir(other)
+    was = os.umask(0o777)
+    try:
+        made(update(Path(), "--json", environment={
+            "LC_ALL": "tr_TR.UTF-8", "TZ": "Asia/Tokyo", "PYTHONHASHSEED": "7"}))
+    finally:
+        os.umask(was)
+    assert tree(other / "out") == first
+
+
+def test_times_that_are_asked_for(place):
+    made(update(place, "--json", environment={"SOURCE_DATE_EPOCH": "86400"}))
+    assert {path.stat().st_mtime for path in (place / "out").rglob("*")} == {86400}
+
+
+def archived(place: Path, *members: tuple, form="gz") -> Path:
+    """Members are names and contents; a third word is another kind than a file."""
+    archive = place / f"rules.tar.{form}"
+    with tarfile.open(archive, f"w:{form}") as tar:
+        for name, content, *kind in members:
+            info = tarfile.TarInfo(name)
+            info.size, info.linkname = len(content), "/etc/passwd"
+            info.type = kind[0] if kind else tarfile.REGTYPE
+            tar.addfile(info, io.BytesIO(content))
+    return archive
+
+
+@pytest.mark.parametrize("form", ["file", "archive", "archive with a directory",
+                                  "sources", "archive of sources"])
+def test_forms_of_rules(place, form):
+    text = (place / "rules/tzdata.zi").read_bytes()
+    sources = [("africa", text), ("version", f"{NAMES.update}\n".encode()),
+               ("zone.tab", b"#\n"), ("Makefile", b"all:\n\tfalse\n"),
+               *((name, b"# nothing\n") for name in
+                 "antarctica asia australasia europe northamerica southamerica "
+                 "etcetera factory backward".split())]
+    if form == "file":
+        rules = place / "rules/tzdata.zi"
+    elif form.startswith("archive"):
+        rules = archived(place, *(
+            sources if form.endswith("sources") else
+            [("tzdb/tzdata.zi" if form.endswith("directory") else "tzdata.zi", text)]))
+    else:
+        rules = place / "sources"
+        rules.mkdir()
+        for name, content in sources:
+            (rules / name).write_bytes(content)
+    facts = made(update(place, "--json", rules=rules))
+    assert facts["changed"] == LISBON
+    table = Path(facts["directory"], "zoneinfo/zone.tab").exists()
+    assert table == form.endswith("sources")
+
+
+def test_another_byte_order(place):
+    other_order(*releases.RESOURCES)(place)
+    refused(update(place), "the byte order 'b', and the system's schema is "
+                           f"{NAMES.icu}; take the files for 'l'")
+    schema = f"{NAMES.icu[:-1]}b"
+    (place / "system/icu/icutzformat.txt").write_text(schema)
+    facts = made(update(place, "--json"))
+    pack = Path(facts["directory"], f"icutz/icutz{schema}.dat").read_bytes()
+    assert pack[8] == 1  # big-endian
+    assert pack[12:16] == b"CmnD"
+
+
+@pytest.mark.parametrize("revision", ["0.0", "1", "1.0", "1.9",
+                                      "2147483647.2147483647"])
+def test_revisions(place, revision):
+    """The system's own revision is 1.0."""
+    facts = made(update(place, "--json", revision=revision))
+    assert facts["version"] == f"{NAMES.update}.{revision}"
+    shutil.rmtree(facts["directory"])
+    have_system(place, NAMES.update)
+    done = update(place, "--json", revision=revision)
+    if revision in ("0.0", "1", "1.0"):
+        refused(done, "is not newer than the system's")
+    else:
+        assert made(done)["changed"] == []
+
+
+# --- Which zones differ -----------------------------------------------------------
+
+
+def offsets(root: Path, name: str) -> list:
+    with open(root / name, "rb") as file:
+        zone = zoneinfo.ZoneInfo.from_file(file)
+    return [datetime(2025 + month // 12, month % 12 + 1, day, tzinfo=timezone.utc)
+            .astimezone(zone).utcoffset() for month in range(8, 60) for day in (2, 17)]
+
+
+def test_zones_that_differ(place):
+    """Compared with what another reader of zone files sees twice a month."""
+    facts = made(update(place, "--json"))
+    old, new = place / "system/zoneinfo.default", Path(facts["directory"], "zoneinfo")
+    zones = [str(path.relative_to(old)) for path in old.rglob("*")
+             if path.is_file() and path.read_bytes()[:4] == b"TZif"]
+    assert len(zones) > 500
+    assert [zone for zone in sorted(zones)
+            if offsets(old, zone) != offsets(new, zone)] == facts["changed"]
+
+
+def test_zones_come_and_go(place):
+    edit("rules/tzdata.zi", "\nL Europe/Lisbon Portugal\n",
+         "\nL Europe/Lisbon Lusitania\n")(place)
+    facts = made(update(place, "--json"))
+    assert facts["changed"] == ["Europe/Lisbon"]
+    assert facts["added"] == ["Lusitania"]
+    assert facts["removed"] == ["Portugal"]
+
+
+def test_a_zone_like_an_option(place):
+    append("Z -v 0 - X\n")(place)
+    compiled = place / "system/zoneinfo.default"
+    shutil.copy(compiled / "Europe/Paris", compiled / "-v")
+    assert made(update(place, "--json"))["changed"] == ["-v", *LISBON]
+
+
+def test_a_past_change(place):
+    """Cairo's local mean time differs, and nothing after 1900."""
+    edit("rules/tzdata.zi", "\nZ Africa/Cairo 2:5:9 - LMT",
+         "\nZ Africa/Cairo 2:5:8 - LMT")(place)
+    facts = made(update(place, "--json"))
+    assert facts["changed"] == LISBON
+    shutil.rmtree(facts["directory"])
+    assert made(update(place, "--json", since="1899-01-01"))["changed"][:2] == [
+        "Africa/Cairo", "Egypt"]
+
+
+def test_a_system_compiled_otherwise(place):
+    """As fat files, with directories of other clocks beside them."""
+    compiled = place / "system/zoneinfo.default"
+    for folder in (compiled, compiled / "right", compiled / "posix"):
+        releases.output("/usr/sbin/zic", "-b", "fat", "-d", folder,
+                        releases.TARGET / NAMES.system / "tzdata.zi")
+    shutil.copy(compiled / "America/New_York", compiled / "posixrules")
+    facts = made(update(place, "--json"))
+    assert (facts["changed"], facts["removed"]) == (LISBON, [])
+
+
+# --- The boot program takes it ----------------------------------------------------
+
+
+def device_with(place: Path, version: str) -> Device:
+    """A device as the documents tell installers to make it, quiet before that."""
+    device = Device()
+    for source, target in ((place / "system/zoneinfo.default", SYSTEM_ZONEINFO),
+                           (place / "system/icu", SYSTEM_ICU),
+                           (place / "out" / version, update_path(version))):
+        device.put(target, namespace.description_of(source))
+    device.point_links_at(None)
+    device.choose_zone("Europe/Lisbon")
+    device.announce(version)
+    return device
+
+
+def test_the_boot_program_takes_it(place):
+    version = made(update(place, "--json"))["version"]
+    namespace.build(device_with(place, version))
+    assert boot.boot() == ("exit 0", "")
+    assert os.readlink(ZONEINFO) == f"{DOWNLOADS}{version}/zoneinfo"
+    assert os.readlink(ICUTZ) == f"{DOWNLOADS}{version}/icutz"
+    assert Path(RECORD).read_text() == f"{NAMES.system}.1.0_{version}"
+
+
+def test_the_boot_program_refuses_another_schema(place):
+    (place / "system/icu/icutzformat.txt").write_text(NAMES.other_icu)
+    version = made(update(place, "--json"))["version"]
+    (place / "system/icu/icutzformat.txt").write_text(NAMES.icu)
+    namespace.build(device_with(place, version))
+    assert "not compatible or older version" in boot.boot().log
+    assert os.readlink(ZONEINFO) == SYSTEM_ZONEINFO
+
+
+def test_versions():
+    """Texts are versions, and newer than others, as in the model of a boot."""
+    numbers = ["", "0", "1", "9", "10", "010", "2147483647", "2147483648"]
+    texts = [year + letters + "".join(f".{number}" for number in more)
+             for year in numbers for letters in ("", "a", "az", "b", "A", "a b")
+             for count in range(4)
+             for more in itertools.islice(itertools.product(numbers, repeat=count), 9)]
+    texts += ["2024a.1.0\n", " 2024a", "2024a.", "2024a..1", "٢024a", "2024ä", "-1a"]
+    reader = model.Boot(model.Kernel(Device()))
+    read = {}
+    for text in texts:
+        try:
+            expected = reader.parse_version(text)
+        except model.Thrown:
+            expected = model.UNSET_VERSION
+        try:
+            found = make_data.version(text)
+        except make_data.Refused:
+            found = model.UNSET_VERSION
+        assert found == expected, text
+        if found != model.UNSET_VERSION:
+            read[text] = found
+    assert len(read) > 50
+
+
+# --- What is refused --------------------------------------------------------------
+
+
+def edit(part: str, old: str, new: str):
+    def change(place):
+        path = place / part
+        text = path.read_text()
+        assert text.count(old) == 1
+        path.write_text(text.replace(old, new))
+    return change
+
+
+def write(part: str, content: bytes):
+    return lambda place: (place / part).write_bytes(content)
+
+
+def append(text: str):
+    return lambda place: (place / "rules/tzdata.zi").open("a").write(text)
+
+
+def instead(part: str, make):
+    """Something else in place of a file."""
+    def change(place):
+        (place / part).unlink()
+        make(place / part)
+    return change
+
+
+def damaged(part: str, at: int, content: bytes):
+    def change(place):
+        raw = bytearray((place / part).read_bytes())
+        raw[at:at + len(content)] = content
+        (place / part).write_bytes(raw)
+    return change
+
+
+def other_order(*parts: str):
+    return lambda place: [
+        releases.output("/usr/sbin/icupkg", "-tb", place / "icu" / part)
+        for part in parts]
+
+
+def other_release(place):
+    shutil.copy(releases.TARGET / NAMES.refused / "icu/zoneinfo64.res", place / "icu")
+
+
+def no_release_in_icu(place):
+    text = releases.icu_text(place / "icu", NAMES.update, None)
+    source = place / "zoneinfo64.txt"
+    source.write_text(text.replace("TZVersion", "NoVersion"))
+    releases.output("genrb", "-q", "-d", place / "icu", source)
+
+
+def sparse(path: Path):
+    with open(path, "wb") as file:
+        file.truncate((16 << 20) + 1)
+
+
+BIG = "icu/zoneinfo64.res"
+REFUSALS = {
+    "other releases": (other_release, "take both from one release"),
+    "older than the system": (lambda place: have_system(place, NAMES.upgrade),
+                              "is not newer than the system's"),
+    "byte order": (other_order(*releases.RESOURCES), "the byte order 'b'"),
+    "two byte orders": (other_order("metaZones.res"), "differ in byte order"),
+    "character set": (damaged(BIG, 9, b"\1"), "differ in byte order"),
+    "labelled schema": (write("icu/icutzformat.txt", b"44l\n"), "has the schema 44l"),
+    "long label": (write("icu/icutzformat.txt", b"4" * 99),
+                   f"has the schema {'4' * 40}, and"),
+    "system's long schema": (write("system/icu/icutzformat.txt", b"4" * 99 + b"l"),
+                             "is not an ICU schema"),
+    "format of resources": (damaged("system/icu/metaZones.res", 16, b"\1"),
+                            "another format of resource files"),
+    "system's schema": (write("system/icu/icutzformat.txt", b"\x1b[2J l\n"),
+                        "is not an ICU schema"),
+    "no system's schema": (write("system/icu/icutzformat.txt", b""),
+                           "is not an ICU schema"),
+    "system's release": (write("system/zoneinfo.default/+VERSION", b"2024a.1.0\n"),
+                         "is not a release"),
+    "no system's release": (lambda place: (
+        place / "system/zoneinfo.default/+VERSION").unlink(), "No such file"),
+    "no version line": (edit("rules/tzdata.zi", "# version ", "# vers "),
+                        "has no '# version'"),
+    "version line": (edit("rules/tzdata.zi", "# version ", "# version x"),
+                     "is not a release"),
+    "unknown": (edit("rules/tzdata.zi", "# version 20", "# version unknown-20"),
+                "is not a release"),
+    "long release": (edit("rules/tzdata.zi", "# version 20", "# version 20" + "2" * 99),
+                     f"says '20{'2' * 38}', which is not a release"),
+    "large year": (edit("rules/tzdata.zi", "# version 20", "# version 999999999920"),
+                   "is not a version"),
+    "empty rules": (write("rules/tzdata.zi", b""), "has no '# version'"),
+    "no zones": (lambda place: (place / "rules/tzdata.zi").write_text(
+        f"# version {NAMES.update}\n"), "have no zone"),
+    "syntax": (append("Q what\n"), "zic: \"tzdata.zi\", line "),
+    "zone twice": (append("Z Europe/Lisbon 0 - X\n"), "zic: "),
+    "zone outside": (append("Z ../../evil 0 - X\n"), "'..'"),
+    "absolute zone": (append("Z /tmp/evil 0 - X\n"), "begins with '/'"),
+    "zone below a zone": (append("Z Europe/Lisbon/Deep 0 - X\n"), "zic: "),
+    "zone +VERSION": (append("Z +VERSION 0 - X\n"), "'+VERSION', which cannot be used"),
+    "zone tzdata.zi": (append("Z tzdata.zi 0 - X\n"), "'tzdata.zi', which cannot be"),
+    "zone with an escape": (append("Z Good/Zo\x1b[2Jne 0 - X\n"), "cannot be used"),
+    "link to nothing": (append("L Missing/Zone Alias\n"), "a link without its target"),
+    "rules FIFO": (instead("rules/tzdata.zi", os.mkfifo), "holds neither"),
+    "huge rules": (instead("rules/tzdata.zi", sparse), "more than 16777216"),
+    "no rules": (lambda place: shutil.rmtree(place / "rules"), "No such file"),
+    "no resource": (lambda place: (place / BIG).unlink(), "No such file"),
+    "empty resource": (write(BIG, b""), "is not an ICU resource file"),
+    "text for a resource": (write(BIG, b"zoneinfo64{}\n" * 9), "is not an ICU"),
+    "cut resource": (lambda place: os.truncate(place / BIG, 5000), "is damaged"),
+    "resource FIFO": (instead(BIG, os.mkfifo), "is not a regular file"),
+    "resource directory": (instead(BIG, os.mkdir), "is not a regular file"),
+    "huge resource": (instead(BIG, sparse), "more than 16777216"),
+    "link to itself": (instead(BIG, lambda path: path.symlink_to(path)), "Too many"),
+    "device": (instead(BIG, lambda path: path.symlink_to("/dev/zero")),
+               "is not a regular file"),
+    "no TZVersion": (no_release_in_icu, "has no TZVersion"),
+    "out has it already": (lambda place: (place / "out" / VERSION).mkdir(),
+                           "is there already"),
+    "no out": (lambda place: (place / "out").rmdir(), "make it first"),
+    "out is a file": (lambda place: ((place / "out").rmdir(), (
+        place / "out").write_text("")), "make it first"),
+    "read-only out": (lambda place: (place / "out").chmod(0o555),
+                      "Permission denied"),
+    "secret rules": (lambda place: (place / "rules/tzdata.zi").chmod(0),
+                     "Permission denied"),
+}
+
+
+@pytest.mark.parametrize("kind", REFUSALS)
+def test_refusals(place, kind):
+    change, words = REFUSALS[kind]
+    change(place)
+    before = set(place.rglob("*"))
+    temporary = set(os.listdir("/tmp"))
+    done = update(place)
+    if (place / "out").is_dir():
+        (place / "out").chmod(0o755)
+    refused(done, words)
+    assert set(place.rglob("*")) == before
+    assert set(os.listdir("/tmp")) == temporary
+
+
+@pytest.mark.parametrize("kind", [kind for kind in REFUSALS if not re.search(
+    "system|out|format of resources", kind)])
+def test_refusals_of_a_system(place, kind):
+    change, words = REFUSALS[kind]
+    change(place)
+    refused(system(place), words)
+    assert os.listdir(place / "out") == []
+
+
+def test_what_is_there_stays(place):
+    made(update(place, "--json"))
+    before = tree(place)
+    refused(update(place), "is there already; remove it, or choose another")
+    assert tree(place) == before
+
+
+@pytest.mark.parametrize("words", [
+    ["--revision=1.0.0"], ["--revision=../x"], ["--revision=-1"], ["--since=soon"],
+    ["--nonsense"], ["more"], ["--rules"]])
+def test_bad_use(place, words):
+    done = update(place, *words)
+    refused(done, "; see --help", status=2)
+    assert os.listdir(place / "out") == []
+
+
+@pytest.mark.parametrize("how, words", [
+    ({"revision": "2147483648.0"}, "is not a version"),
+    ({"revision": "1" * 5000}, "is not a version"),
+    ({"environment": {"SOURCE_DATE_EPOCH": "9" * 20}},
+     "SOURCE_DATE_EPOCH is too large"),
+    ({"rules": "a\n\x1b[2Jb"}, r"a\n\x1b[2Jb")])
+def test_what_no_machine_has(place, how, words):
+    refused(update(place, **how), words)
+    assert os.listdir(place / "out") == []
+
+
+@pytest.mark.parametrize("schema", ["", "72", "l", "72x", "44b", "../72l", "72l\n"])
+def test_bad_schemas(place, schema):
+    refused(system(place, schema=schema), "schema")
+
+
+def test_an_archive_that_leads_out(place):
+    """Only the content of known names is taken from it, never their place."""
+    text = (place / "rules/tzdata.zi").read_bytes()
+    archive = archived(place, ("../../../evil", b"x"), ("/tmp/evil", b"x"),
+                       ("../tzdata.zi", text))
+    facts = made(update(place, "--json", rules=archive))
+    assert facts["changed"] == LISBON
+    assert not Path("/tmp/evil").exists() and not (place / "tzdata.zi").exists()
+
+
+ARCHIVES = {
+    "twice": ([("tzdata.zi", b""), ("a/tzdata.zi", b"")], "holds tzdata.zi twice"),
+    "a link": ([("tzdata.zi", b"", tarfile.SYMTYPE)], "holds neither"),
+    "a directory": ([("tzdata.zi", b"", tarfile.DIRTYPE)], "holds neither"),
+    "nothing": ([("README", b"")], "holds neither"),
+    # Small, and much too large when they are read.
+    "a large member": ([("README", bytes(17 << 20))], "far too large"),
+    "many members": ([("README", bytes(10 << 20))] * 30, "far too large"),
+}
+
+
+@pytest.mark.parametrize("kind", ARCHIVES)
+def test_archives_that_are_refused(place, kind):
+    members, words = ARCHIVES[kind]
+    refused(update(place, rules=archived(place, *members)), words)
+    assert os.listdir(place / "out") == []
+
+
+DAMAGES = {
+    "cut": ("gz", lambda raw: raw[:2000]),
+    "no archive": ("gz", lambda raw: os.urandom(5000)),
+    # It stands behind all that is read.
+    "checksum": ("gz", lambda raw: raw[:-8] + bytes(4) + raw[-4:]),
+    "another kind": ("xz", lambda raw: raw[:2000] + bytes(9) + raw[2009:]),
+}
+
+
+@pytest.mark.parametrize("kind", DAMAGES)
+def test_archives_that_are_damaged(place, kind):
+    form, damage = DAMAGES[kind]
+    text = (place / "rules/tzdata.zi").read_bytes()
+    archive = archived(place, ("tzdata.zi", text), form=form)
+    archive.write_bytes(damage(archive.read_bytes()))
+    refused(update(place, rules=archive), "cannot be read as an archive")
+    assert os.listdir(place / "out") == []
+
+
+@pytest.mark.parametrize("output", ["/dev/full", None])
+def test_an_update_that_cannot_be_told(place, output):
+    """It is made all the same, and the line says so."""
+    command = shlex.join(make_update(place))
+    done = ran(["/bin/sh", "-c", f"{command} >{output or '&-'}"])
+    refused(done, "is made, but standard output fails")
+    assert os.listdir(place / "out") == [VERSION]
+
+
+@pytest.mark.parametrize("seed", range(20))
+def test_random_damage(place, seed):
+    """Whatever is damaged: an update, or one line and nothing."""
+    dice = random.Random(seed)
+    part = dice.choice([*(f"icu/{name}" for name in releases.RESOURCES),
+                        "rules/tzdata.zi", "system/zoneinfo.default/Europe/Lisbon",
+                        "system/icu/icutzformat.txt"])
+    raw = bytearray((place / part).read_bytes())
+    for _ in range(dice.choice([1, 10, 1000])):
+        raw[dice.randrange(len(raw))] = dice.randrange(256)
+    (place / part).write_bytes(raw)
+    done = update(place, "--json")
+    if done.returncode == 0:
+        assert json.loads(done.stdout)["version"] in os.listdir(place / "out")
+    else:
+        refused(done, "")
+        assert os.listdir(place / "out") == []
+
+
+# --- Tools that are missing, fail or hang -----------------------------------------
+
+
+@pytest.fixture
+def fake(tmp_path):
+    """fake(tool=script) tells an environment in which these come first."""
+    def environment(**scripts):
+        folder = tmp_path / "fakes"
+        folder.mkdir()
+        for name, script in scripts.items():
+            (folder / name).write_text(f"#!/bin/sh\n{script}\n")
+            (folder / name).chmod(0o755)
+        return {"PATH": f"{folder}:{os.environ['PATH']}"}
+    return environment
+
+
+def test_missing_tools(place):
+    refused(update(place, environment={"PATH": "/nowhere"}),
+            "missing: zdump derb; install the Debian packages", status=77)
+
+
+@pytest.mark.parametrize("tool", ["zic", "zdump", "derb", "icupkg"])
+@pytest.mark.parametrize("script", ["echo a\nb >&2; exit 3", "kill -SEGV $$",
+                                    "exec yes", "exec yes >&2"])
+def test_failing_tools(place, fake, tool, script):
+    refused(update(place, environment=fake(**{tool: script})), f"{tool}: ")
+    assert os.listdir(place / "out") == []
+
+
+def test_a_file_that_cannot_be_written(place):
+    """As on a full disk, in the middle of the tree."""
+    (place / "rules/leapseconds").write_bytes(bytes(3 << 20))
+    refused(ran(["/usr/bin/prlimit", "--fsize=2000000", *make_update(place)]),
+            "File too large; nothing was made")
+    assert os.listdir(place / "out") == []
+
+
+@pytest.mark.parametrize("number", [signal.SIGTERM, signal.SIGINT, signal.SIGHUP])
+def test_an_interrupted_program_leaves_nothing(place, fake, number):
+    hung = subprocess.Popen(
+        make_update(place), stderr=subprocess.PIPE,
+        env={**os.environ, **fake(zdump=f"touch {place}/begun; exec sleep 60")})
+    for _ in range(400):
+        if (place / "begun").exists():
+            break
+        time.sleep(0.05)
+    else:
+        pytest.fail("never began")
+    assert any((place / "out").iterdir())
+    hung.send_signal(number)
+    assert hung.communicate(timeout=30) == (None, b"")
+    assert hung.returncode == 128 + number
+    assert os.listdir(place / "out") == []

@@ -1,0 +1,313 @@
+# SPDX-License-Identifier: BSD-2-Clause
+"""The Debian package of each release preset, and the boot unit in it, as far as that
+can be judged without a boot.
+
+The packages stay in build/packaging. Each is built once more elsewhere, from what git
+knows of this tree, uncommitted changes too.
+"""
+
+import fcntl
+import gzip
+import os
+import re
+import shutil
+import subprocess
+import tarfile
+import warnings
+from datetime import datetime
+from io import BytesIO
+from pathlib import Path
+from typing import NamedTuple
+
+import pytest
+
+from lab.carriers import building
+from lab.words.places import BUILD, PROJECT
+
+WORK = BUILD / "packaging"
+ARCHITECTURES = {"release": "amd64", "arm64-release": "arm64"}  # by preset
+
+CONTENT = dict(reversed(line.split(maxsplit=1)) for line in """
+    755 /usr/bin/marlin-status
+    644 /usr/lib/systemd/system/marlin.service
+    777 /usr/lib/systemd/system/sysinit.target.wants/marlin.service -> ../marlin.service
+    644 /usr/lib/tmpfiles.d/marlin.conf
+    755 /usr/libexec/marlin
+    755 /usr/libexec/marlin-mend
+    755 /usr/sbin/marlin-install
+    644 /usr/share/doc/marlin/README.md
+    644 /usr/share/doc/marlin/SECURITY.md
+    644 /usr/share/doc/marlin/changelog.gz
+    644 /usr/share/doc/marlin/copyright
+    644 /usr/share/doc/marlin/docs/architecture.md
+    644 /usr/share/doc/marlin/docs/decisions.md
+    644 /usr/share/doc/marlin/docs/demo.svg
+    644 /usr/share/doc/marlin/docs/growth.svg
+    644 /usr/share/doc/marlin/docs/integration.md
+    644 /usr/share/doc/marlin/docs/proofs.md
+    644 /usr/share/doc/marlin/docs/readers.md
+    644 /usr/share/doc/marlin/examples/apparmor
+    755 /usr/share/doc/marlin/examples/init-script
+    644 /usr/share/doc/marlin/examples/inittab
+    644 /usr/share/doc/marlin/examples/lean.conf
+    644 /usr/share/doc/marlin/examples/marlin.service.d/mend.conf
+    644 /usr/share/lintian/overrides/marlin
+    644 /usr/share/man/man5/marlin-layout.5.gz
+    644 /usr/share/man/man8/marlin-status.8.gz
+    644 /usr/share/man/man8/marlin-install.8.gz
+    644 /usr/share/man/man8/marlin-mend.8.gz
+    644 /usr/share/man/man8/marlin.8.gz
+""".strip().splitlines())
+
+
+def run(*command, **options) -> str:
+    """A command's output; the test fails with it if the command does."""
+    done = subprocess.run([str(word) for word in command], text=True,
+                          stdin=subprocess.DEVNULL, stdout=subprocess.PIPE,
+                          stderr=subprocess.STDOUT, **options)
+    if done.returncode:
+        pytest.fail(f"{done.stdout}\nstatus {done.returncode}: {done.args}", False)
+    return done.stdout
+
+
+def in_user_namespace(number: int, *command, **options) -> str:
+    """Runs a command as this user number. As 0 it may own files, and changes nothing of
+    the machine; as another it has the rights of whoever runs the test."""
+    return run("bwrap", "--unshare-user", "--uid", number, "--gid", number,
+               "--dev-bind", "/", "/", *command, **options)
+
+
+def fresh(place: Path) -> Path:
+    shutil.rmtree(place, ignore_errors=True)
+    place.mkdir(parents=True)
+    return place
+
+
+def found(pattern: str, text: str) -> str:
+    """What the pattern's group matches."""
+    return re.search(pattern, text, re.M)[1]
+
+
+# --- Building ------------------------------------------------------------------------
+
+
+class Package(NamedTuple):
+    preset: str
+    file: Path
+    tree: Path  # in which it was built once more
+    again: Path
+    work: Path
+    content: Path  # unpacked
+
+
+def pytest_generate_tests(metafunc):
+    presets = metafunc.config.getoption("preset") or list(ARCHITECTURES)
+    if "package" in metafunc.fixturenames:
+        metafunc.parametrize("package", presets, indirect=True, scope="module")
+
+
+@pytest.fixture(scope="module")
+def package(request) -> Package:
+    preset, work = request.param, WORK / request.param
+    work.mkdir(parents=True, exist_ok=True)
+    with open(work / "lock", "w", encoding="ascii") as lock:
+        fcntl.flock(lock, fcntl.LOCK_EX)
+        os.environ.pop("SOURCE_DATE_EPOCH", None)
+        file = building.package(preset, work)
+        # In another place, at another time, by somebody with other habits; and not by
+        # a cache, which would give the same objects out twice.
+        tree = work / "another/place"
+        again = built(tree, preset, umask=0o077, TZ="Pacific/Apia", LC_ALL="C.UTF-8",
+                      CCACHE_DISABLE="1")
+        run("dpkg-deb", "-x", file, fresh(work / "content"))
+        shutil.copy(file, WORK)
+        yield Package(preset, file, tree, again, work, work / "content")
+
+
+def built(tree: Path, preset: str, umask=-1, **environment) -> Path:
+    """The package, built in a copy of this tree."""
+    run("bash", "-euo", "pipefail", "-c", """
+        (cd "$2" && git ls-files -z | tar -c --null -T -) | tar -x --no-same-permissions
+        cmake --preset "$1"
+        cmake --build --preset "$1"
+        cpack --config "build/$1/CPackConfig.cmake" -B "build/$1"
+        """, "-", preset, PROJECT, cwd=fresh(tree), umask=umask,
+        env=os.environ | environment)
+    file, = (tree / "build" / preset).glob("*.deb")
+    return file
+
+
+# --- The package ---------------------------------------------------------------------
+
+
+def test_two_builds_in_two_directories_give_the_same_bytes(package, count):
+    run("cmp", package.file, package.again)
+    count(f"bytes of {package.file.name}", package.file.stat().st_size)
+
+
+def test_lintian_finds_no_error(package):
+    """It speaks up when root runs it. What it says short of an error is shown too, so
+    that it does not go unread."""
+    for line in in_user_namespace(1000, "lintian", "-q", "--fail-on", "error",
+                                  "--tag-display-limit", "0",
+                                  package.file).splitlines():
+        warnings.warn(line)
+
+
+def test_it_holds_what_it_should(package):
+    """And all of it is root's, for others to read, of the day of the release."""
+    day = found(r"^## \S+ - ([\d-]+)(?:, unreleased)?$",
+                (PROJECT / "CHANGELOG.md").read_text())
+    time = datetime.fromisoformat(f"{day}T00:00:00+00:00").timestamp()
+    packed = subprocess.run(["dpkg-deb", "--fsys-tarfile", package.file], check=True,
+                            stdout=subprocess.PIPE).stdout
+    entries = list(tarfile.open(fileobj=BytesIO(packed)))
+    assert {entry.name[1:] + (entry.issym() and f" -> {entry.linkname}" or ""):
+            f"{entry.mode:o}" for entry in entries if not entry.isdir()} == CONTENT
+    assert {entry.mode for entry in entries if entry.isdir()} == {0o755}
+    assert {(entry.uname, entry.gname, entry.uid, entry.gid, entry.mtime)
+            for entry in entries} == {("root", "root", 0, 0, time)}
+
+
+def test_it_is_for_its_architecture(package):
+    architecture = run("dpkg-deb", "-f", package.file, "Architecture").strip()
+    assert architecture == ARCHITECTURES[package.preset]
+
+
+def test_it_has_one_version_everywhere(package):
+    share, changelog = package.content / "usr/share", package.work / "changelog"
+    changelog.write_bytes(gzip.decompress(
+        (share / "doc/marlin/changelog.gz").read_bytes()))
+    pages = sorted(share.glob("man/*/*.gz"))
+    assert len(pages) == 5
+    versions = [
+        found(r"^## (\S+) - ", (PROJECT / "CHANGELOG.md").read_text()),
+        found(r"^project\([^)]*VERSION ([\d.]+)",
+              (PROJECT / "CMakeLists.txt").read_text()),
+        run("dpkg-deb", "-f", package.file, "Version").strip(),
+        run("dpkg-parsechangelog", "-l", changelog, "-S", "Version").strip(),
+        *(found(r"^\.Os marlin (.*)$", gzip.decompress(page.read_bytes()).decode())
+          for page in pages)]
+    assert len(set(versions)) == 1, versions
+
+
+@pytest.mark.parametrize("name", ["libexec/marlin", "libexec/marlin-mend",
+                                  "sbin/marlin-install", "bin/marlin-status"])
+def test_its_programs_are_static_and_hardened(package, name):
+    """Nothing that can be written to is executed, or the other way around; what has
+    been relocated cannot be written to any more."""
+    program = package.content / "usr" / name
+    headers = run("readelf", "-lW", program)
+    assert "INTERP" not in headers and "GNU_RELRO" in headers
+    assert re.search(r"GNU_STACK .* RW +0x", headers) and " RWE " not in headers
+    # Constants are in a segment of their own, not in the executable one.
+    flags = re.findall(r"^ +LOAD .* (R  |R E|RW ) +0x", headers, re.M)
+    sections = re.findall(r"^ +\d\d +(.*)$", headers, re.M)[:len(flags)]
+    assert not [names for names, flag in zip(sections, flags)
+                if flag == "R E" and ".rodata" in names.split()]
+    # docs/decisions.md says that no branch protection is in force.
+    assert not re.search("IBT|SHSTK|BTI|PAC", run("readelf", "-nW", program))
+
+
+def test_it_is_installed_and_removed_without_a_trace(package):
+    root = fresh(package.work / "root")
+    for directory in ("lib/dpkg/info", "lib/dpkg/updates", "db/timezone/tz"):
+        (root / "var" / directory).mkdir(parents=True)
+    (root / "var/lib/dpkg/status").touch()
+    (root / "var/db/timezone/TZVersionDiffRecord").write_text("kept\n")
+
+    def dpkg(*arguments):
+        return in_user_namespace(
+            0, "dpkg", f"--root={root}", "--force-script-chrootless",
+            "--force-architecture", "--log=/dev/null", *arguments)
+
+    def left():
+        return {f"/{path.relative_to(root)}": path.read_text(errors="replace")
+                if path.is_file() else path.lstat().st_mode
+                for path in root.rglob("*") if "var/lib/dpkg" not in str(path)}
+
+    before = left()
+    dpkg("--install", package.file)
+    assert "Status: install ok installed" in dpkg("--status", "marlin")
+    installed = left().keys() - before.keys()
+    assert {path for path in installed if not Path(f"{root}{path}").is_dir()} == {
+        name.split()[0] for name in CONTENT}
+    assert not [path for path in installed
+                if Path(f"{root}{path}").stat().st_mode & 0o022]
+    dpkg("--purge", "marlin")
+    assert left() == before
+
+
+def test_cmake_installs_it_below_any_prefix(package):
+    stage = fresh(package.work / "stage")
+    build = package.tree / "build" / package.preset
+    run("cmake", build, "-DCMAKE_INSTALL_PREFIX=/opt/marlin")
+    run("cmake", "--install", build, env={**os.environ, "DESTDIR": str(stage)})
+    prefix = stage / "opt/marlin"
+    assert os.access(prefix / "libexec/marlin", os.X_OK)
+    assert "\nExecStart=/opt/marlin/libexec/marlin\n" in (
+        prefix / "lib/systemd/system/marlin.service").read_text()
+    assert (prefix / "share/doc/marlin/LICENSE").is_file()
+
+
+# --- What starts it ------------------------------------------------------------------
+
+
+def test_tmpfiles_make_the_two_directories(package):
+    root = fresh(package.work / "tmpfiles")
+    (root / "etc").mkdir()
+    (root / "etc/passwd").write_text("root:x:0:0::/:\n")
+    (root / "etc/group").write_text("root:x:0:\n")
+    shutil.copytree(package.content / "usr", root / "usr", symlinks=True)
+    in_user_namespace(0, "systemd-tmpfiles", f"--root={root}", "--create",
+                      "marlin.conf")
+    directories = root / "var/db/timezone", root / "var/db/timezone/tz"
+    for directory in directories:
+        assert directory.stat().st_mode == 0o40755
+    # What somebody chose stays.
+    for directory in directories:
+        directory.chmod(0o2770)
+    in_user_namespace(0, "systemd-tmpfiles", f"--root={root}", "--create",
+                      "marlin.conf")
+    for directory in directories:
+        assert directory.stat().st_mode == 0o42770
+
+
+@pytest.fixture(scope="module")
+def units(package) -> str:
+    """The option for a root with the package in it and the units that it leans on."""
+    root = fresh(package.work / "units")
+    shutil.copytree(package.content / "usr", root / "usr", symlinks=True)
+    for name in ("sysinit", "shutdown", "local-fs", "basic"):
+        shutil.copy(f"/lib/systemd/system/{name}.target",
+                    root / "usr/lib/systemd/system")
+    return f"--root={root}"
+
+
+def test_systemd_accepts_the_unit(units):
+    assert run("systemd-analyze", "verify", "--man=no", units, "marlin.service") == ""
+
+
+def test_systemd_accepts_the_mend(package, units):
+    """The drop-in, where an integrator puts it. It may fail, so systemd does not look
+    for its program."""
+    place = Path(units.removeprefix("--root=")) / "etc/systemd/system/marlin.service.d"
+    example = package.content / "usr/share/doc/marlin/examples/marlin.service.d"
+    shutil.copytree(example, place)
+    verify = "systemd-analyze", "verify", "--man=no", units, "marlin.service"
+    assert run(*verify) == ""
+    drop_in = place / "mend.conf"
+    text = drop_in.read_text()
+    program = found(r"^ExecStartPre=-/(.*)$", text)
+    assert os.access(package.content / program, os.X_OK)
+    drop_in.write_text(text.replace("ExecStartPre", "ExecBefore"))  # is it read?
+    assert "ExecBefore" in run(*verify)
+    shutil.rmtree(place)
+
+
+def test_systemd_rates_its_exposure_at_most_1(units, count):
+    rating = run("systemd-analyze", "security", "--offline=true", units, "--no-pager",
+                 "marlin.service")
+    level = float(found(r"exposure level for marlin\.service: ([\d.]+) ", rating))
+    assert level <= 1.0, rating
+    count("tenths of exposure, as systemd rates the boot unit", round(10 * level))

@@ -1,0 +1,174 @@
+# SPDX-License-Identifier: BSD-2-Clause
+"""usage: scripts/sanitize [--sanitizers | --memcheck]
+
+Runs every test twice, the program that the tests boot included: built with
+AddressSanitizer, LeakSanitizer and UndefinedBehaviorSanitizer, and under valgrind's
+memcheck. Before that, each has to find a leak that was made on purpose. With an option
+only the one or the other. With the sanitizers marlin-status also tells of trees, and
+of random devices that are then booted. Left out is what the tool itself makes
+impossible: limits of memory, and under valgrind a limit of file sizes and a test that
+would take an hour.
+
+Exit status: 0 without a finding, 1 with one or when a test fails, 2 for bad use.
+Reports are left in build/asan/findings and build/memcheck/findings.
+"""
+
+import os
+import re
+import shutil
+from collections.abc import Callable
+from dataclasses import dataclass
+from pathlib import Path
+
+from lab.carriers.building import build, locked, need, quietly, show_end, trials
+from lab.words.command import Options, say, stop
+from lab.words.places import BUILD, PROJECT, shown
+
+LEAK = """int main() {
+  char* volatile lost = new char[9];
+  lost = nullptr;
+}
+"""
+
+
+def sanitized(reports: str):
+    options = (
+        "detect_leaks=1:detect_stack_use_after_return=1:check_initialization_order=1:"
+        "strict_init_order=1:strict_string_checks=1:print_stacktrace=1:"
+        f"log_path='{reports}'")
+    return {"ASAN_OPTIONS": options, "UBSAN_OPTIONS": options}, []
+
+
+def memchecked(reports: str):
+    # Traced are the test programs and what they boot, not the machine's tools.
+    # "Possibly lost" does not count: so is every exception in flight when a boot ends
+    # abnormally, because the library holds it by its middle. A test's own operator new
+    # stays in force.
+    return {}, [*"""valgrind --quiet --leak-check=full --error-exitcode=99
+        --soname-synonyms=somalloc=nouserintercepts --show-leak-kinds=definite
+        --errors-for-leak-kinds=definite --trace-children=yes
+        --trace-children-skip=/usr/*,/bin/*""".split(),
+                f"--log-file={reports.replace('%', '%%')}.%p"]
+
+
+@dataclass
+class Tool:
+    """One build of the tests, run with one tool, whose reports are files."""
+
+    folder: Path
+    preset: str
+    option: str  # of the compiler, for a program that leaks
+    tests: str
+    watched: Callable[[str], tuple[dict[str, str], list[str]]]  # environment, prefix
+
+    def __post_init__(self):
+        self.findings, self.log = self.folder / "findings", self.folder / "sanitize.log"
+
+    def run(self) -> int:
+        """Returns how many tests have passed, without a finding."""
+        with locked(self.folder):
+            shutil.rmtree(self.findings, ignore_errors=True)
+            build(self.preset, folder=self.folder)
+            self.findings.mkdir()
+            self.find_a_leak()
+            tests = sum(map(self.passed, sorted(self.folder.glob("tests/*_test"))))
+            self.report()
+        return tests
+
+    def on_device(self, program: Path, *arguments: str) -> int:
+        """A program that is on a private device stays there."""
+        environment, prefix = self.watched(str(self.findings / program.name))
+        return quietly(
+            self.log, PROJECT / "scripts/private-device", "--writable", self.folder,
+            "--", *prefix, program, *arguments, check=False,
+            env={**os.environ, **environment})
+
+    def find_a_leak(self):
+        """A tool that says nothing is of use only if it would have said something."""
+        source, leak = self.folder / "leak.cpp", self.folder / "leak"
+        source.write_text(LEAK)
+        quietly(self.log, "g++", self.option, source, "-o", leak)
+        self.on_device(leak)
+        reports = list(self.findings.iterdir())
+        if not re.search("leak of 9 byte|9 bytes in 1 blocks are definitely lost",
+                         "".join(map(read, reports))):
+            stop(1, f"a leak made on purpose was not found in {shown(self.folder)}")
+        for report in reports:
+            report.unlink()
+
+    def passed(self, program: Path) -> int:
+        """Runs the tests of a program and tells how many there were."""
+        status = self.on_device(program, "--gtest_brief=1",
+                                f"--gtest_filter={self.tests}")
+        text = read(self.log)
+        passed = re.search(r"PASSED  \] (\d+) tests?\.$", text, re.MULTILINE)
+        if status or not passed:
+            show_end(self.log)
+            self.report()
+            stop(1, f"{program.name} fails")
+        print(f"{shown(program)}: {passed[1]} tests", flush=True)
+        # The one test that skips itself, for its limit of memory, is in that file.
+        skipped = set(re.findall(r"/([^/]*\.cpp):\d+: Skipped$", text, re.MULTILINE))
+        if skipped - {"untrusted_data_test.cpp"}:
+            stop(1, f"{program.name} skips tests")
+        return int(passed[1])
+
+    def report(self):
+        """Ends the program with what was found, if anything. Lines of the program
+        itself do not count: valgrind's log can get them when a test closes every
+        descriptor."""
+        found = [line for file in sorted(self.findings.iterdir())
+                 for line in read(file).splitlines()
+                 if re.search(r"^==\d+==|runtime error", line)]
+        if found:
+            say("\n".join(found[:200]))
+            stop(1, f"findings in {shown(self.findings)}")
+
+
+TOOLS = {
+    # A sanitizer makes calls of its own.
+    "sanitizers": Tool(BUILD / "asan", "asan", "-fsanitize=address",
+                       "-WholeListOfCalls.*", sanitized),
+    # valgrind itself exceeds limits of memory and of file sizes; and there is a number
+    # of texts that takes an hour.
+    "memcheck": Tool(
+        BUILD / "memcheck", "dev", "-g",
+        "-*OnAMillion*:*DoesNotFitIntoMemory*:*CannotBeWrittenWhole*:"
+        "WholeListOfCalls.*", memchecked),
+}
+
+
+def asked_about() -> int:
+    """What marlin-status says of trees and random devices, and the boots that follow:
+    a finding is a line too many. Returns how many tests have passed."""
+    folder = TOOLS["sanitizers"].folder
+    log = folder / "status.log"
+    with locked(folder):
+        quietly(log, *trials("sanitize", "--states", "200",
+                             "lab/proofs/status.py::test_a_tree",
+                             "lab/proofs/status.py::test_random_devices"),
+                env={**os.environ, "MARLIN": str(folder / "marlin")})
+    passed = re.search(r"^(\d+) passed", read(log), re.MULTILINE)
+    print(f"{shown(folder)}/tools/marlin-status: {passed[1]} tests", flush=True)
+    return int(passed[1])
+
+
+def read(file: Path) -> str:
+    return file.read_text(errors="replace")
+
+
+def main():
+    options = Options(__doc__)
+    one = options.add_mutually_exclusive_group()
+    for name in TOOLS:
+        one.add_argument(f"--{name}", action="store_const", const=[name], dest="names")
+    names = options.parse_args().names or list(TOOLS)
+    need("build", "private-device", "test", "pytest", "prove", "sanitize")
+    tests = sum(TOOLS[name].run() for name in names)
+    if "sanitizers" in names:
+        tests += asked_about()
+    print(f"sanitize: {tests} tests with {' '.join(names)}: no finding")
+
+
+if __name__ == "__main__":
+    main()
