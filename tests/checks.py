@@ -1,8 +1,9 @@
 # SPDX-License-Identifier: BSD-2-Clause
 """Checks of the texts that no compiler reads: the rules of the source, the deliberate
-oddities, the documents, the manual pages.
+oddities, the documents, the manual pages, the commits.
 
-usage: tests/checks.py [source_rules | deliberate | documents | manual_pages]...
+usage: tests/checks.py [source_rules | deliberate | documents | manual_pages |
+                        commits]...
 
 Without an argument: all. Exit status: 0 when everything holds, 1 when something does
 not, 2 for bad use.
@@ -10,6 +11,7 @@ not, 2 for bad use.
 
 import os
 import re
+import shutil
 import subprocess
 import sys
 from collections.abc import Iterator
@@ -178,8 +180,26 @@ def manual_pages() -> Iterator[str]:
         yield "mandoc is not installed (Debian package mandoc)"
 
 
+def commits() -> Iterator[str]:
+    """A subject can be read in a list, and the history is a line: since the day of this
+    rule, and where there is a history."""
+    if not Path(".git").exists() or not shutil.which("git"):
+        return
+    log = subprocess.run(
+        ["git", "-c", f"safe.directory={PROJECT}", "log",
+         "--since=2026-11-22T12:20:00Z", "--format=%h\t%p\t%s"],
+        capture_output=True, text=True)
+    yield from log.stderr.splitlines()
+    for commit, parents, subject in (line.split("\t", 2)
+                                     for line in log.stdout.splitlines()):
+        if len(subject) > 72:
+            yield f"{commit}: a subject of more than 72 characters"
+        if " " in parents:
+            yield f"{commit}: a merge; rebase in its place"
+
+
 CHECKS = {check.__name__: check
-          for check in (source_rules, deliberate, documents, manual_pages)}
+          for check in (source_rules, deliberate, documents, manual_pages, commits)}
 
 
 def main() -> int:
