@@ -62,6 +62,14 @@ def source_rules() -> Iterator[str]:
         for line in matching_lines(path, unqualified):
             yield f"{line}: must be fsutil::remove() or std::remove()"
 
+    floors = re.findall(r"^\| \[`(\w+)/`\]", Path("docs/proofs.md").read_text(), re.M)
+    yield from differences({path.parent.name for path in Path("lab").glob("*/*.py")},
+                           "lab/", set(floors), "docs/proofs.md")
+    for path in Path("lab").glob("*/**/*.py"):
+        for floor in re.findall(r"^ *from lab\.(\w+)", path.read_text(), re.M):
+            if floor not in floors[:floors.index(path.parts[1]) + 1]:
+                yield f"{path}: imports lab.{floor}, a later row of docs/proofs.md"
+
     for path in (Path(name) for name in ci.files("*") if name[0] != "."):
         is_source = (path.suffix in (".c", ".cmake", ".cpp", ".h", ".py", ".sh")
                      or path.name == "CMakeLists.txt" or os.access(path, os.X_OK))
