@@ -152,9 +152,12 @@ def manual_pages() -> Iterator[str]:
             yield f"marlin-status looks for a line that no boot prints: {text}"
     reasons = {" ".join(row) for row in re.findall(
         r'^    \{"(\w+)", "(\w+)", "(\w+)",', known, re.M)}
-    told, page = set(), Path("docs/marlin-status.8").read_text()
-    for name, rows in re.findall(r"^\.It Cm (\w+)\n(.*?)^\.El", page, re.M | re.S):
-        told |= {f"{name} {row}" for row in re.findall(r"^\.It (.*)", rows, re.M)}
+    page = Path("docs/marlin-status.8").read_text()
+    page = re.search(r"^\.Sh STEPS\n(.*?)^\.Sh ", page, re.M | re.S)[1]
+    told = {f"{name} {does} {reason}"
+            for name, rows in re.findall(r"^\.It Cm (\w+)\n([^.]*)", page, re.M)
+            for does, listed in re.findall(r"(\w+): ([\w, \n]+)", rows)
+            for reason in listed.replace(",", "").split()}
     yield from differences(reasons, "marlin-status", told, "its manual page")
 
     zones = re.findall(r'default_zone\[\] = "([^"]+)"', code)
