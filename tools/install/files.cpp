@@ -12,10 +12,6 @@
 
 #include "tools/install/failure.h"
 
-descriptor::~descriptor() {
-  if (number_ >= 0) ::close(number_);
-}
-
 struct stat status_of(int directory, const std::string& name,
                       const std::string& path) {
   struct stat status {};

@@ -9,26 +9,9 @@
 
 #include <memory>
 #include <string>
-#include <utility>
 #include <vector>
 
-// Owns a file descriptor.
-class descriptor {
- public:
-  explicit descriptor(int number = -1) : number_(number) {}
-  descriptor(descriptor&& other) noexcept
-      : number_(std::exchange(other.number_, -1)) {}
-  descriptor& operator=(descriptor&& other) noexcept {
-    std::swap(number_, other.number_);
-    return *this;
-  }
-  ~descriptor();
-  int number() const { return number_; }
-  int release() { return std::exchange(number_, -1); }
-
- private:
-  int number_;
-};
+#include "tools/descriptor.h"
 
 // lstat(2) of an entry; a missing one has the mode 0.
 struct stat status_of(int directory, const std::string& name,

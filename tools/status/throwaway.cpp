@@ -26,6 +26,7 @@
 #include <vector>
 
 #include "support/paths.h"
+#include "tools/descriptor.h"
 #include "tools/escaped.h"
 #include "tools/status/mounts.h"
 
@@ -44,33 +45,16 @@ void must(long result, const std::string& what) {
   if (result < 0) fail(what);
 }
 
-class descriptor {
- public:
-  explicit descriptor(int number) : number_(number) {}
-  ~descriptor() {
-    if (number_ >= 0) ::close(number_);
-  }
-  descriptor(const descriptor&) = delete;
-  descriptor& operator=(const descriptor&) = delete;
-  descriptor(descriptor&& other) noexcept : number_(other.number_) {
-    other.number_ = -1;
-  }
-  int get() const { return number_; }
-
- private:
-  int number_;
-};
-
 descriptor open_directory(const std::string& path) {
   descriptor opened(::open(path.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
-  must(opened.get(), escaped(path));
+  must(opened.number(), escaped(path));
   return opened;
 }
 
 void write_file(const char* path, const std::string& text) {
   const descriptor file(::open(path, O_WRONLY | O_CLOEXEC));
-  must(file.get(), path);
-  must(::write(file.get(), text.data(), text.size()), path);
+  must(file.number(), path);
+  must(::write(file.number(), text.data(), text.size()), path);
 }
 
 void map_to_root(const char* file, unsigned id) {
@@ -128,9 +112,9 @@ descriptor make_layer(const std::string& layer) {
   must(::chmod(upper.c_str(), status.st_mode & 07777), "chmod");
 
   const descriptor options(::fsopen("overlay", FSOPEN_CLOEXEC));
-  must(options.get(), no_overlay);
+  must(options.number(), no_overlay);
   const auto set = [&](const char* key, const char* value) {
-    must(::fsconfig(options.get(),
+    must(::fsconfig(options.number(),
                     value == nullptr ? FSCONFIG_SET_FLAG : FSCONFIG_SET_STRING,
                     key, value, 0),
          no_overlay);
@@ -140,10 +124,10 @@ descriptor make_layer(const std::string& layer) {
   set("workdir", work.c_str());
   // Ordinary users may not set the attributes of the other kind.
   set("userxattr", nullptr);
-  must(::fsconfig(options.get(), FSCONFIG_CMD_CREATE, nullptr, nullptr, 0),
+  must(::fsconfig(options.number(), FSCONFIG_CMD_CREATE, nullptr, nullptr, 0),
        no_overlay);
-  descriptor mounted(::fsmount(options.get(), FSMOUNT_CLOEXEC, 0));
-  must(mounted.get(), no_overlay);
+  descriptor mounted(::fsmount(options.number(), FSMOUNT_CLOEXEC, 0));
+  must(mounted.number(), no_overlay);
   return mounted;
 }
 
@@ -164,21 +148,21 @@ class process {
 
   std::string path_of(const descriptor& opened) const {
     char path[4096];
-    const std::string link = "self/fd/" + std::to_string(opened.get());
+    const std::string link = "self/fd/" + std::to_string(opened.number());
     const ssize_t length =
-        ::readlinkat(directory_.get(), link.c_str(), path, sizeof path);
+        ::readlinkat(directory_.number(), link.c_str(), path, sizeof path);
     must(length, "readlink");
     return std::string(path, static_cast<std::size_t>(length));
   }
 
   std::string text_of(const char* name) const {
     const descriptor file(
-        ::openat(directory_.get(), name, O_RDONLY | O_CLOEXEC));
-    must(file.get(), name);
+        ::openat(directory_.number(), name, O_RDONLY | O_CLOEXEC));
+    must(file.number(), name);
     std::string text;
     char buffer[4096];
     ssize_t count = 0;
-    while ((count = ::read(file.get(), buffer, sizeof buffer)) > 0)
+    while ((count = ::read(file.number(), buffer, sizeof buffer)) > 0)
       text.append(buffer, static_cast<std::size_t>(count));
     must(count, name);
     return text;
@@ -192,12 +176,12 @@ descriptor clone_tree(int directory, unsigned flags) {
   descriptor tree(
       ::open_tree(directory, "",
                   AT_EMPTY_PATH | OPEN_TREE_CLONE | OPEN_TREE_CLOEXEC | flags));
-  must(tree.get(), "open_tree");
+  must(tree.number(), "open_tree");
   return tree;
 }
 
 void attach(const descriptor& tree, int target) {
-  must(::move_mount(tree.get(), "", target, "",
+  must(::move_mount(tree.number(), "", target, "",
                     MOVE_MOUNT_F_EMPTY_PATH | MOVE_MOUNT_T_EMPTY_PATH),
        "move_mount");
 }
@@ -213,7 +197,7 @@ class layers {
   void lay() {
     const descriptor base = open_inside(root_, writable, O_DIRECTORY);
     // Without the directory there is nothing that a boot could write to.
-    if (base.get() < 0) return;
+    if (base.number() < 0) return;
     insist_on_no_marks();
     const std::string top = self_.path_of(base);
     // Without the layer, in which a file of an update could be such a mark.
@@ -222,14 +206,14 @@ class layers {
     std::vector<std::pair<std::string, descriptor>> mounted;
     for (const auto& place : mounts_below(self_.text_of("self/mountinfo"), top))
       mounted.emplace_back(place, open_inside(root_, inside(place), 0));
-    over(base, base.get(), inside(top));
+    over(base, base.number(), inside(top));
     for (const auto& [place, lower] : mounted) {
       const descriptor target = open_inside(root_, inside(place), 0);
-      if (lower.get() < 0 || target.get() < 0) continue;
+      if (lower.number() < 0 || target.number() < 0) continue;
       if (!is_directory(lower))
-        attach(clone_tree(lower.get(), 0), target.get());
+        attach(clone_tree(lower.number(), 0), target.number());
       else
-        over(lower, target.get(), inside(place));
+        over(lower, target.number(), inside(place));
     }
     protect_downloads(kept);
   }
@@ -244,7 +228,7 @@ class layers {
           downloads}) {
       struct stat status {};
       const descriptor here = open_inside(root_, path, O_NOFOLLOW);
-      if (::fstat(here.get(), &status) == 0 && S_ISCHR(status.st_mode) &&
+      if (::fstat(here.number(), &status) == 0 && S_ISCHR(status.st_mode) &&
           status.st_rdev == 0)
         throw cannot_tell(
             std::string(path) +
@@ -258,32 +242,33 @@ class layers {
 
   static bool is_directory(const descriptor& opened) {
     struct stat status {};
-    return ::fstat(opened.get(), &status) == 0 && S_ISDIR(status.st_mode);
+    return ::fstat(opened.number(), &status) == 0 && S_ISDIR(status.st_mode);
   }
 
   bool is_read_only(const std::string& place) const {
     if (original_ < 0) return false;
     const descriptor before = open_inside(original_, place, 0);
     struct statvfs status {};
-    must(::fstatvfs(before.get(), &status), "statvfs");
+    must(::fstatvfs(before.number(), &status), "statvfs");
     return (status.f_flag & ST_RDONLY) != 0;
   }
 
   void over(const descriptor& lower, int target, const std::string& place) {
-    must(::fchdir(lower.get()), "chdir");
+    must(::fchdir(lower.number()), "chdir");
     const descriptor layer =
         make_layer(std::string("/").append(std::to_string(count_++)));
     must(::chdir("/"), "chdir");
-    if (is_read_only(place)) set_attributes(layer.get(), 0, MOUNT_ATTR_RDONLY);
+    if (is_read_only(place))
+      set_attributes(layer.number(), 0, MOUNT_ATTR_RDONLY);
     attach(layer, target);
   }
 
   void protect_downloads(const descriptor& kept) const {
     const descriptor tz = open_inside(root_, downloads, O_DIRECTORY);
-    if (kept.get() < 0 || tz.get() < 0) return;
-    const descriptor copy = clone_tree(kept.get(), AT_RECURSIVE);
-    set_attributes(copy.get(), AT_RECURSIVE, MOUNT_ATTR_RDONLY);
-    attach(copy, tz.get());
+    if (kept.number() < 0 || tz.number() < 0) return;
+    const descriptor copy = clone_tree(kept.number(), AT_RECURSIVE);
+    set_attributes(copy.number(), AT_RECURSIVE, MOUNT_ATTR_RDONLY);
+    attach(copy, tz.number());
   }
 
   int root_;
@@ -305,18 +290,19 @@ place enter_throwaway_device(const std::string& root) {
   here.is_running_system = self.path_of(device) == "/";
 
   // Taken before anything is covered.
-  const descriptor tree = clone_tree(device.get(), AT_RECURSIVE);
-  protect(tree.get());
+  const descriptor tree = clone_tree(device.number(), AT_RECURSIVE);
+  protect(tree.number());
   // A base of our own. Where it lies does not matter: this process sees nothing
   // else from then on, and no other process sees it.
   must(::mount("base", "/proc", "tmpfs", 0, "mode=0755"), "tmpfs");
   must(::chdir("/proc"), "chdir");
   must(::chroot("."), "chroot");
   must(::mkdir("/root", 0700), "mkdir");
-  attach(tree, open_directory("/root").get());
+  attach(tree, open_directory("/root").number());
   const descriptor inside = open_directory("/root");
-  layers(inside.get(), self, here.is_running_system ? device.get() : -1).lay();
-  must(::fchdir(inside.get()), escaped(root));
+  layers(inside.number(), self, here.is_running_system ? device.number() : -1)
+      .lay();
+  must(::fchdir(inside.number()), escaped(root));
   must(::chroot("."), "chroot");
   must(::chdir("/"), "chdir");
   return here;
