@@ -1,5 +1,5 @@
 # SPDX-License-Identifier: BSD-2-Clause
-"""Tests that boot emulated devices; where none can be had they are skipped."""
+"""Tests that boot emulated devices; they are skipped where there can be none."""
 
 import pytest
 
@@ -13,5 +13,5 @@ def machine(request):
     try:
         parts.prepare()
     except parts.Unavailable as reason:
-        pytest.skip(f"no device can be had here: {reason}")
+        pytest.skip(f"no device can be made here: {reason}")
     return Machine

@@ -89,7 +89,7 @@ def described(device: Device) -> str:
 
 
 def kind_of_record(device: Device) -> str:
-    """A record is written and never synced, so the disk may know of the file but not
+    """A record is written and never synced: the disk may know of the file but not
     of its bytes yet; the next activation writes it anew."""
     record = device.contents().get(RECORD)
     if record is None:

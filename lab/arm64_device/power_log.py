@@ -25,7 +25,7 @@ def requests(log: bytes) -> Iterator[tuple[int, int, bytes]]:
         return
     magic, version, _, sector = struct.unpack_from("<QQQI", log)
     if magic != MAGIC or version != 1 or sector != SECTOR:
-        raise ValueError("this is no log of writes")
+        raise ValueError("this is not a log of writes")
     at = SECTOR
     while at + SECTOR <= len(log):
         first, count, flags, _ = struct.unpack_from("<QQQQ", log, at)

@@ -54,5 +54,5 @@ def test_any_of_the_rest_is_lost(tmp_path):
 
 def test_no_log_has_no_requests():
     assert not list(requests(b""))
-    with pytest.raises(ValueError, match="no log of writes"):
+    with pytest.raises(ValueError, match="not a log of writes"):
         list(requests(bytes(SECTOR)))

@@ -157,7 +157,7 @@ def make_image(image: Path, script="", apart="",
                third: Path | None = None, megabytes=32):
     """A system's disk, after a shell did what the script says in its root directory;
     what is below the directory `apart` goes to a disk of its own. In a user namespace:
-    whoever runs this owns all, as root."""
+    the user who runs this owns all, as root."""
     [package] = CHOSEN.place.glob("*.deb")
     run("bwrap", "--unshare-user", "--uid", 0, "--gid", 0, "--dev-bind", "/", "/",
         "sh", "-euc", IMAGE, "-", CHOSEN.place, GUEST, real_data.TARGET, package, image,

@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: BSD-2-Clause
 //
 // Tries, in marlin's place, what the boot unit forbids, and prints what came of
-// it: a test that confines nothing would pass whatever the program does.
+// it: a test that confines nothing would pass with any program.
 // Without restrictions all files can be opened, and no call is refused.
 #define _GNU_SOURCE
 #include <errno.h>

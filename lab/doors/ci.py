@@ -24,7 +24,7 @@ from lab.carriers.building import configure, need, pytest
 from lab.words.command import Options, stop
 from lab.words.places import BUILD, PROJECT
 
-LONGEST_DOOR = 40  # lines; more of them are logic, which belongs into lab/
+LONGEST_DOOR = 40  # lines; more of them are logic, which belongs in lab/
 
 
 def run(*command, words=""):

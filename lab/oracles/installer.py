@@ -115,7 +115,7 @@ def announced_at_the_end(words: list[str], before: Entries) -> str | None:
 
 
 def violations(words: list[str], before: Entries, after: Entries) -> list[str]:
-    """What must not be, whatever happened to the installer."""
+    """What must not be after anything that happened to the installer."""
     found = [f"{path} was changed" for path in NOT_ITS_OWN
              if (before.get(path) and before[path].identity) !=
              (after.get(path) and after[path].identity)]

@@ -169,7 +169,7 @@ class Kernel:
         self._call("fstat")
 
     def close(self):
-        """A descriptor is closed whatever this reports."""
+        """A descriptor is closed even if this fails."""
         quietly(self._call, "close")
 
     def stat(self, path):
@@ -199,7 +199,7 @@ class Kernel:
 
 
 class Thrown(Exception):
-    """Whatever the program throws; no handler looks at more than that."""
+    """Anything that the program throws; no handler looks at what it is."""
 
 
 def quietly(call, *arguments):
@@ -496,7 +496,7 @@ class Boot:
             self.create_symlink(DEFAULT_LOCALTIME, LOCALTIME)
 
     def write_record(self, old, new):
-        """Quiet, whatever fails."""
+        """Quiet, even if all of it fails."""
         if self.is_special(RECORD):
             return
         try:

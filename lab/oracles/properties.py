@@ -223,7 +223,7 @@ class Judged:
 
 
 def shortcomings(boot: Judged) -> list[str]:
-    """What does not hold of an undisturbed boot of whatever device."""
+    """What does not hold of an undisturbed boot of any device."""
     rules = [of_the_log, of_the_legacy_link, of_obsolete_icu, of_activation,
              of_the_record, of_everything_else]
     if boot.ending == "exit 0" and boot.system:
@@ -361,7 +361,7 @@ def of_everything_else(boot):
             "C" in boot.lines or "D" in boot.lines)
 
 
-# --- Of a sound device, whatever happened to the boot before ------------------------
+# --- Of a sound device, after any boot before ----------------------------------------
 
 OWN = {ZONEINFO, ICUTZ, LOCALTIME, RECORD}
 

@@ -126,7 +126,7 @@ def log_differences(outcome: model.Outcome, seen: Seen | boot.Booted) -> list[st
             found.append(f"{start!r} ends in {ending!r}, "
                          f"expected {os.strerror(error)!r}")
         if ending not in lines.ERROR_TEXTS:
-            found.append(f"{start!r} ends in {ending!r}, which is no error's text")
+            found.append(f"{start!r} ends in {ending!r}, which is not an error's text")
     # The runtime's own words on an exception that nobody caught may follow.
     if rest and (outcome.ending != "abort" or rest.startswith(lines.NAME)):
         found.append(f"expected no further line, got {first_line(rest)!r}")

@@ -47,7 +47,7 @@ class Measured(NamedTuple):
 
 def measured_boot() -> Measured:
     """A peak is passed on when a process becomes another program, and ours is high: the
-    boot is no child of ours, but of the small setsid(1), which leaves it."""
+    boot is not a child of ours, but of the small setsid(1), which leaves it."""
     with (open(os.memfd_create("log"), "r+b", buffering=0) as log,
           open(os.devnull, "r+b", buffering=0) as null):
         boot.spawn(["/usr/bin/setsid", "--fork", boot.PROGRAM],
@@ -169,7 +169,7 @@ def test_a_deep_tree(load, data_first):
 
 
 def test_a_tree_deeper_than_any_path(load):
-    """Its path would be longer than fts(3) can hold. Nothing below counts, so it must
+    """Its path would be longer than fts(3) can hold. Nothing below counts: it must
     not keep the data beside it from being found."""
     namespace.build(activation("2023d.1.0"))
     with contextlib.chdir(f"{UPDATE}/icutz"):
@@ -225,7 +225,7 @@ def test_a_long_link_target(load, path, start, end, without, length):
 def test_a_link_to_a_device(load, path, target):
     """As good as nothing to read, or to write to."""
     if not stat.S_ISCHR(os.stat(target).st_mode):
-        pytest.skip(f"on this machine {target} is no device")
+        pytest.skip(f"on this machine {target} is not a device")
     device = activation("2023d.1.0")
     device.link(path, target)
     namespace.build(device)

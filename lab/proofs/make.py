@@ -605,7 +605,7 @@ def test_archives_that_are_damaged(place, kind):
 
 @pytest.mark.parametrize("output", ["/dev/full", None])
 def test_an_update_that_cannot_be_told(place, output):
-    """It is made all the same, and the line says so."""
+    """It is made nevertheless, and the line says so."""
     command = shlex.join(make_update(place))
     done = ran(["/bin/sh", "-c", f"{command} >{output or '&-'}"])
     refused(done, "is made, but standard output fails")
@@ -614,7 +614,7 @@ def test_an_update_that_cannot_be_told(place, output):
 
 @pytest.mark.parametrize("seed", range(20))
 def test_random_damage(place, seed):
-    """Whatever is damaged: an update, or one line and nothing."""
+    """Any damage: an update, or one line and nothing."""
     dice = random.Random(seed)
     part = dice.choice([*(f"icu/{name}" for name in releases.RESOURCES),
                         "rules/tzdata.zi", "system/zoneinfo.default/Europe/Lisbon",

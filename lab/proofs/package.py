@@ -72,7 +72,7 @@ def run(*command, **options) -> str:
 
 def in_user_namespace(number: int, *command, **options) -> str:
     """Runs a command as this user number. As 0 it may own files, and changes nothing of
-    the machine; as another it has the rights of whoever runs the test."""
+    the machine; as another it has the rights of the user who runs the test."""
     return run("bwrap", "--unshare-user", "--uid", number, "--gid", number,
                "--dev-bind", "/", "/", *command, **options)
 
@@ -289,7 +289,7 @@ def test_systemd_accepts_the_unit(units):
 
 
 def test_systemd_accepts_the_mend(package, units):
-    """The drop-in, where an integrator puts it. It may fail, so systemd does not look
+    """The drop-in, where an integrator puts it. It may fail: systemd does not look
     for its program."""
     place = Path(units.removeprefix("--root=")) / "etc/systemd/system/marlin.service.d"
     example = package.content / "usr/share/doc/marlin/examples/marlin.service.d"

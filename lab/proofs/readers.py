@@ -150,7 +150,7 @@ def asked(reader: Reader) -> str:
 def files_read(reader: Reader, cluster: Path) -> str:
     """Files with time-zone data that a program opened, or its server."""
     log = "/tmp/opened"
-    # Under a tracer that is no parent, the program gets its signals itself.
+    # Under a tracer that is not its parent, the program gets its signals itself.
     traced = ("strace", "-D", "-f", "-qq", "-e", "trace=open,openat", "-o", log)
     own = () if reader.command == PSQL else traced
     with serving(reader, cluster, *traced), started(reader, *own) as running:

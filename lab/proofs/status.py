@@ -457,7 +457,7 @@ CASES = {
 
 @pytest.mark.parametrize("name", CASES)
 def test_a_tree(name):
-    """Whatever it holds: the status, the facts, and not a trace left on it."""
+    """Of any device: the status, the facts, and not a trace left on it."""
     status, changes, facts = CASES[name]
     unpack(*changes)
     before = times(TREE)

@@ -31,7 +31,7 @@ def failure(number: int) -> OSError:
 
 @dataclass(eq=False)
 class Node:
-    """Whatever can stand at a path."""
+    """Anything that can stand at a path."""
     kind: str  # dir, file, link, fifo, socket or device
     mode: int = 0o777  # of a link: without meaning
     text: str = ""  # a file's content, a link's target
@@ -150,7 +150,7 @@ class Device:
                 if node.kind != "dir"}
 
     def in_words(self) -> str:
-        """A line for every entry that is no empty directory above others."""
+        """A line for every entry except directories that only hold others."""
         return "\n".join(f"{path}: {described(node)}"
                          for path, node in self.everything()
                          if not (node.entries and node.mode == 0o755))

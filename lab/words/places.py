@@ -13,6 +13,6 @@ BUILD = BUILD.resolve()
 
 
 def shown(place: Path) -> str:
-    """As short as it can be told to whoever stands in the project's folder."""
+    """As short as it can be told to somebody in the project's folder."""
     inside = place.is_relative_to(PROJECT)
     return str(place.relative_to(PROJECT) if inside else place)

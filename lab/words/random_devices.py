@@ -214,7 +214,7 @@ class Composer:
         self.place(OLD_ICU, "", ["gone", "timezone", "."])
 
     def place(self, path, usual, targets):
-        """A link to a usual target, if any, or whatever can stand in its place."""
+        """A link to a usual target, if any, or anything else in its place."""
         if self.odd():
             self.device.drop(path)
             self.stand_in(path, targets)
@@ -233,7 +233,7 @@ class Composer:
             lambda: device.socket(path)])()
 
     def target(self, targets):
-        """One of these that is no form, or of the forms with a version."""
+        """One of these texts as it is, or of the forms with a version in it."""
         return self.any([target.replace("*", version) for target in targets for version
                          in (self.versions if "*" in target else [""])])
 
