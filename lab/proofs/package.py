@@ -42,7 +42,6 @@ CONTENT = dict(reversed(line.split(maxsplit=1)) for line in """
     644 /usr/share/doc/marlin/docs/architecture.md
     644 /usr/share/doc/marlin/docs/decisions.md
     644 /usr/share/doc/marlin/docs/demo.svg
-    644 /usr/share/doc/marlin/docs/growth.svg
     644 /usr/share/doc/marlin/docs/integration.md
     644 /usr/share/doc/marlin/docs/proofs.md
     644 /usr/share/doc/marlin/docs/readers.md

@@ -36,7 +36,7 @@ endif()
 install(FILES README.md CHANGELOG.md LICENSE SECURITY.md
         DESTINATION ${CMAKE_INSTALL_DOCDIR})
 install(FILES docs/architecture.md docs/decisions.md docs/integration.md
-              docs/proofs.md docs/readers.md docs/demo.svg docs/growth.svg
+              docs/proofs.md docs/readers.md docs/demo.svg
         DESTINATION ${CMAKE_INSTALL_DOCDIR}/docs)
 install(DIRECTORY packaging/examples DESTINATION ${CMAKE_INSTALL_DOCDIR}
         USE_SOURCE_PERMISSIONS)
