@@ -125,7 +125,7 @@ def look_below(path: str, entries: Entries):
 
 
 def description_of(path: Path) -> Node:
-    """Of what stands anywhere on this machine."""
+    """A node for what stands at any path of this machine."""
     entries, source = {}, decoded(os.fsencode(path))
     look_below(source, entries)
     return as_device(entries).find(source)

@@ -98,7 +98,7 @@ class Names(NamedTuple):
 
     @property
     def year(self) -> int:
-        """In which Lisbon changes."""
+        """From its beginning on Lisbon has another time."""
         return int(self.system[:4]) + 1
 
 

@@ -17,7 +17,7 @@ from lab.words.seen import Call
 
 
 class Condition:
-    """Nothing goes wrong; and what the others are asked."""
+    """Nothing goes wrong. The others say in the same way what does."""
 
     name = "nothing fails"
     killed_before = None  # a call of the pass

@@ -83,7 +83,7 @@ def traced(words: list[str], *options: str) -> boot.Booted:
 
 
 def calls(scene: str) -> list[Call]:
-    """Those of an undisturbed run."""
+    """The system calls of an undisturbed run."""
     make, words = SCENES[scene]
     namespace.build(make())
     traced(words)
@@ -91,7 +91,7 @@ def calls(scene: str) -> list[Call]:
 
 
 def below(entries: Entries, place: str) -> dict:
-    """What is there, without its owner's name for it."""
+    """What is below a place, by the path from there; owners do not count."""
     return {path.removeprefix(place): (here.kind, here.mode, here.text)
             for path, here in entries.items() if path.startswith(place + "/")}
 

@@ -217,7 +217,7 @@ class Judged:
         return " and ".join(["reset"] * reset + ["activation"] * self.activated)
 
     def fits_the_system(self, data_set):
-        """May stay in use."""
+        """Whether a data set may stay in use."""
         return (data_set and self.system and data_set.schema == self.system.schema
                 and data_set.version >= self.system.version)
 

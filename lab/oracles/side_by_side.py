@@ -41,7 +41,7 @@ def each(place: str, run: str) -> str:
 
 
 def below(entries: Entries, place: str) -> Entries:
-    """Those of the device that is there."""
+    """The entries of the device at this place, by the paths that it knows."""
     return {path.removeprefix(place): here for path, here in entries.items()
             if path.startswith(tuple(place + part for part in PLACES))}
 

@@ -31,10 +31,10 @@ def gcovr(*options):
 
 
 def run_tests(program: Path):
-    """Left out: a million texts through std::regex, with every step counted, which show
-    nothing more than a few; a boot that may not write more than five bytes into any
-    file, so not its counters either; whole lists of calls, at the end of which the
-    counters are written."""
+    """Three kinds are left out. A million texts through std::regex, with every step
+    counted, show nothing more than a few. A boot that may write only five bytes into
+    any file cannot write its counters. A whole list of calls would end with those that
+    write the counters."""
     quietly(LOG.with_name(f"log of {program.name}"), program, "--gtest_brief=1",
             "--gtest_filter=-*OnAMillion*:*CannotBeWrittenWhole*:WholeListOfCalls.*")
 

@@ -50,7 +50,7 @@ def nothing_to_do(device):
 
 @chosen(activation, "2024a.1.0")
 def update_stays(device):
-    """It is announced still."""
+    """It is still announced."""
 
 
 @chosen(activation)
@@ -60,7 +60,7 @@ def first_activation(device):
 
 @chosen(activation, "2023d.1.0")
 def activation_after_an_update(device):
-    """That one has left its record."""
+    """The update in use has left its record."""
 
 
 @chosen()
