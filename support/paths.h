@@ -20,6 +20,9 @@ inline constexpr char zoneinfo_link[] = "/var/db/timezone/zoneinfo";
 inline constexpr char icu_link[] = "/var/db/timezone/icutz";  // updates only
 inline constexpr char localtime_link[] = "/var/db/timezone/localtime";
 
+// What stands in the directory of a data set: each component's data.
+inline constexpr const char* update_entries[] = {"icutz", "zoneinfo"};
+
 // Names the newest download. Written by the installer of updates; only read
 // here.
 inline constexpr char latest_update_link[] = "/var/db/timezone/tz_latest";

@@ -7,11 +7,13 @@
 #include <algorithm>
 #include <array>
 #include <cerrno>
+#include <iterator>
 #include <map>
 #include <memory>
 #include <utility>
 
 #include "dataset/icu_file_name.h"
+#include "support/paths.h"
 #include "tools/escaped.h"
 #include "tools/install/failure.h"
 #include "tools/install/files.h"
@@ -59,6 +61,13 @@ void check_mode(const std::string& path, mode_t mode) {
     refuse(escaped(path) + " runs as somebody else");
 }
 
+// In the name of a file of ICU data; otherwise empty.
+std::string_view icu_schema_of(std::string_view path) {
+  constexpr std::string_view directory = "icutz/";
+  if (!path.starts_with(directory)) return {};
+  return icu_schema_in(path.substr(directory.size()));
+}
+
 // ICU's header: its size, a magic number, and from byte 8 the byte order and
 // the character set of the data. The letter of the schema says both.
 void check_icu(const std::string& path, std::string_view content, char letter) {
@@ -83,12 +92,19 @@ class walk {
 
   contents all_of(int directory) {
     check_mode("the update", status_of(directory, ".", "the update").st_mode);
-    for (const auto& name : names_in(directory, 3, "the update")) {
-      if (name != "icutz" && name != "zoneinfo")
-        refuse(escaped(name) + " does not belong into an update");
+    const auto names =
+        names_in(directory, std::size(paths::update_entries) + 1, "the update");
+    for (const auto& name : names) {
+      if (std::ranges::count(paths::update_entries, name) == 0)
+        refuse(escaped(name) + " does not belong in an update");
     }
     enter(directory, "icutz", 1);
     enter(directory, "zoneinfo", 1);
+    // Another component's, which an older update lacks.
+    for (const auto& name : names) {
+      if (name != "icutz" && name != "zoneinfo")
+        entry(directory, name, name, 0);
+    }
     if (found_.schema.empty()) refuse("icutz holds no file icutzNNx.dat");
     if (found_.release.empty()) refuse("zoneinfo/+VERSION names no release");
     for (const auto& [path, target] : links_) {
@@ -131,7 +147,7 @@ class walk {
       file(parent, name, path, status);
     } else if (S_ISLNK(status.st_mode) && in_tree) {
       link(parent, name, path);
-    } else if (S_ISDIR(status.st_mode) && in_tree) {
+    } else if (S_ISDIR(status.st_mode) && (in_tree || depth == 0)) {
       enter(parent, path, depth + 1);
     } else {
       refuse(escaped(path) + " is " + kind_of(status.st_mode));
@@ -161,9 +177,7 @@ class walk {
         refuse(escaped(path) + " " + flaw);
     } else if (path == "zoneinfo/+VERSION") {
       found_.release = first_word(content_);
-    } else if (const auto schema =
-                   icu_schema_in(std::string_view(path).substr(6));
-               path.starts_with("icutz/") && !schema.empty()) {
+    } else if (const auto schema = icu_schema_of(path); !schema.empty()) {
       if (!found_.schema.empty())
         refuse("icutz holds more than one file icutzNNx.dat");
       found_.schema = schema;

@@ -161,6 +161,12 @@ void note_rights(device_facts& device) {
         device.foreign_part.empty())
       device.foreign_part = part;
   };
+  const auto look_at_update = [&](const std::string& path) {
+    look_at(path, false);
+    for (const char* entry : paths::update_entries)
+      look_at(path + "/" + entry, false);
+    look_at(path + "/zoneinfo/+VERSION", false);
+  };
   // The owner of "/" is the device's root.
   for (const char* part :
        {"/", "/var/db", "/var/db/timezone", paths::version_record})
@@ -176,9 +182,7 @@ void note_rights(device_facts& device) {
         zone.substr(0, zone.rfind('/'))})
     look_at(part, false);
   for (const auto* set : {&device.current, &device.update})
-    if (*set && !(*set)->path.empty())
-      for (const char* part : {"", "/zoneinfo", "/zoneinfo/+VERSION", "/icutz"})
-        look_at((*set)->path + part, false);
+    if (*set && !(*set)->path.empty()) look_at_update((*set)->path);
 }
 
 void expect_file(dataset_facts& facts, const std::string& path) {
@@ -212,6 +216,13 @@ void note_unreadable(dataset_facts& facts) {
                          std::not_equal_to<>()) != schemas.end();
 }
 
+std::string icu_schema_of(const mln_dataset& built) {
+  for (const auto& component : built.components)
+    if (const auto* icu = dynamic_cast<const mln_icu*>(component.get()))
+      return icu->schema.substr(0, longest_word);
+  return {};
+}
+
 // Building it tells; what is kept afterwards is short.
 dataset_facts facts_of(const std::string& path, const mln_dataset* system) {
   dataset_facts facts;
@@ -223,8 +234,7 @@ dataset_facts facts_of(const std::string& path, const mln_dataset* system) {
     const mln_dataset built(path);
     facts.version_text = built.version_string.substr(0, longest_word);
     facts.version = built.version;
-    facts.schema = dynamic_cast<const mln_icu&>(*built.components.back())
-                       .schema.substr(0, longest_word);
+    facts.schema = icu_schema_of(built);
     facts.fits_system =
         path.empty() || (system != nullptr && built.compatible_with(*system));
   } catch (const std::invalid_argument&) {
@@ -233,7 +243,7 @@ dataset_facts facts_of(const std::string& path, const mln_dataset* system) {
     facts.ends = dataset_facts::state::number_too_large;
   } catch (int) {
     facts.ends = dataset_facts::state::walk_failed;
-  } catch (const std::exception&) {
+  } catch (const std::bad_alloc&) {
     facts.ends = dataset_facts::state::no_memory;
   }
   facts.word_is_cut = refusals != before;
