@@ -6,6 +6,7 @@
 #include <linux/close_range.h>
 #include <linux/magic.h>
 #include <sys/mman.h>
+#include <sys/resource.h>
 #include <sys/stat.h>
 #include <sys/vfs.h>
 #include <sys/wait.h>
@@ -346,6 +347,20 @@ outcome run(const std::vector<std::string>& command,
   if (emulated() && WIFSIGNALED(status)) remove_emulators_line(printed);
   return {WIFEXITED(status) ? WEXITSTATUS(status) : -1,
           WIFSIGNALED(status) ? WTERMSIG(status) : 0, printed};
+}
+
+void leave_the_log_unread() {
+  int ends[2];
+  must(::pipe(ends) == 0, "make a pipe");
+  ::dup2(ends[1], STDERR_FILENO);
+  ::close(ends[0]);
+  ::signal(SIGPIPE, SIG_DFL);
+}
+
+void forbid_files_to_grow() {
+  const rlimit limit{};
+  must(::setrlimit(RLIMIT_FSIZE, &limit) == 0, "limit files");
+  ::signal(SIGXFSZ, SIG_DFL);
 }
 
 traced_outcome trace(const std::vector<std::string>& options,

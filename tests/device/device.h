@@ -136,6 +136,11 @@ bool emulated();
 outcome run(const std::vector<std::string>& command,
             const std::function<void()>& in_the_child = {});
 
+// For the child, where these signals end a process as they do by default:
+// standard error becomes a pipe that nobody reads; no file may grow.
+void leave_the_log_unread();
+void forbid_files_to_grow();
+
 // Runs a program under strace(1) with these options and expects that it exits
 // with status 0.
 struct traced_outcome : outcome {

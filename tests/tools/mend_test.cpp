@@ -119,6 +119,15 @@ TEST_F(Mend, ReckonsWithALinkInItsFormerPlace) {
   expect_mended();
 }
 
+TEST_F(Mend, GoesOnWithoutALog) {
+  for (const auto lose_the_log : {leave_the_log_unread, forbid_files_to_grow}) {
+    point_links_at_system();
+    make_link(icutz, update("2024a.1.0") + "/icutz");
+    EXPECT_EQ(run({MARLIN_MEND}, lose_the_log).exit_status, 0);
+    EXPECT_EQ(link_at(zoneinfo), nothing);
+  }
+}
+
 TEST_F(Mend, TellsThatItCannotRemoveTheLink) {
   point_links_at_system();
   make_link(icutz, update("2024a.1.0") + "/icutz");

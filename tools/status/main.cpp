@@ -217,6 +217,8 @@ int tell_or_say_why_not(const options& chosen) {
 
 int main(int count, char** words) {
   const options chosen = parse(count, words);
+  // A limit on the size of files fails a write, which is told.
+  ::signal(SIGXFSZ, SIG_IGN);
   // If it is ignored, nobody is told how a child ends.
   ::signal(SIGCHLD, SIG_DFL);
   const pid_t child = ::fork();
