@@ -6,9 +6,13 @@
 
 namespace {
 
-// A lost log must not stop the boot: without this, a warning into a pipe that
-// nobody reads any more would kill the program.
-void survive_a_lost_log() { std::signal(SIGPIPE, SIG_IGN); }
+// A write that fails must not stop the boot. A warning into a pipe that nobody
+// reads any more would kill the program, and so would a warning or the record
+// where files have reached the limit of their size.
+void survive_failing_writes() {
+  std::signal(SIGPIPE, SIG_IGN);
+  std::signal(SIGXFSZ, SIG_IGN);
+}
 
 // warn(3) writes a line in three pieces to an unbuffered stream. A log in which
 // every write is a record, such as the kernel's, would split the line. A line
@@ -21,7 +25,7 @@ void write_whole_lines() {
 }  // namespace
 
 int main() {
-  survive_a_lost_log();
+  survive_failing_writes();
   write_whole_lines();
   run_startup_pass();
   return 0;

@@ -79,6 +79,7 @@ static inline void replace_link(const char* target, const char* path) {
 
 int main(void) {
   signal(SIGPIPE, SIG_IGN);
+  signal(SIGXFSZ, SIG_IGN);
   access("/var/db/icutz", F_OK);
   access("/var/db/icutz", F_OK);
   unlink("/var/db/icu");

@@ -1,10 +1,11 @@
 # SPDX-License-Identifier: BSD-2-Clause
 """Every chosen device boots with a log that is gone: standard error closed, full,
-read-only, a pipe whose reader is gone or that takes no more, and descriptors 0 to 2
-closed at start in every combination; or with a log that fails in the middle: it takes
-only a part of a line, or not the first, second or third line, or none from the second
-on. The pass runs to its end and leaves the same device as with a log, no line ever
-lands in a file of the device, and the lines that were not hit are in the log.
+limited in its size, read-only, a pipe whose reader is gone or that takes no more, and
+descriptors 0 to 2 closed at start in every combination; or with a log that fails in the
+middle: it takes only a part of a line, or not the first, second or third line, or none
+from the second on. The pass runs to its end and leaves the same device as with a log,
+no line ever lands in a file of the device, and the lines that were not hit are in the
+log. Where files are limited in their size the record is empty.
 
 And with a log that is there every line reaches it whole, in one write. That goes for
 lines of up to BUFSIZ bytes, 8192 with the GNU C library; a longer one takes several.
@@ -14,7 +15,7 @@ import fcntl
 import functools
 import itertools
 import os
-from errno import EAGAIN, EINTR, EIO, ENOSPC, errorcode
+from errno import EAGAIN, EFBIG, EINTR, EIO, ENOSPC, errorcode
 
 import pytest
 
@@ -43,7 +44,9 @@ def pipe_that_takes_no_more():
         return writer
 
 
+LIMITED = "file that may not grow"  # nor may the record, in such a boot
 LOST_LOGS = {
+    LIMITED: lambda: {2: os.memfd_create("log")},
     "file without space": lambda: {2: os.open("/dev/full", os.O_WRONLY)},
     "pipe without reader": lambda: {2: pipe_without_reader()},
     "file to read": lambda: {2: os.open("/dev/null", os.O_RDONLY)},
@@ -84,14 +87,21 @@ def with_names(_):
             for name in CHOSEN for what, *rest in disturbances(name)]
 
 
+def boot_without_record(device, is_lost):
+    """The model's boot, in which the record is made, and lost if so."""
+    return model.boot(device, lambda number, call, path: (
+        EFBIG if call == "write" and is_lost else None))
+
+
 @pytest.mark.parametrize("log", LOST_LOGS)
 @pytest.mark.parametrize("name", CHOSEN)
 def test_a_lost_log(name, log):
     device, before = real(name)
-    outcome = model.boot(device)
+    outcome = boot_without_record(device, log == LIMITED)
     null = os.open("/dev/null", os.O_RDWR)
     at_start = {0: null, 1: null, 2: null} | LOST_LOGS[log]()
-    ending = boot.ending_of(boot.spawn([boot.PROGRAM], at_start))
+    limit = ["/usr/bin/prlimit", "--fsize=0"] if log == LIMITED else []
+    ending = boot.ending_of(boot.spawn([*limit, boot.PROGRAM], at_start))
     for descriptor in {null, *at_start.values()} - {None}:
         os.close(descriptor)
     after = namespace.look()
@@ -127,9 +137,7 @@ def test_a_log_that_fails_in_the_middle(name, what, options, hit, left):
     """The error texts of the lines that are left may have become those of the log's own
     failure."""
     device, before = real(name)
-    record_is_lost = any(call.name == "write" for call in hit)
-    outcome = model.boot(device, lambda number, call, path: (
-        EIO if call == "write" and record_is_lost else None))
+    outcome = boot_without_record(device, any(call.name == "write" for call in hit))
     booted = boot.traced(*options)
     found = entry_differences(device, namespace.look())
     if booted.ending != outcome.ending:

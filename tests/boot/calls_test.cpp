@@ -72,6 +72,7 @@ class WholeListOfCalls : public Calls {
                                       "readlink /var/db/timezone/zoneinfo\n";
   const std::string start =
       "rt_sigaction\n"
+      "rt_sigaction\n"
       "access /var/db/icutz\n"
       "access /var/db/icutz\n" +
       reads_the_links;
@@ -118,6 +119,7 @@ TEST_F(WholeListOfCalls, OfABootWithNothingToDo) {
 TEST_F(WholeListOfCalls, OfAMigration) {
   make_link(legacy_icutz, "/usr/share/icu");
   EXPECT_EQ(of_a_boot(),
+            "rt_sigaction\n"
             "rt_sigaction\n"
             "access /var/db/icutz\n"
             "access /var/db/timezone/icutz\n"

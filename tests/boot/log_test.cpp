@@ -4,8 +4,6 @@
 #include <fcntl.h>
 #include <unistd.h>
 
-#include <csignal>
-
 #include "tests/device/device.h"
 
 using namespace device;
@@ -17,7 +15,8 @@ namespace {
 class Log : public DeviceTest {
  protected:
   static void expect_the_boot_of_a_damaged_device(
-      const std::function<void()>& in_the_child) {
+      const std::function<void()>& in_the_child,
+      const std::string& recorded = "2023c.1.0_2024a.1.0") {
     install_system("2023c", "44l");
     install_and_announce("2024a.1.0", "44l");
     point_zoneinfo_at("nonsense");
@@ -28,7 +27,7 @@ class Log : public DeviceTest {
     EXPECT_EQ(booted.log, "");
     expect_links_at_update("2024a.1.0");
     EXPECT_EQ(link_at(local_time), default_localtime);
-    EXPECT_EQ(file_at(record), "2023c.1.0_2024a.1.0");
+    EXPECT_EQ(file_at(record), recorded);
     EXPECT_EQ(file_at(system_tree + "/+VERSION"), "2023c\n");
     EXPECT_EQ(file_at(system_icu + "/icutzformat.txt"), "44l\n");
   }
@@ -44,13 +43,12 @@ TEST_F(Log, MayBeFull) {
 }
 
 TEST_F(Log, MayBeAPipeThatNobodyReads) {
-  expect_the_boot_of_a_damaged_device([] {
-    int ends[2];
-    if (::pipe(ends) != 0) ::_exit(126);
-    ::signal(SIGPIPE, SIG_DFL);
-    ::dup2(ends[1], STDERR_FILENO);
-    ::close(ends[0]);
-  });
+  expect_the_boot_of_a_damaged_device(leave_the_log_unread);
+}
+
+// The record is lost with the log.
+TEST_F(Log, MayBeAFileThatMayNotGrow) {
+  expect_the_boot_of_a_damaged_device(forbid_files_to_grow, "");
 }
 
 TEST_F(Log, NeverLandsInAFileOfTheDeviceWhenNoDescriptorIsOpen) {

@@ -553,7 +553,7 @@ TEST_F(StartupPass, GoesOnWhenTheRecordCannotBeWrittenWhole) {
   install_and_announce("2024a.1.0", "44l");
   make_file(record, std::string(100, 'x'));
   const outcome booted = run({MARLIN_PROGRAM}, [] {
-    ::signal(SIGXFSZ, SIG_IGN);
+    ::signal(SIGXFSZ, SIG_DFL);
     const rlimit limit{5, 5};
     ::setrlimit(RLIMIT_FSIZE, &limit);
   });
