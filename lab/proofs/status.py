@@ -576,10 +576,11 @@ def test_it_tells_about_itself():
     assert re.fullmatch(r"marlin-status \d+\.\d+\.\d+\n", ask("--version").output)
 
 
-def test_a_full_standard_output_is_a_failure():
+@pytest.mark.parametrize("limit", [[], ["/usr/bin/prlimit", "--fsize=0"]])
+def test_a_full_standard_output_is_a_failure(limit):
     unpack()
-    with open("/dev/full", "wb") as full:
-        done = subprocess.run([STATUS, "--root", TREE], stdout=full,
+    with open("/tmp/full" if limit else "/dev/full", "wb") as full:
+        done = subprocess.run([*limit, STATUS, "--root", TREE], stdout=full,
                               stderr=subprocess.PIPE)
     assert done.returncode == 77
     assert done.stderr.startswith(b"marlin-status: cannot tell: standard output: ")
