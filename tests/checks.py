@@ -102,8 +102,8 @@ def deliberate() -> Iterator[str]:
 
 
 def documents() -> Iterator[str]:
-    """Links between files lead somewhere; a table can be read in its source; no figure
-    is still to be filled in."""
+    """Links and paths lead somewhere; a table can be read in its source; no figure is
+    still to be filled in."""
     def anchors(path: Path) -> set[str]:
         headings = re.findall(r"^#+ (.*)", path.read_text(), re.M)
         return {re.sub(r"[^a-z0-9-]", "", heading.lower().replace(" ", "-"))
@@ -119,6 +119,9 @@ def documents() -> Iterator[str]:
                 yield f"{path}: there is no {name}"
             elif anchor and anchor not in anchors(target):
                 yield f"{path}: no heading for {link}"
+        for name in re.findall(r"`((?!build)\w+/[^`\s:]*)", path.read_text()):
+            if Path(name.split("/")[0]).is_dir() and not Path(name).exists():
+                yield f"{path}: there is no {name}"
         for line in matching_lines(path, r"^\|.*[^|]{201}"):
             yield f"{line[:60]} ...: a cell of more than 200 characters"
         for line in matching_lines(path, "FIGURE"):
