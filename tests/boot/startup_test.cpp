@@ -98,7 +98,7 @@ TEST_F(StartupPass, ReportsTheActiveUpdateAnnouncedAgainOnEveryBoot) {
 
 TEST_F(StartupPass, RefusesAnUpdateThatIsNotNewerOrOfAnotherSchema) {
   for (const auto& [version, schema] :
-       {std::pair("2023b.1.0", "44l"), std::pair("2023c.01.0", "44l"),
+       {std::pair("2023b.1.0", "44l"), std::pair("2023c.1.00", "44l"),
         std::pair("2024a.1.0", "45l")}) {
     install_and_announce(version, schema);
     boot_changes_nothing_and_prints(lines(refused(version, "2023c.1.0")));
@@ -139,6 +139,12 @@ TEST_F(StartupPass, RefusesAnUpdateWhoseNameIsNoVersion) {
     boot_changes_nothing_and_prints(
         lines(unparsed(name), refused(name, "2023c.1.0")));
   }
+  for (const std::string name : {"2024a.1.0/zoneinfo", "..", "%s%n"}) {
+    announce(name);
+    boot_changes_nothing_and_prints(lines(unparsed(name),
+                                          no_schema_in(update(name)),
+                                          refused(name, "2023c.1.0", 0)));
+  }
 }
 
 TEST_F(StartupPass, ComparesTheUpdateWithTheCurrentSetAndNotWithTheSystem) {
@@ -163,6 +169,9 @@ TEST_F(StartupPass, EndsALineInTheErrorOfTheLastCallThatFailed) {
   wipe(tz_latest);
   point_zoneinfo_at("nonsense");
   boot_prints(lines(bad_zoneinfo_link("nonsense"), invalid_links()));
+  set_mode(system_tree + "/+VERSION", 0);
+  const auto none = unparsed(".1.0", EACCES);
+  boot_prints(lines(none, none));
 }
 
 // --- Links that make no sense
@@ -241,6 +250,12 @@ TEST_F(StartupPass, ResetsACurrentSetWhoseNameIsNoVersion) {
   expect_links_at_system();
 }
 
+TEST_F(StartupPass, KeepsACurrentSetWithoutAVersionWhereTheSystemHasNone) {
+  wipe(system_tree);
+  install_and_use("odd", "44l");
+  boot_changes_nothing_and_prints(lines(unparsed(".1.0"), unparsed("odd")));
+}
+
 TEST_F(StartupPass, ReadsTheSystemsDataAnewForAReset) {
   install_update("2024a.1.0", "45l");
   wipe(system_tree + "/+VERSION");
@@ -271,13 +286,17 @@ TEST_F(StartupPass, StillComparesWithTheOldCurrentSetAfterAReset) {
   boot_changes_nothing_and_prints(lines(refused("2024b.1.0", "2025a.1.0")));
 }
 
+// Also where it equals the update's, or is newer.
 TEST_F(StartupPass, RecordsTheSystemVersionFirstAfterAReset) {
-  install_and_use("2024a.1.0", "44l");
+  install_update("2024a.1.0", "44l");
   install_and_announce("2026a.1.0", "44l");
-  install_system("2025a", "44l");
-  boot_prints(lines(incompatible()));
-  expect_links_at_update("2026a.1.0");
-  EXPECT_EQ(file_at(record), "2025a.1.0_2026a.1.0");
+  for (const std::string release : {"2025a", "2026a", "2027a"}) {
+    point_links_at_update("2024a.1.0");
+    install_system(release, "44l");
+    boot_prints(lines(incompatible()));
+    expect_links_at_update("2026a.1.0");
+    EXPECT_EQ(file_at(record), release + ".1.0_2026a.1.0");
+  }
 }
 
 TEST_F(StartupPass, TakesTheSystemsSchemaForTheUpdateAlsoAfterAReset) {
@@ -318,7 +337,7 @@ TEST_F(StartupPass, ResetsValidLinksWhenTheAnnouncementIsOutsideTheDownloads) {
   install_update("2024a.1.0", "44l");
   for (const std::string target :
        {"tz/2024a.1.0", "/usr/share/zoneinfo.default", "/var/db/timezone/tz/",
-        "/var/db/timezone/tz"}) {
+        "/var/db/timezone/tz", "/"}) {
     point_links_at_update("2024a.1.0");
     make_link(tz_latest, target);
     boot_prints(lines(bad_path(target), unable_to_locate()));

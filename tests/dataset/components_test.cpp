@@ -52,6 +52,12 @@ TEST_F(CompatibleComponents, AreListsOfOneLengthWithNoRefusal) {
   EXPECT_TRUE(compatible_components({}, {}));
 }
 
+TEST_F(CompatibleComponents, AreAskedAlsoAboutThemselves) {
+  const component_list same = list("yn", 'a');
+  EXPECT_FALSE(compatible_components(same, same));
+  EXPECT_EQ(asked, (questions{"aa", "bb"}));
+}
+
 TEST_F(CompatibleComponents, StopAtTheFirstRefusal) {
   EXPECT_FALSE(compatible_components(list("yny", 'a'), list("yyy", 'x')));
   EXPECT_FALSE(compatible_components(list("yyn", 'c'), list("yyy", 'x')));

@@ -158,6 +158,12 @@ TEST_F(Dataset, IsNewerByItsVersionAlone) {
   EXPECT_FALSE(system > newer);
   EXPECT_FALSE(equal > system);
   EXPECT_FALSE(system > equal);
+  // An update's is its path; the system's may have changed with the disk.
+  install_system("2023d", "44l");
+  make_file(update("2023c.1.1") + "/zoneinfo/+VERSION", "2023d");
+  EXPECT_FALSE(mln_dataset(update("2023c.1.1")) > newer);
+  EXPECT_TRUE(mln_dataset() > system);
+  EXPECT_FALSE(system > mln_dataset());
 }
 
 TEST_F(Dataset, IsCompatibleWithItselfAndWithTheSameSchemaOnly) {

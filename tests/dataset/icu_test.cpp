@@ -195,10 +195,13 @@ TEST_F(IcuCompatibility, AsksForTheSameSchemaByteForByte) {
   }
 }
 
-TEST_F(IcuCompatibility, ComparesBehindANulByteToo) {
-  install_system("2023c", std::string("44l\0x", 5));
+TEST_F(IcuCompatibility, ComparesCaseAndWhatStandsBehindANulByteToo) {
   install_update("2024a.1.0", "44l");
-  EXPECT_FALSE(mln_icu(update("2024a.1.0")).compatible_schema(mln_icu()));
+  for (const std::string& format :
+       {std::string("44L"), std::string("44l\0x", 5)}) {
+    install_system("2023c", format);
+    EXPECT_FALSE(mln_icu(update("2024a.1.0")).compatible_schema(mln_icu()));
+  }
 }
 
 TEST_F(IcuCompatibility, GoesByTheSchemaThatWasFirstRead) {

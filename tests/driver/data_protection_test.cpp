@@ -54,11 +54,16 @@ TEST_F(DataProtection, AsksForClassDOnBothDirectoriesBeforeAllElse) {
                           closes("3"), looks_at_the_legacy_link));
 }
 
-TEST_F(DataProtection, AsksForClassDOnADirectoryThatIsNamed) {
+TEST_F(DataProtection, AsksForClassDOnWhateverIsNamed) {
   if (emulated()) GTEST_SKIP() << "strace would show the emulator's calls";
-  EXPECT_THAT(
-      first_calls(3, downloads, CLASS_D),
-      ElementsAre(opens(downloads, "3"), asks_for_class_d("3"), closes("3")));
+  make_link("/var/db/timezone/link", downloads);
+  make_file("/var/db/timezone/file");
+  for (const char* name : {"tz", "link", "file"}) {
+    const std::string path = first + name;
+    EXPECT_THAT(
+        first_calls(3, path, CLASS_D),
+        ElementsAre(opens(path, "3"), asks_for_class_d("3"), closes("3")));
+  }
 }
 
 TEST_F(DataProtection, TakesDescriptorZeroForADescriptor) {

@@ -123,10 +123,13 @@ TEST_F(DatasetPathFromLink, RejectsEverythingElse) {
        {"/usr/share/zoneinfo.default/", "/usr/share/zoneinfo",
         "/usr/share/zoneinfo.defaulT", "/usr/share/zoneinfo.default2",
         "//usr/share/zoneinfo.default", "usr/share/zoneinfo.default", "", "/",
-        "tz/2024a.1.0/zoneinfo", "/var/db/Timezone/tz/a/zoneinfo",
-        "/var/db/timezone/tZ/a/zoneinfo", "/var/db/timezone/tz2/a/zoneinfo",
-        " /var/db/timezone/tz/a/zoneinfo", "%s%n", "two\twords"})
+        "/usr/share//zoneinfo.default", "tz/2024a.1.0/zoneinfo",
+        "/var/db/Timezone/tz/a/zoneinfo", "/var/db/timezone/tZ/a/zoneinfo",
+        "/var/db/timezone/tz2/a/zoneinfo", " /var/db/timezone/tz/a/zoneinfo",
+        "%s%n", "two\twords"})
     rejects(target);
+  printed_before_throwing(
+      -1, [] { dataset_path_from_link("/usr/share/zoneinfo.default\n"); });
 }
 
 }  // namespace

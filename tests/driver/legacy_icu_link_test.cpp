@@ -45,12 +45,18 @@ TEST_F(LegacyIcuMigration, MovesTheLegacyLinkWithItsTextUnchanged) {
   }
 }
 
-TEST_F(LegacyIcuMigration, HasAPresentLinkThatResolvesWin) {
-  make_link(legacy_icutz, "/var/db/data");
+TEST_F(LegacyIcuMigration, HasAPresentLinkThatResolvesOrADirectoryWin) {
+  const auto present_wins = [] {
+    make_link(legacy_icutz, "/var/db/data");
+    quietly(migrate_legacy_icu_link);
+    EXPECT_EQ(link_at(legacy_icutz), nothing);
+  };
   make_link(icutz, "/var/db/other");
-  quietly(migrate_legacy_icu_link);
+  present_wins();
   EXPECT_EQ(link_at(icutz), "/var/db/other");
-  EXPECT_EQ(link_at(legacy_icutz), nothing);
+  make_directory(icutz);
+  present_wins();
+  EXPECT_EQ(link_at(icutz), "(a directory)");
 }
 
 TEST_F(LegacyIcuMigration, LeavesALegacyLinkThatDangles) {

@@ -52,6 +52,7 @@ TEST_F(LocaltimeLinkRepair, LeavesALinkIntoTheActiveTreeAlone) {
 
 TEST_F(LocaltimeLinkRepair, LeavesALinkToAMissingZoneAlone) {
   leaves_alone("/var/db/timezone/zoneinfo/Nowhere");
+  leaves_alone("/var/db/timezone/zoneinfo/Europe/Paris\n");
 }
 
 TEST_F(LocaltimeLinkRepair, AcceptsThePrefixWithoutASeparator) {
@@ -65,6 +66,7 @@ TEST_F(LocaltimeLinkRepair, CorrectsALinkIntoTheFormerTreeOrToItself) {
   corrects("/usr/share/zoneinfo/Europe/Paris",
            "/var/db/timezone/zoneinfo/Europe/Paris");
   corrects("/usr/share/zoneinfo", "/var/db/timezone/zoneinfo");
+  corrects("/usr/share/zoneinfo/", "/var/db/timezone/zoneinfo/");
 }
 
 TEST_F(LocaltimeLinkRepair, LooksForTheCorrectedZoneInTheActiveDataSet) {
@@ -103,7 +105,8 @@ TEST_F(LocaltimeLinkRepair, ResetsARelativeLinkOrOneToAnywhereElse) {
         "/usr/share/zoneinfX/Europe/Paris", "/usr/share/Zoneinfo/Europe/Paris",
         "/var/db/timezone/zoneinf", "/VAR/db/timezone/zoneinfo/Europe/Paris",
         "//var/db/timezone/zoneinfo/Europe/Paris",
-        "/var/db/timezone/tz/2024a.1.0/zoneinfo/Europe/Paris", "%s%n"})
+        "/var/db/timezone/tz/2024a.1.0/zoneinfo/Europe/Paris",
+        "/usr/share/lib/zoneinfo/Europe/Paris", "%s%n"})
     resets(target);
 }
 

@@ -60,10 +60,12 @@ TEST_F(FirstWord, IsEmptyWhenTheFileHasNone) {
   EXPECT_EQ(of(std::string(100'000, ' ')), "");
 }
 
-TEST_F(FirstWord, KeepsAByteOrderMarkAndNulBytes) {
-  const std::string mark = "\xEF\xBB\xBF";
+TEST_F(FirstWord, KeepsAByteOrderMarkAnEndOfTextAndNulBytes) {
   for (const std::string& word :
-       {mark + "2016a", std::string("20\0a", 4), std::string(1, '\0')}) {
+       {std::string("\xEF\xBB\xBF"
+                    "2016a"),
+        std::string("2016a\x1a"), std::string("20\0a", 4),
+        std::string(1, '\0')}) {
     EXPECT_EQ(of(word), word);
     EXPECT_EQ(of(word + " x"), word);
   }

@@ -85,9 +85,12 @@ TEST_F(Remove, ThrowsTheNumberThatStandsAfterItsLineIsPrinted) {
   });
 }
 
-TEST_F(Remove, BelowAFileIsAFailureAndNotAMissingPath) {
+TEST_F(Remove, ThatCannotReachThePathIsAFailureAndNotAMissingPath) {
   make_file(path);
   remove_fails(path + "/x", ENOTDIR);
+  make_link(path, path);
+  remove_fails(path + "/x", ELOOP);
+  remove_fails("/var/db/" + std::string(256, 'x'), ENAMETOOLONG);
 }
 
 TEST_F(Exists, IsTrueForAFileThatNobodyMayReadADirectoryAndALinkToAFile) {
@@ -117,9 +120,10 @@ TEST_F(Exists, IsQuietlyFalseForADanglingLinkAndAPathThatCannotBeReached) {
 }
 
 TEST_F(ReadSymlink, ReturnsTheTargetAsItIsStored) {
-  make_link(path, "../%s//a/./b/");
-  EXPECT_EQ(quietly([] { return fsutil::read_symlink(path); }),
-            "../%s//a/./b/");
+  for (const std::string target : {"../%s//a/./b/", "\n", " x\r\n"}) {
+    make_link(path, target);
+    EXPECT_EQ(quietly([] { return fsutil::read_symlink(path); }), target);
+  }
 }
 
 TEST_F(ReadSymlink, OfAMissingPathIsQuietlyEmpty) {
@@ -141,6 +145,8 @@ TEST_F(ReadSymlink, ThatCannotBeReachedIsAFailureAndNotAMissingPath) {
   read_fails("/var/db/shut/link", EACCES);
   make_file(path);
   read_fails(path + "/x", ENOTDIR);
+  make_link(path, path);
+  read_fails(path + "/x", ELOOP);
   const std::string endless = "/var/db/" + std::string(256, 'x');
   read_fails(endless, ENAMETOOLONG);
   EXPECT_FALSE(fsutil::exists(endless));
