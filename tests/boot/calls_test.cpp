@@ -1,11 +1,13 @@
 // SPDX-License-Identifier: BSD-2-Clause
 //
-// Every call of a boot, in order: no lock, no umask, no rename, no sync, no
-// second fcntl, nothing on standard output, no look at the environment or the
-// locale.
+// What a boot asks of the kernel.
+#include <cerrno>
+
 #include "tests/device/device.h"
 
 using namespace device;
+using ::testing::IsEmpty;
+using ::testing::SizeIs;
 
 namespace {
 
@@ -14,11 +16,18 @@ class Calls : public SoundDeviceTest {
   void SetUp() override {
     if (emulated()) GTEST_SKIP() << "strace would show the emulator's calls";
     SoundDeviceTest::SetUp();
+    install_and_announce("2024a.1.0", "44l");
+  }
+
+  // The lines of a boot's trace that open a version, the format or the record.
+  static std::vector<std::string> opened_by_a_boot() {
+    auto opened = trace({"-e", "trace=open,openat"}).calls;
+    std::erase_if(opened, [](const std::string& line) {
+      return !std::regex_search(line, std::regex("\\+VERSION|format|Record"));
+    });
+    return opened;
   }
 };
-
-using ::testing::Contains;
-using ::testing::EndsWith;
 
 class WholeListOfCalls : public Calls {
  protected:
@@ -28,169 +37,140 @@ class WholeListOfCalls : public Calls {
   }
 #endif
 
-  // A line for every call from main() on, except those for memory, the C
-  // library's choice of variants undone: "call path", or "call number" where
-  // the first argument is a descriptor.
-  static std::string of_a_boot() {
-    const auto booted = trace({}, {MARLIN_PROGRAM}, [] {
-      ::setenv("LC_ALL", "de_DE.UTF-8", 1);
-      ::setenv("TZ", "Europe/Paris", 1);
-    });
-    std::string calls;
-    for (const auto& line : booted.calls) {
-      if (line.find("SIGPIPE, {sa_handler=SIG_IGN") != std::string::npos)
-        calls.clear();
-      calls += plain(line);
-    }
-    return calls;
-  }
-
-  static std::string reads(const std::string& path) {
-    return "stat " + path + "\nopen " + path + "\nread 3\nclose 3\n";
-  }
-  const std::string reads_the_system =
-      reads("/usr/share/zoneinfo.default/+VERSION") +
-      reads("/usr/share/icu/icutzformat.txt");
-  const std::string reads_an_update =
-      reads("/var/db/timezone/tz/2024a.1.0/zoneinfo/+VERSION") +
-      "stat /var/db/timezone/tz/2024a.1.0/icutz\n"
-      "open .\n"
-      "fchdir 3\n"
-      "open /var/db/timezone/tz/2024a.1.0/icutz\n"
-      "stat 4\n"
-      "stat 4\n"
-      "fchdir 4\n"
-      "getdents64 4\n"
-      "stat icutz44l.dat\n"
-      "getdents64 4\n"
-      "close 4\n"
-      "fchdir 3\n"
-      "close 3\n";
-  const std::string reads_the_links = "unlink /var/db/icu\n" +
-                                      reads_the_system +
-                                      "readlink /var/db/timezone/tz_latest\n"
-                                      "readlink /var/db/timezone/zoneinfo\n";
-  const std::string start =
-      "rt_sigaction\n"
-      "rt_sigaction\n"
-      "access /var/db/icutz\n"
-      "access /var/db/icutz\n" +
-      reads_the_links;
-  const std::string relinks_zoneinfo =
-      "unlink /var/db/timezone/zoneinfo\n"
-      "symlink /var/db/timezone/zoneinfo\n"
-      "unlink /var/db/timezone/icutz\n"
-      "unlink /var/db/icutz\n";
-  const std::string end =
-      "readlink /var/db/timezone/localtime\n"
-      "exit_group 0\n";
-
- private:
-  static std::string plain(const std::string& line) {
-    std::string call = line.substr(0, line.find('('));
-    for (const char* memory :
-         {"brk", "mmap", "munmap", "mprotect", "madvise", "mremap"})
-      if (call == memory) return {};
-    if (call == "rt_sigaction") return call + "\n";
-    if (call.ends_with("stat") || call == "newfstatat" || call == "statx")
-      call = "stat";
-    else if (call.ends_with("at"))
-      call.resize(call.size() - 2);
-    const std::string arguments = line.substr(line.find('(') + 1);
-    auto begin = arguments.find('"');
-    if (begin == std::string::npos || arguments.starts_with("4, \"\"") ||
-        call == "read" || call == "write")
-      return call + " " + arguments.substr(0, arguments.find_first_of(",)")) +
-             "\n";
-    if (call == "symlink")  // the target comes first
-      begin = arguments.rfind('"', arguments.rfind('"') - 1);
-    return call + " " +
-           arguments.substr(begin + 1,
-                            arguments.find('"', begin + 1) - begin - 1) +
-           "\n";
+  // A call with what it is about: two texts for a link, the path and the flags
+  // of what is opened, otherwise the first argument. The C library's choice of
+  // variants is undone, and calls for memory are left out.
+  static std::string plain(std::string call) {
+    for (const auto& [found, replaced] :
+         {std::pair("^(brk|mmap|munmap|mprotect|madvise|mremap)\\(.*", ""),
+          std::pair("AT_FDCWD, ", ""),
+          std::pair("^(access|faccess|open|readlink|symlink|unlink)at2?", "$1"),
+          std::pair("^(faccess)", "access"),
+          std::pair("^(newfstatat|fstatat64|fstat|statx)", "stat"),
+          std::pair("^(open|symlink)\\((.*?)\\) .*", "$1 $2\n"),
+          std::pair("^(\\w+)\\(([^,)]*).*", "$1 $2\n")})
+      call = std::regex_replace(call, std::regex(found), replaced);
+    return call;
   }
 };
 
-TEST_F(WholeListOfCalls, OfABootWithNothingToDo) {
-  EXPECT_EQ(of_a_boot(), start + reads_the_system + end);
-}
-
-// The legacy link is tested anew before it is removed.
-TEST_F(WholeListOfCalls, OfAMigration) {
+// From main() on: no lock, no umask, no rename, no sync, no second fcntl,
+// nothing on standard output, no look at the environment or the locale.
+TEST_F(WholeListOfCalls, OfAMigrationAnActivationAndACorrection) {
   make_link(legacy_icutz, "/usr/share/icu");
-  EXPECT_EQ(of_a_boot(),
-            "rt_sigaction\n"
-            "rt_sigaction\n"
-            "access /var/db/icutz\n"
-            "access /var/db/timezone/icutz\n"
-            "readlink /var/db/icutz\n"
-            "symlink /var/db/timezone/icutz\n"
-            "access /var/db/icutz\n"
-            "unlink /var/db/icutz\n" +
-                reads_the_links + reads_the_system + end);
-}
-
-TEST_F(WholeListOfCalls, OfABootWithAnUpdateInUse) {
-  install_and_use("2024a.1.0", "44l");
-  EXPECT_EQ(of_a_boot(), start + reads_an_update + end);
-}
-
-TEST_F(WholeListOfCalls, OfAnActivation) {
-  install_and_announce("2024a.1.0", "44l");
-  EXPECT_EQ(of_a_boot(), start + reads_the_system + reads_an_update +
-                             relinks_zoneinfo +
-                             "symlink /var/db/timezone/icutz\n"
-                             "stat /var/db/timezone/TZVersionDiffRecord\n"
-                             "open /var/db/timezone/TZVersionDiffRecord\n"
-                             "write 3\n"
-                             "close 3\n" +
-                             end);
-}
-
-TEST_F(WholeListOfCalls, OfAReset) {
-  install_and_use("2024a.1.0", "44l");
-  install_system("2025a", "44l");
-  EXPECT_EQ(of_a_boot(), start + reads_an_update + "write 2\n" +
-                             reads_the_system + relinks_zoneinfo + end);
-}
-
-TEST_F(WholeListOfCalls, OfACorrectionOfTheLocalTime) {
   point_localtime_at("/usr/share/zoneinfo/Europe/Paris");
-  EXPECT_EQ(of_a_boot(), start + reads_the_system +
-                             "readlink /var/db/timezone/localtime\n"
-                             "write 2\n"
-                             "access /var/db/timezone/zoneinfo/Europe/Paris\n"
-                             "unlink /var/db/timezone/localtime\n"
-                             "symlink /var/db/timezone/localtime\n"
-                             "exit_group 0\n");
+  const auto booted = trace({}, {MARLIN_PROGRAM}, [] {
+    ::setenv("LC_ALL", "de_DE.UTF-8", 1);
+    ::setenv("TZ", "Europe/Paris", 1);
+  });
+  std::string calls;
+  for (const auto& line : booted.calls) {
+    if (line.find("SIGPIPE, {sa_handler=SIG_IGN") != std::string::npos)
+      calls.clear();
+    calls += plain(line);
+  }
+  EXPECT_EQ(calls, R"(rt_sigaction SIGPIPE
+rt_sigaction SIGXFSZ
+access "/var/db/icutz"
+access "/var/db/timezone/icutz"
+readlink "/var/db/icutz"
+symlink "/usr/share/icu", "/var/db/timezone/icutz"
+access "/var/db/icutz"
+unlink "/var/db/icutz"
+unlink "/var/db/icu"
+stat "/usr/share/zoneinfo.default/+VERSION"
+open "/usr/share/zoneinfo.default/+VERSION", O_RDONLY|O_CLOEXEC
+read 3
+close 3
+stat "/usr/share/icu/icutzformat.txt"
+open "/usr/share/icu/icutzformat.txt", O_RDONLY|O_CLOEXEC
+read 3
+close 3
+readlink "/var/db/timezone/tz_latest"
+readlink "/var/db/timezone/zoneinfo"
+stat "/usr/share/zoneinfo.default/+VERSION"
+open "/usr/share/zoneinfo.default/+VERSION", O_RDONLY|O_CLOEXEC
+read 3
+close 3
+stat "/usr/share/icu/icutzformat.txt"
+open "/usr/share/icu/icutzformat.txt", O_RDONLY|O_CLOEXEC
+read 3
+close 3
+stat "/var/db/timezone/tz/2024a.1.0/zoneinfo/+VERSION"
+open "/var/db/timezone/tz/2024a.1.0/zoneinfo/+VERSION", O_RDONLY|O_CLOEXEC
+read 3
+close 3
+stat "/var/db/timezone/tz/2024a.1.0/icutz"
+open ".", O_RDONLY
+fchdir 3
+open "/var/db/timezone/tz/2024a.1.0/icutz", O_RDONLY|O_NONBLOCK|O_CLOEXEC|O_DIRECTORY
+stat 4
+stat 4
+fchdir 4
+getdents64 4
+stat "icutz44l.dat"
+getdents64 4
+close 4
+fchdir 3
+close 3
+unlink "/var/db/timezone/zoneinfo"
+symlink "/var/db/timezone/tz/2024a.1.0/zoneinfo", "/var/db/timezone/zoneinfo"
+unlink "/var/db/timezone/icutz"
+unlink "/var/db/icutz"
+symlink "/var/db/timezone/tz/2024a.1.0/icutz", "/var/db/timezone/icutz"
+stat "/var/db/timezone/TZVersionDiffRecord"
+open "/var/db/timezone/TZVersionDiffRecord", O_WRONLY|O_CREAT|O_TRUNC|O_CLOEXEC, 0666
+write 3
+close 3
+readlink "/var/db/timezone/localtime"
+write 2
+access "/var/db/timezone/zoneinfo/Europe/Paris"
+unlink "/var/db/timezone/localtime"
+symlink "/var/db/timezone/zoneinfo/Europe/Paris", "/var/db/timezone/localtime"
+exit_group 0
+)");
 }
 
-// Where stat(2) fails open(2) has to tell.
-TEST_F(Calls, ThatCannotTellAFileFromADeviceOpenIt) {
-  install_and_announce("2024a.1.0", "44l");
+TEST_F(Calls, NeverOpenAFifoASocketOrADevice) {
+  make_fifo("/var/db/fifo");
+  make_socket("/var/db/socket");
+  for (const char* device : {"/dev/null", "/dev/zero", "/dev/full", "/dev/tty",
+                             "/var/db/fifo", "/var/db/socket"}) {
+    SCOPED_TRACE(device);
+    make_file(system_icu + "/icutzformat.txt", "44l");
+    make_link(system_tree + "/+VERSION", device);
+    make_link(update("2024a.1.0") + "/zoneinfo/+VERSION", device);
+    make_link(record, device);
+    point_links_at_system();
+    // What is left is the format file, once for each of two data sets.
+    EXPECT_THAT(opened_by_a_boot(), SizeIs(2));
+    expect_links_at_update("2024a.1.0");
+    make_link(system_icu + "/icutzformat.txt", device);
+    EXPECT_THAT(opened_by_a_boot(), IsEmpty());
+  }
+}
+
+// Of 4096 bytes and some more the first part is kept.
+TEST_F(Calls, ThatFailToReadTheRestOfAWordKeepItsStart) {
+  const std::string file = system_tree + "/+VERSION";
+  const std::string start(4096, '7');
+  make_file(file, start + "8");
+  wipe(tz_latest);
   const auto booted =
-      trace({"-P", record, "-P", system_tree + "/+VERSION", "-e",
-             "inject=?fstat,?fstat64,?newfstatat,?fstatat64,?statx:error=EIO"});
-  EXPECT_EQ(booted.log, "");
-  EXPECT_EQ(file_at(record), "2023c.1.0_2024a.1.0");
-  // The system's word is read twice: it is also the current one.
-  EXPECT_THAT(booted.calls, Contains(EndsWith("(INJECTED)")).Times(3));
+      trace({"-P", file, "-e", "inject=read:error=EIO:when=2+2"});
+  const auto cut = unparsed(start + ".1.0", EIO);
+  EXPECT_THAT(booted.lines(), lines(cut, cut));
 }
 
 // What was only said to be written is missing from the record.
 TEST_F(Calls, OfAShortWriteGoOnBehindWhatWasTaken) {
-  install_and_announce("2024a.1.0", "44l");
-  const auto boot_with_first_write_taking = [](const std::string& bytes) {
+  for (const auto& [taken, recorded] :
+       {std::pair("1", "023c.1.0_2024a.1.0"), std::pair("0", "")}) {
     point_links_at_system();
-    EXPECT_EQ(
-        trace({"-P", record, "-e", "inject=write:retval=" + bytes + ":when=1"})
-            .log,
-        "");
-  };
-  boot_with_first_write_taking("1");
-  EXPECT_EQ(file_at(record), "023c.1.0_2024a.1.0");
-  boot_with_first_write_taking("0");
-  EXPECT_EQ(file_at(record), "");
+    const std::string first = "inject=write:when=1:retval=";
+    EXPECT_EQ(trace({"-P", record, "-e", first + taken}).log, "");
+    EXPECT_EQ(file_at(record), recorded);
+  }
 }
 
 }  // namespace

@@ -1,8 +1,10 @@
 // SPDX-License-Identifier: BSD-2-Clause
 //
 // Whole boots with the real program.
+#include <fcntl.h>
 #include <sys/resource.h>
 #include <sys/stat.h>
+#include <unistd.h>
 
 #include <cerrno>
 #include <csignal>
@@ -11,7 +13,11 @@
 #include "tests/device/device.h"
 
 using namespace device;
+using ::testing::AllOf;
 using ::testing::AnyOf;
+using ::testing::Each;
+using ::testing::MatchesRegex;
+using ::testing::SizeIs;
 using ::testing::StartsWith;
 
 namespace {
@@ -580,6 +586,35 @@ TEST_F(StartupPass, GoesOnWhenTheRecordCannotBeWrittenWhole) {
   EXPECT_EQ(booted.log, "");
   EXPECT_EQ(file_at(record), "2023c");
   expect_links_at_update("2024a.1.0");
+}
+
+// --- The log
+
+TEST_F(StartupPass, GoesOnWhenNobodyReadsItsLogOrItCannotBeWrittenWhole) {
+  for (const auto lose_it : {leave_the_log_unread, forbid_files_to_grow}) {
+    point_zoneinfo_at("nonsense");
+    wipe(local_time);
+    const outcome booted = run({MARLIN_PROGRAM}, lose_it);
+    EXPECT_EQ(booted.exit_status, 0);
+    expect_links_at_system();
+    EXPECT_EQ(link_at(local_time), default_localtime);
+  }
+}
+
+TEST_F(StartupPass, PrintsEveryLineInOneWrite) {
+  wipe(zoneinfo);
+  wipe(local_time);
+  int ends[2];
+  // Every write to a packet pipe is read as one.
+  ASSERT_EQ(::pipe2(ends, O_DIRECT), 0);
+  run({MARLIN_PROGRAM}, [&] { ::dup2(ends[1], STDERR_FILENO); });
+  ::close(ends[1]);
+  std::vector<std::string> writes;
+  char bytes[4096];
+  for (ssize_t count; (count = ::read(ends[0], bytes, sizeof bytes)) > 0;)
+    writes.emplace_back(bytes, static_cast<std::size_t>(count));
+  ::close(ends[0]);
+  EXPECT_THAT(writes, AllOf(SizeIs(3), Each(MatchesRegex("marlin: [^\n]*\n"))));
 }
 
 }  // namespace
