@@ -11,6 +11,6 @@
 // may be of any length and include NUL bytes; the rest of the file is not
 // looked at. Empty when there is no such word, or when the file cannot be
 // opened or read; if reading fails or memory runs out later, the part before
-// that. A FIFO, a socket or a device is never opened. Prints and throws
-// nothing. stat(2), open(2), read(2).
+// that. A FIFO or a device is never opened. Prints and throws nothing. Calls:
+// stat(2), open(2), read(2).
 std::string read_first_word(const std::string& path);

@@ -3,8 +3,14 @@
 
 #include <sys/stat.h>
 
+#include <cerrno>
+
 bool is_special_file(const std::string& path) {
+  const int error_so_far = errno;
   struct stat status {};
-  return ::stat(path.c_str(), &status) == 0 && !S_ISREG(status.st_mode) &&
-         !S_ISDIR(status.st_mode);
+  const bool is_special = ::stat(path.c_str(), &status) == 0 &&
+                          (S_ISFIFO(status.st_mode) ||
+                           S_ISCHR(status.st_mode) || S_ISBLK(status.st_mode));
+  errno = error_so_far;
+  return is_special;
 }

@@ -114,8 +114,9 @@ def calls() -> Iterator[Call]:
             if match := re.match(r"([a-z0-9_]+)\((.*)", line):
                 call, arguments = match.groups()
                 counts[call] += 1
+                failed = re.search(r" = -1 (E[A-Z0-9]+) [^\"]*$", line)
                 yield Call(call, counts[call], *name_and_path(call, arguments),
-                           line.endswith("(INJECTED)\n"))
+                           line.endswith("(INJECTED)\n"), failed and failed[1])
 
 
 def name_and_path(call, arguments):

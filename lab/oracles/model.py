@@ -19,7 +19,7 @@ import os
 import re
 from contextlib import suppress
 from errno import (EEXIST, EINVAL, EISDIR, ENAMETOOLONG, ENOENT, ENOTDIR, ENOTEMPTY,
-                   ERANGE)
+                   ENXIO, ERANGE)
 from typing import NamedTuple
 
 from lab.words import lines
@@ -135,6 +135,8 @@ class Kernel:
     def open(self, path):
         node = self._find("open", path)[2]
         node.insist_on(4)
+        if node.kind == "socket":
+            raise failure(ENXIO)
         return node
 
     @system_call
@@ -149,6 +151,8 @@ class Kernel:
         if node.kind == "dir":
             raise failure(EISDIR)
         node.insist_on(2)
+        if node.kind == "socket":
+            raise failure(ENXIO)
         node.text = ""
         self.changed.add(node)
         return node
@@ -287,11 +291,15 @@ class Boot:
     # --- 3. The first word of a file --------------------
 
     def is_special(self, path):
-        """A FIFO, a socket or a device, which is never opened."""
+        """A FIFO or a device, which is never opened. Nothing requires this question:
+        what it leaves does not show."""
+        last_error = self.kernel.last_error
         try:
-            return self.kernel.stat(path).kind not in ("file", "dir")
+            return self.kernel.stat(path).kind in ("fifo", "device")
         except OSError:
             return False
+        finally:
+            self.kernel.last_error = last_error
 
     def first_word(self, path):
         """Empty where there is no such file, nothing that can be read, or no word. When

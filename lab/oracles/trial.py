@@ -11,7 +11,7 @@ from itertools import zip_longest
 import pytest
 
 from lab.carriers import boot, namespace
-from lab.oracles import model
+from lab.oracles import model, properties
 from lab.oracles.conditions import Condition
 from lab.words import lines
 from lab.words.chosen_devices import CHOSEN
@@ -55,11 +55,13 @@ def trial(device: Device, condition: Condition | None = None,
         booted, calls = boot.boot(), []
     else:
         booted = boot.traced("-e", f"trace={boot.TRACED}", *condition.options(outcome))
-        calls = boot.pass_of(list(boot.calls()))
+        all_calls = list(boot.calls())
+        calls = boot.pass_of(all_calls)
     seen = Seen(before, namespace.look(), *booted, calls)
     found = differences(device, nodes, outcome, seen)
     if condition is not None:
         found += call_differences(outcome, calls)
+        found += properties.foreign_error_texts(all_calls, booted.log)
         tell = condition.name
     fail(tell, found, before)
     return outcome, seen

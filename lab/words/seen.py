@@ -41,6 +41,7 @@ class Call(NamedTuple):
     name: str
     path: str | None
     injected: bool  # it was made to fail
+    error: str | None  # such as "ENOENT"
 
 
 @dataclass

@@ -563,6 +563,21 @@ TEST_F(StartupPass, KeepsARecordThroughEveryReset) {
   reset();
 }
 
+// The record is new, which is no failure: the text is that of the walk through
+// the update's ICU data.
+TEST_F(StartupPass, EndsALineWithTheErrorOfAnEarlierCallAfterANewRecord) {
+  wipe(system_icu + "/icutzformat.txt");
+  install_and_announce("2024a.1.0", "44l");
+  wipe(update("2024a.1.0") + "/icutz/icutz44l.dat");
+  make_link(icutz, "/nowhere");
+  make_link(legacy_icutz, "/nowhere");
+  point_localtime_at("/usr/share/zoneinfo/Europe/Paris");
+  boot_prints(
+      lines(no_schema_in(update("2024a.1.0")),
+            correcting_localtime("/var/db/timezone/zoneinfo/Europe/Paris", 0)));
+  expect_links_at_update("2024a.1.0");
+}
+
 TEST_F(StartupPass, CreatesTheRecordWithTheDefaultPermissions) {
   install_and_announce("2024a.1.0", "44l");
   for (const mode_t mask : {0022u, 0077u, 0u}) {

@@ -106,10 +106,14 @@ TEST_F(IcuSchema, IsFoundThroughALinkToTheIcuDirectory) {
   EXPECT_EQ(of_update(), "44l");
 }
 
-TEST_F(IcuSchema, IsFoundBesideASubdirectoryThatMayNotBeEntered) {
+// One of them is listed first, and its error would stay for a later line.
+TEST_F(IcuSchema, IsFoundBetweenDirectoriesThatMayNotBeEnteredWithoutAnError) {
   make_directory(icu_directory + "/shut", 0);
   make_file(icu_directory + "/icutz44l.dat");
+  make_directory(icu_directory + "/closed", 0);
+  errno = EXDEV;
   EXPECT_EQ(of_update(), "44l");
+  EXPECT_EQ(errno, EXDEV);
 }
 
 TEST_F(IcuSchema, LeavesTheWorkingDirectoryAlone) {

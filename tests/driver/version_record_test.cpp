@@ -5,6 +5,8 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <cerrno>
+
 #include "tests/device/device.h"
 
 using namespace device;
@@ -90,10 +92,22 @@ TEST_F(VersionRecord, IsNotWrittenToATerminal) {
   ::close(terminal);
 }
 
-TEST_F(VersionRecord, IsNotWrittenToASocket) {
+TEST_F(VersionRecord, IsNotWrittenToASocketWhoseErrorStays) {
   make_socket(record);
-  quietly(write);
+  quietly([] {
+    write();
+    EXPECT_EQ(errno, ENXIO);
+  });
   EXPECT_EQ(file_at(record), "(something else)");
+}
+
+TEST_F(VersionRecord, LeavesTheErrorOfAnEarlierCall) {
+  for (const int error : {0, EXDEV}) {
+    wipe(record);
+    errno = error;
+    write();
+    EXPECT_EQ(errno, error);
+  }
 }
 
 TEST_F(VersionRecord, OfALeasedFileIsWrittenOnceTheLeaseIsGivenUp) {

@@ -4,6 +4,7 @@
 #include <fcntl.h>
 #include <unistd.h>
 
+#include <cerrno>
 #include <fstream>
 
 #include "tests/device/device.h"
@@ -129,6 +130,23 @@ TEST_F(FirstWord, OfAFifoASocketOrADeviceIsEmptyAndDoesNotBlock) {
     make_link(path, special);
     EXPECT_EQ(read_first_word(path), "") << special;
   }
+}
+
+TEST_F(FirstWord, LeavesTheErrorOfOpeningTheFileOrOfAnEarlierCall) {
+  const auto left_by_reading = [&] {
+    errno = EXDEV;
+    read_first_word(path);
+    return errno;
+  };
+  EXPECT_EQ(left_by_reading(), ENOENT);
+  make_file(path, "2016a");
+  EXPECT_EQ(left_by_reading(), EXDEV);
+  set_mode(path, 0);
+  EXPECT_EQ(left_by_reading(), EACCES);
+  make_socket(path);
+  EXPECT_EQ(left_by_reading(), ENXIO);
+  make_fifo(path);
+  EXPECT_EQ(left_by_reading(), EXDEV);
 }
 
 TEST_F(FirstWord, IsReadThroughDescriptorZeroToo) {
