@@ -131,11 +131,10 @@ exit_group 0
 )");
 }
 
-TEST_F(Calls, NeverOpenAFifoASocketOrADevice) {
+TEST_F(Calls, NeverOpenAFifoOrADevice) {
   make_fifo("/var/db/fifo");
-  make_socket("/var/db/socket");
-  for (const char* device : {"/dev/null", "/dev/zero", "/dev/full", "/dev/tty",
-                             "/var/db/fifo", "/var/db/socket"}) {
+  for (const char* device :
+       {"/dev/null", "/dev/zero", "/dev/full", "/dev/tty", "/var/db/fifo"}) {
     SCOPED_TRACE(device);
     make_file(system_icu + "/icutzformat.txt", "44l");
     make_link(system_tree + "/+VERSION", device);
