@@ -18,8 +18,8 @@ from lab.carriers import releases
 from lab.words.places import BUILD, PROJECT
 
 TARGET = BUILD / "demo/data"
-ICU_PROGRAM = TARGET / "icu-clock"
-ICU_SOURCE = PROJECT / "lab/readers/icu.cpp"
+ICU_CLOCK = TARGET / "icu-clock"
+ICU_SOURCE = PROJECT / "lab/readers/icu.c"
 
 
 def prepare():
@@ -55,5 +55,6 @@ def make():
         for partition in (system, upgrade):
             (partition / "zoneinfo.default").rename(partition / "zoneinfo")
             partition.rename(TARGET / partition.name)
-    releases.output("g++", "-O1", ICU_SOURCE, "-o", ICU_PROGRAM, "-licui18n",
-                    "-licuuc")
+    library = releases.icu_library()
+    releases.output("gcc", "-O1", f"-DMAJOR={made.icu[:-1]}", ICU_SOURCE, "-o",
+                    ICU_CLOCK, library.replace("libicudata", "libicui18n"))

@@ -12,6 +12,7 @@ import os
 import re
 import shutil
 import subprocess
+import sys
 import tempfile
 from pathlib import Path
 from typing import NamedTuple
@@ -69,6 +70,12 @@ def own() -> str:
     return find("release", r"\A# version (\d{4}[a-z]+)\b", RULES.read_text())[1]
 
 
+def names_of_lisbon() -> list[str]:
+    """What the rules call Lisbon's zone, in some releases WET, too."""
+    return sorted(["Europe/Lisbon", *re.findall(r"(?m)^L Europe/Lisbon (\S+)$",
+                                                RULES.read_text())])
+
+
 def after(release: str) -> str:
     """As releases are named: 2025b is followed by 2025c, and 2025z by 2025za."""
     if release.endswith("z"):
@@ -77,14 +84,15 @@ def after(release: str) -> str:
 
 
 def icu_library() -> str:
-    return find("ICU library", r"^/.*/libicudata\.a$",
-                output("dpkg", "-L", "libicu-dev").decode())[0]
+    """The library with all of ICU's data that this machine's ICU tools have."""
+    return find("ICU library", r" => (/.*/libicudata\.so\S*)",
+                output("ldd", shutil.which("icupkg")).decode())[1]
 
 
 def icu_schema() -> str:
     """As 72l: the version of the ICU library and the letter of its byte order."""
-    return find("ICU data", r"^icudt(\d+[lbe])_dat\.o$",
-                output("ar", "t", icu_library()).decode())[1]
+    version = find("ICU library", r"\.so\.(\d+)$", icu_library())[1]
+    return version + sys.byteorder[0]
 
 
 class Names(NamedTuple):
@@ -143,14 +151,10 @@ def make(place: Path, release: str, lisbon_from: int | None = None):
 
 
 def icu_files(folder: Path):
-    """ICU's four resource files, out of its library. All of ICU's data is one object
-    in it."""
-    library, schema = icu_library(), icu_schema()
+    """ICU's four resource files, out of its library, whose constants are its data."""
     with tempfile.TemporaryDirectory() as work:
-        package, wanted = f"{work}/icudt{schema}.dat", Path(work, "list.txt")
-        Path(work, "object").write_bytes(
-            output("ar", "p", library, f"icudt{schema}_dat.o"))
-        output("objcopy", "-O", "binary", "-j", ".rodata", f"{work}/object", package)
+        package, wanted = f"{work}/icudt{icu_schema()}.dat", Path(work, "list.txt")
+        output("objcopy", "-O", "binary", "-j", ".rodata", icu_library(), package)
         wanted.write_text("\n".join(RESOURCES) + "\n")
         output("icupkg", "-x", wanted, "-d", folder, package)
 

@@ -253,7 +253,7 @@ class Story:
         if rows["localtime"].startswith(f"{ZONEINFO}/"):
             zone = rows["localtime"].removeprefix(f"{ZONEINFO}/")
             rows["ICU clock"] = " ".join(output(
-                str(real_data.ICU_PROGRAM), seconds, zone, ICU_DATA=SYSTEM_ICU,
+                str(real_data.ICU_CLOCK), zone, input=seconds, ICU_DATA=SYSTEM_ICU,
                 ICU_TIMEZONE_FILES_DIR=ICUTZ).split()[:2])
         return rows
 
@@ -274,8 +274,8 @@ class Story:
         print()
 
 
-def output(*command: str, **environment: str) -> str:
-    return subprocess.run(command, check=True, env=environment, text=True,
+def output(*command: str, input="", **environment: str) -> str:
+    return subprocess.run(command, check=True, env=environment, text=True, input=input,
                           stdout=subprocess.PIPE).stdout.rstrip("\n")
 
 

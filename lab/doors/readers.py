@@ -13,6 +13,7 @@ use, 77 when there can be no private device.
 """
 
 import os
+import re
 import subprocess
 import sys
 from pathlib import Path
@@ -20,33 +21,43 @@ from pathlib import Path
 from lab.carriers import boot, real_data, releases
 from lab.carriers.building import build_program, locked, need, pytest
 from lab.carriers.private_device import ISOLATION, machine
-from lab.readers.programs import GLIBC, HOME, ICU, MUSL, UNPACKED
+from lab.readers import GLIBC, HOME, MUSL, UNPACKED
 from lab.words.command import Options, say, stop
 from lab.words.places import BUILD, PROJECT
 
-PACKAGES = ("libnode108 node-undici node-acorn node-cjs-module-lexer miller "
-            "postgresql-15 postgresql-client-15").split()
+# Large programs, and of what they depend on what they need to tell the time.
+PROGRAMS = "libnode", "postgresql-", "postgresql-client-"  # with a number
+NEEDED = r"lib(?!llvm|perl)|node|postgresql-(client-)?\d|miller"
 RECIPE, IMAGE = "lab/proofs/recipe.py", "lab/proofs/image.py"
 # Of the machine's "/etc": what programs need to start.
-ETC = ("alternatives", "group", "ld.so.cache", "passwd")
+ETC = ("alternatives", "group", "ld.so.cache")
+
+
+def apt(*words: str) -> str:
+    """What apt-get or apt-cache says."""
+    done = subprocess.run([f"apt-{words[0]}", "-q", *words[1:]], cwd=HOME, text=True,
+                          capture_output=True)
+    if done.returncode:
+        stop(1, f"cannot fetch the programs: {done.stderr.splitlines()[0]}")
+    return done.stdout
 
 
 def unpack():
     """What would be large, or start a server, is not installed."""
     UNPACKED.mkdir()
+    names = [max(re.findall(rf"(?m)^{name}\d+$", apt("cache", "pkgnames", name)),
+                 default="") for name in PROGRAMS]
+    if not all(names):
+        stop(1, "apt knows no Node and no PostgreSQL; as root, run apt-get update")
     # Another Node than Debian's may be installed, and then counts as the candidate.
-    known = subprocess.run(["apt-cache", "show", "--no-all-versions", "libnode108"],
-                           capture_output=True, text=True).stdout
-    if not known:
-        stop(1, "apt knows no package libnode108; as root, run apt-get update")
-    release = releases.find("Node", "^Version: (.*)", known)[1]
-    say("Fetching Debian packages (35 MB)")
-    fetched = subprocess.run(
-        ["apt-get", "-q", "download", f"nodejs={release}", *PACKAGES], cwd=HOME,
-        capture_output=True, text=True)
-    if fetched.returncode:
-        why, *_ = fetched.stderr.splitlines()
-        stop(1, f"cannot fetch the programs: {why}")
+    release = releases.find("Node", "^Version: (.*)", apt("cache", "show", names[0]))[1]
+    planned = apt("get", "-s", "--no-install-recommends", "--reinstall",
+                  "--allow-downgrades", "install", "miller", f"nodejs={release}",
+                  *names)
+    say("Fetching Debian packages (50 MB)")
+    apt("get", "download", *(
+        f"{name}={version}" for name, version in re.findall(
+            r"(?m)^Inst (\S+) [^(]*\((\S+)", planned) if re.match(NEEDED, name)))
     for package in HOME.glob("*.deb"):
         releases.output("dpkg-deb", "-x", package, UNPACKED)
         package.unlink()
@@ -57,7 +68,7 @@ def make():
     sources, output = PROJECT / "lab/readers", releases.output
     output("gcc", "-O1", sources / "clock.c", "-o", GLIBC)
     output("musl-gcc", "-O1", "-static", sources / "clock.c", "-o", MUSL)
-    output("g++", "-O1", sources / "icu.cpp", "-o", ICU, "-licui18n", "-licuuc")
+    (HOME / "passwd").write_text("reader:x:1000:1000::/tmp:/bin/sh\n")
 
 
 def inside(*command: str) -> list[str]:
@@ -69,6 +80,7 @@ def inside(*command: str) -> list[str]:
             *machine(), "--tmpfs", "/etc", "--tmpfs", "/tmp", "--dir",
             "/run", "--tmpfs", "/var/db", "--tmpfs", "/usr/share",
             *(word for place in places for word in ("--ro-bind", place, place)),
+            "--ro-bind", str(HOME / "passwd"), "/etc/passwd",
             "--setenv", "HOME", "/tmp", "--setenv", "MARLIN_PRIVATE_DEVICE", "1",
             "--setenv", "MARLIN", boot.PROGRAM, "--chdir", str(PROJECT), "--", *command]
 
@@ -92,7 +104,7 @@ def main() -> int:
         if others:
             try:
                 releases.once(HOME, [real_data.TARGET / "inputs", __file__,
-                                     *sorted((PROJECT / "lab/readers").glob("*.c*"))],
+                                     *sorted((PROJECT / "lab/readers").glob("*.c"))],
                               make)
             except (releases.NotOfTheForm, subprocess.CalledProcessError) as failed:
                 stop(1, str(failed))

@@ -17,8 +17,9 @@ from pathlib import Path
 import pytest
 
 from lab.carriers import boot, namespace, real_data, releases
-from lab.readers.programs import (FILES, LINKS, PSQL, READERS, READY, Reader, UNPACKED,
-                                  ZONE, debian, server)
+from lab.readers import UNPACKED
+from lab.readers.programs import (FILES, LINKS, POSTGRES, PSQL, READERS, Reader, ZONE,
+                                  server)
 from lab.words.device import Device
 from lab.words.paths import (ICUTZ, LOCALTIME, SYSTEM_ICU, SYSTEM_ZONEINFO, TZ_LATEST,
                              ZONEINFO, update_path)
@@ -83,8 +84,8 @@ def serving(reader: Reader, cluster: Path, *before: str) -> Iterator[None]:
                                stderr=subprocess.DEVNULL)
     try:
         for _ in range(100):
-            if not subprocess.call([READY, "-q", "-h", "/tmp/postgres"],
-                                   env=ENVIRONMENT):
+            if not subprocess.call([f"{POSTGRES}/pg_isready", "-q", "-h",
+                                    "/tmp/postgres"], env=ENVIRONMENT):
                 break
             time.sleep(0.05)
         yield
@@ -183,8 +184,8 @@ def cluster() -> Path:
     """An empty data base."""
     namespace.build(device_with("system", (), None))
     folder = Path("/tmp/cluster")
-    subprocess.run([debian("usr/lib/postgresql/15/bin/initdb"), "-D", folder, "-U",
-                    "reader", "-A", "trust", "--no-sync"], env=ENVIRONMENT, check=True,
+    subprocess.run([f"{POSTGRES}/initdb", "-D", folder, "-U", "reader", "-A", "trust",
+                    "--no-sync"], env=ENVIRONMENT, check=True,
                    stdout=subprocess.DEVNULL)
     return folder
 

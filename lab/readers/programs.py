@@ -7,11 +7,10 @@ from collections.abc import Callable
 from dataclasses import dataclass, field
 from pathlib import Path
 
+from lab.carriers import real_data, releases
+from lab.readers import GLIBC, MUSL, UNPACKED
 from lab.words.paths import FORMER_ZONEINFO, ICUTZ, LOCALTIME, SYSTEM_ICU, ZONEINFO
-from lab.words.places import BUILD
 
-HOME = BUILD / "readers"
-UNPACKED = HOME / "debian"  # Debian packages that are not installed for this
 ZONE = "Europe/Lisbon"
 
 # Links that an image may have, by the name that docs/readers.md gives them.
@@ -19,7 +18,7 @@ LINKS = {
     "names": (FORMER_ZONEINFO, ZONEINFO),
     "zone": ("/etc/localtime", f"{FORMER_ZONEINFO}/{ZONE}"),
     "ICU's update": ("/usr/share/zoneinfo-icu/44/le", ICUTZ),
-    "ICU's system": (f"{SYSTEM_ICU}/icudt72l", "."),
+    "ICU's system": (f"{SYSTEM_ICU}/icudt{releases.names().icu}", "."),
 }
 
 
@@ -75,13 +74,13 @@ def at(moment: int) -> str:
 
 
 DATE = ["stdbuf", "-oL", "date", "-f", "-", "+%H:%M"]
-GLIBC, MUSL, ICU = (str(HOME / name) for name in ("clock-glibc", "clock-musl", "icu"))
+ICU = [str(real_data.ICU_CLOCK)]
 NODE_NAMED, NODE_LOCAL = (
     [debian("usr/bin/node"), "-e", NODE.replace("OPTIONS", options)]
     for options in (f'{{timeZone: "{ZONE}"}}', "{}"))
-PSQL = ["stdbuf", "-oL", debian("usr/lib/postgresql/15/bin/psql"), "-qAtX",
-        "-v", "ON_ERROR_STOP=1", "-h", "/tmp/postgres", "-U", "reader", "postgres"]
-READY = debian("usr/lib/postgresql/15/bin/pg_isready")
+[POSTGRES] = UNPACKED.glob("usr/lib/postgresql/*/bin")
+PSQL = ["stdbuf", "-oL", f"{POSTGRES}/psql", "-qAtX", "-v", "ON_ERROR_STOP=1",
+        "-h", "/tmp/postgres", "-U", "reader", "postgres"]
 GO = [debian("usr/bin/mlr"), "--inidx", "--ifs", "space", "put", "-q",
       f'print strftime_local($1, "%H:%M", "{ZONE}")']
 TZ, FILES = {"TZ": f":{LOCALTIME}"}, {"ICU_TIMEZONE_FILES_DIR": ICUTZ}
@@ -101,16 +100,16 @@ READERS = [
     Reader("musl, a program", [MUSL], {"TZ": ZONE}),
     Reader("musl, a program", [MUSL], {"TZ": ZONE, "TZDIR": ZONEINFO}),
     Reader("musl, a program", [MUSL], {"TZ": ZONE}, ("names",)),
-    Reader("ICU4C, a zone by name", [ICU, "-", ZONE]),
-    Reader("ICU4C, a zone by name", [ICU, "-", ZONE], FILES),
-    Reader("ICU4C, a zone by name", [ICU, "-", ZONE], links=("ICU's update",)),
-    Reader("ICU4C, a zone by name", [ICU, "-", ZONE], DATA,
+    Reader("ICU4C, a zone by name", [*ICU, ZONE]),
+    Reader("ICU4C, a zone by name", [*ICU, ZONE], FILES),
+    Reader("ICU4C, a zone by name", [*ICU, ZONE], links=("ICU's update",)),
+    Reader("ICU4C, a zone by name", [*ICU, ZONE], DATA,
            ("ICU's update", "ICU's system")),
-    Reader("ICU4C, the host's zone", [ICU, "-"], FILES),
-    Reader("ICU4C, the host's zone", [ICU, "-"], FILES, ("names",)),
-    Reader("ICU4C, the host's zone", [ICU, "-"], FILES | TZ),
-    Reader("ICU4C, the host's zone", [ICU, "-"], FILES | {"TZ": ZONE}),
-    Reader("ICU4C, the host's zone", [ICU, "-"], FILES, ("names", "zone")),
+    Reader("ICU4C, the host's zone", ICU, FILES),
+    Reader("ICU4C, the host's zone", ICU, FILES, ("names",)),
+    Reader("ICU4C, the host's zone", ICU, FILES | TZ),
+    Reader("ICU4C, the host's zone", ICU, FILES | {"TZ": ZONE}),
+    Reader("ICU4C, the host's zone", ICU, FILES, ("names", "zone")),
     Reader("Python, zoneinfo", ["/usr/bin/python3", "-c", PYTHON]),
     Reader("Python, zoneinfo", ["/usr/bin/python3", "-c", PYTHON],
            {"PYTHONTZPATH": ZONEINFO}),
@@ -130,5 +129,5 @@ READERS = [
 
 def server(folder: Path) -> list[str]:
     """PostgreSQL's server, for psql."""
-    return [debian("usr/lib/postgresql/15/bin/postgres"), "-D", str(folder), "-k",
+    return [f"{POSTGRES}/postgres", "-D", str(folder), "-k",
             "/tmp/postgres", "-c", "listen_addresses=", "-c", "fsync=off"]
