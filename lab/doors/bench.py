@@ -22,7 +22,6 @@ import subprocess
 import sys
 from pathlib import Path
 
-from lab.bench.measure import SCENES
 from lab.carriers.building import build, need
 from lab.words.command import Options, stop
 from lab.words.places import BUILD
@@ -53,6 +52,7 @@ def measured(job: str, *arguments: str):
 
 def all_figures() -> dict[str, str]:
     """By name, in the order of the baseline."""
+    from lab.bench.measure import SCENES  # It takes pytest, which main() installs.
     marlin = built(*(f"floor_{scene}" for scene in SCENES))
     figures = dict(zip(TOOLCHAIN, (
         "g++ " + output("g++", "-dumpfullversion"),
@@ -137,7 +137,7 @@ def main():
         jobs.add_argument(f"--{job.__name__}", dest="job", action="store_const",
                           const=job)
     options = parser.parse_args()
-    need("build", "private-device", "bench")
+    need("build", "private-device", "pytest", "bench")
     options.job()
 
 
