@@ -7,7 +7,7 @@
 #include <memory>
 #include <vector>
 
-#include "dataset/component.h"
+#include "dataset/dataset_component.h"
 #include "dataset/icu.h"
 #include "dataset/zoneinfo.h"
 

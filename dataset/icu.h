@@ -5,7 +5,7 @@
 
 #include <string>
 
-#include "dataset/component.h"
+#include "dataset/dataset_component.h"
 
 class mln_icu final : public mln_dataset_component {
  public:
