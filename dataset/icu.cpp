@@ -56,6 +56,22 @@ std::string first_schema(FTS& walk) {
   return {};
 }
 
+// Returns with the walk closed, because closing may set the errno that a line
+// afterwards ends with. See IcuWalk.IsClosedBeforeAMissingSchemaIsReported.
+std::string schema_of_update(std::string& directory) {
+  const auto walk = open_walk(directory);
+  if (!walk) {
+    // Deliberate: the prefix is not the class's name, and the error text stands
+    // twice, because warn(3) appends it again. Both belong to the line that
+    // people search logs for. Pinned by
+    // IcuWalk.ThatCannotBeStartedIsReportedAndThrown.
+    ::warn("tz_icu::initialize: fts_open of %s failed, %s", directory.c_str(),
+           std::strerror(errno));
+    throw errno;
+  }
+  return first_schema(*walk);
+}
+
 }  // namespace
 
 mln_icu::mln_icu() : mln_icu(std::string()) {}
@@ -71,24 +87,10 @@ void mln_icu::initialize() {
     if (!word.empty()) schema = std::move(word);
     return;
   }
-  auto walk = open_walk(icu_path);
-  if (!walk) {
-    // Deliberate: the prefix is not the class's name, and the error text stands
-    // twice, because warn(3) appends it again. Both belong to the line that
-    // people search logs for. Pinned by
-    // IcuWalk.ThatCannotBeStartedIsReportedAndThrown.
-    ::warn("tz_icu::initialize: fts_open of %s failed, %s", icu_path.c_str(),
-           std::strerror(errno));
-    throw errno;
-  }
-  // Read also when the schema is known: closing a walk that was never read
-  // leaks in some C libraries.
-  std::string found = first_schema(*walk);
+  // Read also when a schema is known, which stays: closing a walk that was
+  // never read leaks in some C libraries.
+  std::string found = schema_of_update(icu_path);
   if (schema.empty()) schema = std::move(found);
-  // Closed here, not at the end of the block, because closing may set the errno
-  // that the line below ends with. See
-  // IcuWalk.IsClosedBeforeAMissingSchemaIsReported.
-  walk.reset();
   if (schema.empty())
     ::warn("No ICU schema found for %s", dataset_path.c_str());
 }
