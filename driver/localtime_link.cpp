@@ -5,6 +5,7 @@
 
 #include <cstdio>
 #include <string>
+#include <string_view>
 
 #include "driver/link_rejected.h"
 #include "support/fsutil.h"
@@ -15,6 +16,7 @@ namespace {
 constexpr char default_zone[] = "America/Los_Angeles";
 constexpr char default_target[] =
     "/var/db/timezone/zoneinfo/America/Los_Angeles";
+static_assert(std::string_view(default_target).ends_with(default_zone));
 
 // std::remove, because anything in the way, even an empty directory, must go
 // without a warning. If it stays, the link cannot be created, which is
