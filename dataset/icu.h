@@ -15,7 +15,7 @@ class mln_icu final : public mln_dataset_component {
   // system partition. For an update without a usable data file prints
   // "No ICU schema found for PATH"; when the directory walk cannot be started
   // prints "tz_icu::initialize: fts_open of PATH/icutz failed, REASON" and
-  // throws errno. fts(3).
+  // throws errno. Calls: fts(3).
   explicit mln_icu(const std::string& path);
 
   // Whether `other` is an mln_icu of the same schema; two without a schema are
@@ -29,8 +29,8 @@ class mln_icu final : public mln_dataset_component {
   // "/var/db/timezone/icutz" as a link to `icu_path`.
   void activate() const override;
 
-  // Finds the schema; called by the constructors. Where there is none, or one
-  // is known already, `schema` stays as it is.
+  // Finds the schema; called by the constructors. `schema` stays as it is where
+  // there is none, and for an update also where it is known already.
   void initialize();
 
   std::string schema{};  // such as 44l; empty when none was found

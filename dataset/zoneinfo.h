@@ -12,7 +12,7 @@ class mln_zoneinfo final : public mln_dataset_component {
   // The system partition's tree, "/usr/share/zoneinfo.default".
   mln_zoneinfo();
   // The tree "zoneinfo" below the data set's directory; an empty path means
-  // the system partition. Quiet, even where there is no such tree.
+  // the system partition. Prints nothing, even if there is no such tree.
   explicit mln_zoneinfo(const std::string& path);
 
   // Always true: a zoneinfo tree fits every system.

@@ -8,7 +8,8 @@
 
 namespace {
 
-// Takes no std::string, because nobody would catch what making one throws.
+// Takes no std::string: nobody would catch the exception if its memory were
+// refused.
 void request_class_d([[maybe_unused]] const char* directory) {
 #ifdef F_SETPROTECTIONCLASS
   constexpr int class_d = 4;

@@ -9,7 +9,7 @@
 // Puts "/var/db/timezone/" and "/var/db/timezone/tz/" into class D.
 void relax_data_protection();
 
-// Asks for class D, "no protection", on a directory. open(2), fcntl(2) with
-// F_SETPROTECTIONCLASS; nothing on platforms without it. Creates nothing,
-// prints nothing, never fails.
+// Asks for class D, "no protection", on a directory; does nothing on platforms
+// without classes. Creates nothing, prints nothing, never fails. Calls:
+// open(2), fcntl(2) with F_SETPROTECTIONCLASS.
 void set_protection_class_d(const std::string& directory);

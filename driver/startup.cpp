@@ -34,9 +34,9 @@ const mln_dataset& usable_or_reset(const mln_dataset& current,
                                    const mln_dataset& system) {
   if (is_usable(current, system)) return current;
   ::warn("Symlink points at data incompatible with installed system");
-  // Not system.activate(), which would make the same links: a reset reads the
-  // system's data anew wherever it happens, and logs then show again, after the
-  // reason, what is wrong with that data. See
+  // Not system.activate(), although the links would be the same: every reset
+  // reads the system's data anew, so that the log repeats, after the reason,
+  // what is wrong with that data. See
   // StartupPass.ReadsTheSystemsDataAnewForAReset.
   reset_to_system_partition();
   return system;

@@ -12,8 +12,8 @@
 
 // Makes the links below "/var/db/timezone/" consistent, in the nine steps that
 // startup.cpp lists. If a data set cannot be chosen or linked into place,
-// prints a warning and links the system partition. Throws only what the last
-// resorts throw: the final reset to the system partition (the local-time link
-// is then not looked at) and the default local-time link; and std::bad_alloc
-// when there is no memory for a fixed path.
+// prints a warning and links the system partition. Throws only when a last
+// resort fails: the final reset (the local time is then not looked at), or the
+// default local-time link; or std::bad_alloc when there is no memory for a
+// fixed path.
 void run_startup_pass();

@@ -14,7 +14,8 @@ constexpr auto is_white_space = [](char byte) {
   return byte == ' ' || (byte >= '\t' && byte <= '\r');
 };
 
-// Grows the caller's word, which is therefore there, cut, if memory runs out.
+// Appends to the caller's word, so that what was read remains if memory runs
+// out.
 void extract_word(int file, std::string& word) {
   char buffer[4096];
   for (;;) {

@@ -6,8 +6,8 @@
 //
 // A hard failure is printed with warn(3) and then thrown as a bare `int`: the
 // errno of the failing call. There is no exception class, because no handler
-// ever looks at the value; the path is in the warning. For remove()
-// and read_symlink() a missing path is not a failure.
+// ever looks at the value; the path is in the warning. For remove() and
+// read_symlink() a missing path is not a failure.
 //
 // All that is thrown anywhere in the program:
 //   int, an errno                      a failed call, here or in dataset/icu.h

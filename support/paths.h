@@ -15,12 +15,12 @@ inline constexpr char timezone_directory[] = "/var/db/timezone/";
 inline constexpr char download_root[] = "/var/db/timezone/tz/";
 
 // The links that readers of time-zone data follow. marlin owns them; the last
-// one is also written by others, for it is the user's choice of a zone.
+// one is also written by others, because it is the user's choice of a zone.
 inline constexpr char zoneinfo_link[] = "/var/db/timezone/zoneinfo";
 inline constexpr char icu_link[] = "/var/db/timezone/icutz";  // updates only
 inline constexpr char localtime_link[] = "/var/db/timezone/localtime";
 
-// What stands in the directory of a data set: each component's data.
+// What stands at the top of an update: each component's data.
 inline constexpr const char* update_entries[] = {"icutz", "zoneinfo"};
 
 // Names the newest download. Written by the installer of updates; only read

@@ -34,7 +34,7 @@ std::string_view take_dotted_number(std::string_view& text) {
 //
 // Each run ends at a byte of another kind, and a single dotted number is always
 // the first of the two. Therefore the longest run is always the right one, and
-// nothing is tried twice.
+// nothing needs backtracking.
 std::optional<mln_version_groups> match_version_text(std::string_view text) {
   const std::string_view year = take_run(text, is_digit);
   const std::string_view letters = take_run(text, is_letter);
