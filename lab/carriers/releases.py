@@ -70,12 +70,6 @@ def own() -> str:
     return find("release", r"\A# version (\d{4}[a-z]+)\b", RULES.read_text())[1]
 
 
-def names_of_lisbon() -> list[str]:
-    """What the rules call Lisbon's zone, in some releases WET, too."""
-    return sorted(["Europe/Lisbon", *re.findall(r"(?m)^L Europe/Lisbon (\S+)$",
-                                                RULES.read_text())])
-
-
 def after(release: str) -> str:
     """As releases are named: 2025b is followed by 2025c, and 2025z by 2025za."""
     if release.endswith("z"):
@@ -112,6 +106,13 @@ class Names(NamedTuple):
 
 def names() -> Names:
     return Names(**json.loads((TARGET / "names").read_text()))
+
+
+def names_of_lisbon() -> list[str]:
+    """What the rules call Lisbon's zone; in some of Debian's releases WET, too."""
+    rules = (TARGET / names().system / "tzdata.zi").read_text()
+    return sorted(["Europe/Lisbon",
+                   *re.findall(r"(?m)^L Europe/Lisbon (\S+)$", rules)])
 
 
 def prepare():
