@@ -14,7 +14,7 @@ sys.path.insert(0, os.path.dirname(os.path.dirname(os.path.abspath(__file__))))
 
 from lab.carriers import namespace  # noqa: E402
 from lab.oracles import properties  # noqa: E402
-from lab.proofs import kills  # noqa: E402
+from lab.proofs.windows import WINDOWS  # noqa: E402
 from lab.words import chosen_devices  # noqa: E402
 from lab.words.places import BUILD  # noqa: E402
 
@@ -44,8 +44,8 @@ def pytest_addoption(parser):
 
 def pytest_configure(config):
     config.addinivalue_line(
-        "markers", "cases(names, table): table(option) gives the cases of a run; "
-        "option gives the value of an option above")
+        "markers", "cases(names, table, quick=1): table(option) gives the cases of a "
+        "run, and --quick takes every so-manieth; option gives the value of an option")
     hypothesis.settings.register_profile(
         "run", max_examples=300 if config.getoption("quick") else 3000, deadline=None,
         database=None, suppress_health_check=list(hypothesis.HealthCheck))
@@ -54,8 +54,9 @@ def pytest_configure(config):
 
 def pytest_generate_tests(metafunc):
     for mark in metafunc.definition.iter_markers("cases"):
-        names, table = mark.args
-        metafunc.parametrize(names, list(table(metafunc.config.getoption)))
+        (names, table), option = mark.args, metafunc.config.getoption
+        every = mark.kwargs.get("quick", 1) if option("quick") else 1
+        metafunc.parametrize(names, list(table(option))[::every])
 
 
 def pytest_sessionstart(session):
@@ -94,15 +95,15 @@ def pytest_runtest_logreport(report):
 def never_seen() -> list[str]:
     """What a run of this size has to have met, and has not."""
     wanted = []
-    if TALLY.get("test_a_kill", 0) >= 200:
-        wanted += [f"kills leave {window.name}" for window in kills.WINDOWS]
+    if TALLY.get("test_a_kill", 0) >= 1500:
+        wanted += [f"kills leave {window}" for window in WINDOWS]
     if TALLY.get("test_a_kill_of_the_installer", 0) >= 600:
         wanted += ["kills that leave the new update announced",
                    "kills that leave the old announcement"]
     if TALLY.get("states", 0) >= 2000:
         wanted += [f"of them: {outcome}" for outcome in properties.OUTCOMES]
-    if TALLY.get("test_memory_is_refused", 0) == len(chosen_devices.CHOSEN):
-        wanted.append("refusals after which a walk is not started")
+    if TALLY.get("refusals of memory", 0) >= len(chosen_devices.CHOSEN):
+        wanted.append("refusals of memory to a walk")
     return [title for title in wanted if not TALLY.get(title)]
 
 

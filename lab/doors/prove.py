@@ -37,7 +37,7 @@ from lab.words.places import BUILD, PROJECT
 
 PYTHON = ["/usr/bin/python3", "-B", "-m"]
 TRIALS = {  # lab/proofs/NAME.py, each
-    "faults": ["faults", "memory"], "kills": ["kills", "windows"],
+    "faults": ["faults"], "kills": ["kills", "windows"],
     "states": ["states"], "load": ["load"], "log": ["log"], "status": ["status"],
     "install": ["install_faults", "install_kills", "install_races"], "make": ["make"]}
 OTHERS = {  # the whole, and with --quick

@@ -7,7 +7,7 @@ device: until the condition shows, both are the same.
 
 from __future__ import annotations
 
-from errno import EDQUOT, ENOSPC, EROFS, errorcode
+from errno import EDQUOT, ENOMEM, ENOSPC, EROFS, errorcode
 
 from lab.carriers import boot
 from lab.oracles.model import Outcome
@@ -19,7 +19,7 @@ from lab.words.seen import Call
 class Condition:
     """Nothing goes wrong. The others say in the same way what does."""
 
-    name = "nothing fails"
+    name = kind = "nothing fails"
     killed_before = None  # a call of the pass
 
     def options(self, outcome: Outcome) -> list[str]:
@@ -50,6 +50,7 @@ class Fails(Condition):
     def __init__(self, number: int, call: Call, error: int, for_good=False):
         self.number, self.call, self.error = number, call, error
         self.name = f"{described(number, call)} fails with {errorcode[error]}"
+        self.kind = "a failure for good" if for_good else "a call that fails"
         self.when, self.later = f"{call.number}", set()
         if for_good:
             self.name += ", as do all of its kind that follow"
@@ -66,6 +67,8 @@ class Fails(Condition):
 
 class Storage(Fails):
     """The file system changes for good: calls of several kinds fail from then on."""
+
+    kind = "storage"
 
     def __init__(self, number: int, undisturbed: list[Call], kind: str, error: int,
                  names: set[str]):
@@ -107,6 +110,8 @@ class WritesInPart(Condition):
     """The record's write takes only so many bytes. strace has the program believe so
     and writes none: only what follows has to be there."""
 
+    kind = "a write in part"
+
     def __init__(self, number: int, call: Call, taken: int):
         self.number, self.call, self.taken = number, call, taken
         self.name = f"{described(number, call)} takes {taken} bytes"
@@ -132,3 +137,30 @@ class Killed(Condition):
 
     def options(self, outcome):
         return boot.killing(self.call, self.turn)
+
+
+class MemoryRefused(Condition):
+    """The system gives no memory at a request of the program's, nor in another way.
+    Without a reserve the program asks for a few pages each time."""
+
+    traced = ["-E", "MALLOC_TOP_PAD_=0", "-e", f"trace={boot.TRACED},brk,mmap"]
+
+    def __init__(self, turn: int, mapped: int):
+        self.turn, self.mapped = turn, mapped
+        self.name = f"memory is refused at brk number {turn}"
+
+    def options(self, outcome=None):
+        # brk(2) itself never fails: it returns where the heap ends.
+        return [*self.traced, *boot.failing("mmap", ENOMEM, f"{self.mapped + 1}+"),
+                *boot.inject("brk", "retval=0", self.turn)]
+
+
+def refusals(*command: str) -> list[MemoryRefused]:
+    """One at each request, from the program's first look at the device on."""
+    boot.traced(*MemoryRefused.traced, command=command)
+    undisturbed = list(boot.calls())
+    start = boot.beginning(undisturbed)
+    # A loader may have mapped what it loaded.
+    mapped = sum(call.call == "mmap" for call in undisturbed[:start])
+    return [MemoryRefused(call.number, mapped) for call in undisturbed[start:]
+            if call.call == "brk"]

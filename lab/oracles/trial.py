@@ -6,7 +6,8 @@ from __future__ import annotations
 
 import functools
 import os
-from itertools import zip_longest
+from collections.abc import Iterator
+from itertools import count, zip_longest
 
 import pytest
 
@@ -14,7 +15,7 @@ from lab.carriers import boot, namespace
 from lab.oracles import model, properties
 from lab.oracles.conditions import Condition
 from lab.words import lines
-from lab.words.chosen_devices import CHOSEN
+from lab.words.chosen_devices import ABNORMAL, CHOSEN
 from lab.words.device import Device, Node, described
 from lab.words.seen import Call, Entries, Seen, as_device
 
@@ -65,6 +66,52 @@ def trial(device: Device, condition: Condition | None = None,
         tell = condition.name
     fail(tell, found, before)
     return outcome, seen
+
+
+def most_boots(lines: str) -> int:
+    """How many can change a device; the next one must not.
+
+    What the second can still change, with the reason:
+    - An update older than the system's data was activated right after a reset. The
+      second boot resets it, and then it is not newer than what is in use.
+    - An update was refused that is newer than the system's data, but not than the data
+      that was given up for it. The second boot activates it.
+    - The legacy link leads somewhere only through "localtime", which the first boot has
+      made. The second boot moves it.
+    A legacy link that cannot be deleted is moved once more by the boot after the last
+    reset, which took icutz away.
+    """
+    return 3 if "l" in lines else 2
+
+
+def boots_until_settled(device: Device, tell: str,
+                        again=False) -> Iterator[properties.Judged]:
+    """Boots a device until it has settled, and once more: as the model says, and with
+    every property."""
+    contents = None
+    for turn in count(1):
+        what = f"{tell}, boot {turn}"
+        _, seen = trial(device, tell=what, again=again or turn > 1)
+        judged = properties.Judged(seen)
+        found = properties.shortcomings(judged)
+        last, contents = contents, device.contents()
+        if contents == last:
+            found += properties.changed_by_a_settled_boot(judged)
+        elif turn > most_boots(judged.lines):
+            found.append(f"has not settled after {turn - 1} boots")
+        fail(what, found, seen.before)
+        yield judged
+        if contents == last:
+            return
+
+
+def recovers(name: str, device: Device, start: Entries):
+    """The boots after one of a chosen device that was disturbed."""
+    for judged in boots_until_settled(device, "afterwards", again=True):
+        found = properties.data_changes(start, judged.seen.after)
+        if name not in ABNORMAL:
+            found += properties.not_ready(judged.seen)
+        fail("afterwards", found, start)
 
 
 def expected(device: Device, condition: Condition) -> model.Outcome:

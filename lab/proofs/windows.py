@@ -1,135 +1,157 @@
 # SPDX-License-Identifier: BSD-2-Clause
-"""The windows from which later boots do not fully recover, one by one: a device is
-killed at one call and then looked at, boot by boot. Nothing here comes from the model,
-so that a change of the window is noticed even if model and program change alike."""
+"""The windows from which later boots do not fully recover, one by one, each with
+examples: a device is killed at one call and then looked at, boot by boot. Nothing in an
+example comes from the model, so that a change of the window is noticed even if model
+and program change alike."""
+
+from collections.abc import Callable
+from typing import NamedTuple
+
+import pytest
 
 from lab.carriers import boot, namespace
-from lab.words import chosen_devices, lines
+from lab.words import chosen_devices as devices
+from lab.words import lines
 from lab.words.paths import (DEFAULT_LOCALTIME, DEFAULT_ZONE, ICUTZ, LEGACY_ICUTZ,
                              LOCALTIME, RECORD, SYSTEM_ZONEINFO, TZ_LATEST, ZONEINFO,
                              update_path)
 from lab.words.seen import as_device
 
 
-def killed_before(name, path, device):
-    """Kills the program before its first call of this kind takes effect."""
-    namespace.build(device)
+class Example(NamedTuple):
+    """A device whose boot is killed before the first call `killed`. After every later
+    boot the links and the record are these, beside those of a device as it is sold;
+    the first of the boots prints `first`, all others `later`."""
+    make: Callable
+    killed: tuple
+    left: dict
+    first: list = []
+    later: list = []
+
+
+class Window(NamedTuple):
+    """Open after a kill between two changes: after the last call `opened` that was
+    carried out, and before `closed`. At `path` is then something else for good:
+    `different` compares that with the usual, and knows the calls carried out."""
+    path: str
+    opened: tuple
+    closed: tuple
+    different: Callable
+    examples: list
+
+
+AS_SOLD = {ZONEINFO: SYSTEM_ZONEINFO, LOCALTIME: ZONEINFO + "/Europe/Paris",
+           ICUTZ: None, LEGACY_ICUTZ: None, RECORD: None}
+TREE, ICU = (update_path(f"2024a.1.0/{part}") for part in ("zoneinfo", "icutz"))
+OLD_ICU, OLD_RECORD = update_path("2023d.1.0/icutz"), "2023c.1.0_2023d.1.0"
+STAYS = [[lines.NOT_NEWER % ("2024a.1.0", "2024a.1.0")]] * 2
+OLDER = [[lines.NOT_NEWER % ("2023b.1.0", "2023c.1.0")]] * 2
+
+
+def reset_for_the_schema():
+    device = devices.reset_for_the_schema_then_an_update()
+    device.drop(TZ_LATEST)
+    return device
+
+
+WINDOWS = {
+    # The next boot finds the update active, so not newer, and never links the rest.
+    "an update's zoneinfo without its ICU data": Window(
+        ICUTZ, ("symlink", ZONEINFO), ("symlink", ICUTZ),
+        lambda left, usual, _: usual is not None, [
+            Example(devices.first_activation, ("unlink", ICUTZ),
+                    {ZONEINFO: TREE}, *STAYS),
+            Example(devices.activation_after_an_update, ("unlink", ICUTZ),
+                    {ZONEINFO: TREE, ICUTZ: OLD_ICU, RECORD: OLD_RECORD}, *STAYS)]),
+    # The next boot accepts links at the system partition, whatever "icutz" names: even
+    # ICU data of a schema that the system cannot read.
+    "the system's zoneinfo with an update's ICU data": Window(
+        ICUTZ, ("symlink", ZONEINFO), ("unlink", ICUTZ),
+        lambda left, usual, _: left is not None and usual is None, [
+            Example(devices.system_overtakes_the_update, ("unlink", ICUTZ),
+                    {ICUTZ: update_path("2023b.1.0/icutz"), LEGACY_ICUTZ: "/nowhere"}),
+            Example(reset_for_the_schema, ("unlink", ICUTZ), {ICUTZ: ICU})]),
+    # Only an activation, such as that of a reset, removes it.
+    "a legacy link that dangles is kept": Window(
+        LEGACY_ICUTZ, ("symlink", ZONEINFO), ("unlink", LEGACY_ICUTZ),
+        lambda left, usual, _: usual is None, [
+            Example(devices.system_overtakes_the_update, ("unlink", LEGACY_ICUTZ),
+                    {LEGACY_ICUTZ: "/nowhere"})]),
+    # It would be, right after the reset, and be reset by the next boot. After a kill
+    # during the reset it is compared with the system's data.
+    "an update older than the system's data is not activated": Window(
+        RECORD, ("unlink", ZONEINFO), ("create", RECORD),
+        lambda left, usual, calls: left is None and usual == "2023c.1.0_2023b.1.0"
+        and calls.count(("symlink", ZONEINFO)) < 2, [
+            Example(devices.reset_then_an_update_older_than_the_system,
+                    ("unlink", ICUTZ), {ICUTZ: update_path("2023a.1.0/icutz")},
+                    *OLDER)]),
+    # The record is written last; the next boot has nothing to activate.
+    "an activation without a record": Window(
+        RECORD, ("symlink", ZONEINFO), ("create", RECORD),
+        lambda left, usual, _: left is None or left.endswith("_2023d.1.0"), [
+            Example(devices.activation_after_an_update, ("create", RECORD),
+                    {ZONEINFO: TREE, ICUTZ: ICU, RECORD: OLD_RECORD}, *STAYS)]),
+    # The file is emptied before it is written.
+    "an empty record": Window(
+        RECORD, ("create", RECORD), ("write", None), lambda left, usual, _: left == "",
+        [Example(devices.activation_after_an_update, ("write", None),
+                 {ZONEINFO: TREE, ICUTZ: ICU, RECORD: ""}, *STAYS)]),
+    # While "zoneinfo" is removed nothing tells which update was active.
+    "a record that starts from the system's release": Window(
+        RECORD, ("unlink", ZONEINFO), ("symlink", ZONEINFO),
+        lambda left, usual, _: left is not None and left.startswith("2023c.1.0_") and
+        not usual.startswith("2023c"), [
+            Example(devices.activation_after_an_update, ("symlink", ZONEINFO),
+                    {ZONEINFO: TREE, ICUTZ: ICU, RECORD: "2023c.1.0_2024a.1.0"},
+                    [lines.BAD_LINK % "", lines.INVALID_LINKS], STAYS[0])]),
+    # The link is removed before it is made again; nothing else holds the user's zone.
+    "a corrected localtime becomes the default": Window(
+        LOCALTIME, ("unlink", LOCALTIME), ("symlink", LOCALTIME),
+        lambda left, usual, _: left == DEFAULT_LOCALTIME, [
+            Example(devices.localtime_corrected, ("symlink", LOCALTIME),
+                    {LOCALTIME: DEFAULT_LOCALTIME},
+                    [lines.LOCALTIME_INVALID % DEFAULT_ZONE])]),
+}
+
+
+def window_of(path, left, usual, carried_out) -> str | None:
+    """The window that explains a difference after a kill."""
+    for name, window in WINDOWS.items():
+        if (window.path == path and window.different(left, usual, carried_out)
+                and window.opened in carried_out):
+            since = carried_out[len(carried_out) -
+                                carried_out[::-1].index(window.opened):]
+            if window.closed not in since:
+                return name
+    return None
+
+
+@pytest.mark.parametrize("example", [
+    pytest.param(example, id=f"{name}: {number}") for name, window in WINDOWS.items()
+    for number, example in enumerate(window.examples, start=1)])
+def test_an_example_of_a_window(example):
+    """It ends with the next activation; but what the zone was nobody knows."""
+    namespace.build(example.make())
     boot.traced()
     call = next(call for call in boot.pass_of(list(boot.calls()))
-                if (call.name, call.path) == (name, path))
-    namespace.build(device)
+                if (call.name, call.path) == example.killed)
+    namespace.build(example.make())
     assert boot.traced(*boot.killing(call.call, call.number)).ending == "killed"
+    for printed in (example.first, example.later, example.later):
+        booted = boot.boot()
+        assert booted.ending == "exit 0"
+        assert [line.rpartition(": ")[0] for line in booted.log.splitlines()] == [
+            lines.NAME + line for line in printed]
+        there = as_device(namespace.look()).contents()
+        assert {path: there.get(path) for path in AS_SOLD} == AS_SOLD | example.left
 
-
-def boots(*printed):
-    booted = boot.boot()
-    assert booted.ending == "exit 0"
-    assert [line.rpartition(": ")[0] for line in booted.log.splitlines()] == [
-        lines.NAME + line for line in printed]
-
-
-def there_is(zoneinfo=SYSTEM_ZONEINFO, icutz=None, record=None,
-             localtime=ZONEINFO + "/Europe/Paris", legacy=None):
-    """Targets of links, and what is recorded."""
     device = as_device(namespace.look())
-    for path, text in ((ZONEINFO, zoneinfo), (ICUTZ, icutz), (LOCALTIME, localtime),
-                       (LEGACY_ICUTZ, legacy), (RECORD, record)):
-        node = device.find(path)
-        assert (path, node and node.text) == (path, text)
-
-
-def stays(*printed, **there):
-    for _ in range(3):
-        boots(*printed)
-        there_is(**there)
-
-
-UPDATE = update_path("2024a.1.0")
-UPDATE_TWICE = lines.NOT_NEWER % ("2024a.1.0", "2024a.1.0")
-
-
-def test_an_update_s_zoneinfo_without_its_icu_data():
-    """Activation links the two components one after the other. In between, the
-    next boot finds the update active, and so not newer, and never links the rest:
-    readers have the update's zoneinfo and the ICU data of before, until an update
-    that is newer still is activated, or the links are reset."""
-    killed_before("unlink", ICUTZ, chosen_devices.first_activation())
-    there_is(zoneinfo=UPDATE + "/zoneinfo")
-    stays(UPDATE_TWICE, zoneinfo=UPDATE + "/zoneinfo")
-
-    newer = as_device(namespace.look())
-    newer.install_update("2024b.1.0")
-    newer.announce("2024b.1.0")
-    namespace.build(newer)
-    boots()
-    there_is(zoneinfo=update_path("2024b.1.0/zoneinfo"),
-             icutz=update_path("2024b.1.0/icutz"), record="2024a.1.0_2024b.1.0")
-
-
-def test_an_update_s_zoneinfo_with_an_older_update_s_icu_data():
-    killed_before("unlink", ICUTZ, chosen_devices.activation_after_an_update())
-    stays(UPDATE_TWICE, zoneinfo=UPDATE + "/zoneinfo",
-          icutz=update_path("2023d.1.0/icutz"), record="2023c.1.0_2023d.1.0")
-
-
-def test_the_system_s_zoneinfo_with_an_update_s_icu_data():
-    """A reset links the zoneinfo tree before it removes the ICU link. In between,
-    the next boot finds the links at the system partition, which is accepted
-    whatever "icutz" names: ICU data that may even be of a schema that the system
-    cannot read stays linked until an update is activated."""
-    killed_before("unlink", ICUTZ, chosen_devices.system_overtakes_the_update())
-    stays(icutz=update_path("2023b.1.0/icutz"), legacy="/nowhere")
-
-
-def test_the_system_s_zoneinfo_with_icu_data_of_another_schema():
-    device = chosen_devices.reset_for_the_schema_then_an_update()
-    device.drop(TZ_LATEST)
-    killed_before("unlink", ICUTZ, device)
-    stays(icutz=UPDATE + "/icutz")
-
-
-def test_a_legacy_link_that_dangles_is_kept():
-    """Only an activation, such as that of a reset, removes it."""
-    killed_before("unlink", LEGACY_ICUTZ, chosen_devices.system_overtakes_the_update())
-    stays(legacy="/nowhere")
-
-
-def test_an_activation_without_a_record():
-    """The record is written last; the next boot has nothing to activate."""
-    killed_before("create", RECORD, chosen_devices.activation_after_an_update())
-    stays(UPDATE_TWICE, zoneinfo=UPDATE + "/zoneinfo", icutz=UPDATE + "/icutz",
-          record="2023c.1.0_2023d.1.0")
-
-
-def test_an_empty_record():
-    """The file is emptied before it is written."""
-    killed_before("write", None, chosen_devices.activation_after_an_update())
-    stays(UPDATE_TWICE, zoneinfo=UPDATE + "/zoneinfo", icutz=UPDATE + "/icutz",
-          record="")
-
-
-def test_a_record_that_starts_from_the_system_s_release():
-    """While "zoneinfo" is removed nothing tells which update was active."""
-    killed_before("symlink", ZONEINFO, chosen_devices.activation_after_an_update())
-    boots(lines.BAD_LINK % "", lines.INVALID_LINKS)
-    there_is(zoneinfo=UPDATE + "/zoneinfo", icutz=UPDATE + "/icutz",
-             record="2023c.1.0_2024a.1.0")
-
-
-def test_an_update_older_than_the_system_s_data_is_not_activated():
-    """It would be, right after the reset, and be reset by the next boot; after a
-    kill during the reset it is compared with the system's data and refused."""
-    killed_before("unlink", ICUTZ,
-                  chosen_devices.reset_then_an_update_older_than_the_system())
-    stays(lines.NOT_NEWER % ("2023b.1.0", "2023c.1.0"),
-          icutz=update_path("2023a.1.0/icutz"))
-
-
-def test_a_corrected_localtime_becomes_the_default():
-    """The link is removed before it is made again, and nothing else holds the
-    user's zone."""
-    killed_before("symlink", LOCALTIME, chosen_devices.localtime_corrected())
-    there_is(localtime=None)
-    boots(lines.LOCALTIME_INVALID % DEFAULT_ZONE)
-    there_is(localtime=DEFAULT_LOCALTIME)
-    boots()
+    device.install_update("2024c.1.0")
+    device.announce("2024c.1.0")
+    namespace.build(device)
+    assert boot.boot() == ("exit 0", "")
+    there = as_device(namespace.look()).contents()
+    assert there[ZONEINFO] == update_path("2024c.1.0/zoneinfo")
+    assert there[ICUTZ] == update_path("2024c.1.0/icutz")
+    assert there[RECORD].endswith("_2024c.1.0") and LEGACY_ICUTZ not in there
