@@ -12,12 +12,12 @@ from errno import (EAGAIN, EDQUOT, EEXIST, EINTR, EIO, EMLINK, ENOLCK, ENOSPC,
 import pytest
 
 from lab.carriers import boot, namespace
+from lab.oracles.conditions import refusals
 from lab.oracles.installer import (BUSY, DONE, FAILED, HIDDEN, NEW, NOT_NEWER, PROGRAM,
                                    SCENES, announced, calls, hidden, names, next_boot,
                                    runs_again, traced, violations)
 from lab.oracles.trial import fail
 from lab.proofs.faults import CHANGE, ERRORS, LASTING, OPEN
-from lab.proofs.memory import refusals
 from lab.words.paths import DOWNLOADS, update_path
 
 MORE = {
@@ -101,16 +101,16 @@ def test_a_call_that_fails(scene, call, error, when, telling, count):
 def test_memory_is_refused(scene, count):
     make, words = SCENES[scene]
     namespace.build(make())
-    for options in refusals([PROGRAM, *words]):
+    for condition in refusals(PROGRAM, *words):
         namespace.build(make())
         before = namespace.look()
-        told = traced(words, *options)
+        told = traced(words, *condition.options())
         after = namespace.look()
         found = violations(words, before, after)
         failed = told.ending == FAILED
         if not failed and told.ending != DONE or told.log.count("\n") != failed:
             found.append("this is not one line and its status")
-        fail(f"{told} with {options[-1]}", found, before)
+        fail(f"{told}, {condition.name}", found, before)
         count(f"refusals of memory that end with {told.ending}")
         runs_again(words, before)
 
