@@ -127,11 +127,10 @@ TOOLS = {
     # A sanitizer makes calls of its own.
     "sanitizers": Tool(BUILD / "asan", "asan", "-fsanitize=address",
                        "-WholeListOfCalls.*", sanitized),
-    # valgrind itself exceeds limits of file sizes; and there is a number of texts that
-    # takes an hour.
+    # valgrind itself exceeds limits of file sizes.
     "memcheck": Tool(
         BUILD / "memcheck", "dev", "-g",
-        "-*OnAMillion*:*CannotBeWrittenWhole*:WholeListOfCalls.*", memchecked),
+        "-*CannotBeWrittenWhole*:WholeListOfCalls.*", memchecked),
 }
 
 

@@ -125,65 +125,56 @@ TEST_F(IcuSchema, LeavesTheWorkingDirectoryAlone) {
   EXPECT_STREQ(::getcwd(after, sizeof after), "/usr/share");
 }
 
-struct useless {
-  const char* name;
-  std::function<void()> make;
-};
-void PrintTo(const useless& shown, std::ostream* out) { *out << shown.name; }
-
-// What may be in the place of an update's ICU data without being any.
-class NoIcuSchema : public IcuSchema,
-                    public ::testing::WithParamInterface<useless> {};
-
-TEST_P(NoIcuSchema, IsFoundIn) {
-  make_directory(update_path);
-  GetParam().make();
-  EXPECT_THAT(printed_by([] { EXPECT_EQ(of_update(), ""); }),
-              lines(no_schema_in("/var/db/timezone/tz/2024a.1.0")));
-}
-
 const std::string data_file = icu_directory + "/icutz44l.dat";
 
-const useless useless_data[] = {
-    {"NoDirectory", [] {}},
-    {"AnEmptyDirectory", [] { make_directory(icu_directory); }},
-    {"AFileForADirectory", [] { make_file(icu_directory); }},
-    {"ALinkToADataFileForADirectory",
-     [] {
-       make_file("/var/db/timezone/icutz44l.dat");
-       make_link(icu_directory, "/var/db/timezone/icutz44l.dat");
-     }},
-    {"ADanglingLinkForADirectory",
-     [] { make_link(icu_directory, "/var/db/gone"); }},
-    {"ADirectoryThatMayNotBeRead",
-     [] {
-       make_file(data_file);
-       set_mode(icu_directory, 0311);
-     }},
-    {"ADirectoryThatMayNotBeSearched",
-     [] {
-       make_file(data_file);
-       set_mode(icu_directory, 0644);
-     }},
-    {"AFormatFile",
-     [] { make_file(icu_directory + "/icutzformat.txt", "44l"); }},
-    {"ANameThatOnlyLooksLikeIt",
-     [] { make_file(icu_directory + "/icutz44l.dat.bak"); }},
-    {"ASubdirectory", [] { make_file(icu_directory + "/below/icutz44l.dat"); }},
-    {"ALinkToADataFile",
-     [] {
-       make_file(icu_directory + "/below/icutz44l.dat");
-       make_link(data_file, "below/icutz44l.dat");
-     }},
-    {"ADirectoryForADataFile", [] { make_directory(data_file); }},
-    {"AFifoForADataFile", [] { make_fifo(data_file); }},
-    {"AFileThatOthersMayNotRead", [] { make_file(data_file, "", 0770); }},
-};
-
-INSTANTIATE_TEST_SUITE_P(, NoIcuSchema, ::testing::ValuesIn(useless_data),
-                         [](const auto& shown) {
-                           return std::string(shown.param.name);
-                         });
+// What may be in the place of an update's ICU data without being any.
+TEST_F(IcuSchema, IsNotFoundInWhatOnlyLooksLikeData) {
+  const std::pair<const char*, std::function<void()>> useless[] = {
+      {"no directory", [] {}},
+      {"an empty directory", [] { make_directory(icu_directory); }},
+      {"a file for a directory", [] { make_file(icu_directory); }},
+      {"a link to a data file for a directory",
+       [] {
+         make_file("/var/db/timezone/icutz44l.dat");
+         make_link(icu_directory, "/var/db/timezone/icutz44l.dat");
+       }},
+      {"a dangling link for a directory",
+       [] { make_link(icu_directory, "/var/db/gone"); }},
+      {"a directory that may not be read",
+       [] {
+         make_file(data_file);
+         set_mode(icu_directory, 0311);
+       }},
+      {"a directory that may not be searched",
+       [] {
+         make_file(data_file);
+         set_mode(icu_directory, 0644);
+       }},
+      {"a format file",
+       [] { make_file(icu_directory + "/icutzformat.txt", "44l"); }},
+      {"a name that only looks like it",
+       [] { make_file(icu_directory + "/icutz44l.dat.bak"); }},
+      {"a subdirectory",
+       [] { make_file(icu_directory + "/below/icutz44l.dat"); }},
+      {"a link to a data file",
+       [] {
+         make_file(icu_directory + "/below/icutz44l.dat");
+         make_link(data_file, "below/icutz44l.dat");
+       }},
+      {"a directory for a data file", [] { make_directory(data_file); }},
+      {"a FIFO for a data file", [] { make_fifo(data_file); }},
+      {"a file that others may not read",
+       [] { make_file(data_file, "", 0770); }},
+  };
+  for (const auto& [name, make] : useless) {
+    SCOPED_TRACE(name);
+    wipe(update_path);
+    make_directory(update_path);
+    make();
+    EXPECT_THAT(printed_by([] { EXPECT_EQ(of_update(), ""); }),
+                lines(no_schema_in("/var/db/timezone/tz/2024a.1.0")));
+  }
+}
 
 TEST_F(IcuCompatibility, AsksForTheSameSchemaByteForByte) {
   install_system("2023c", "44l");

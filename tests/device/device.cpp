@@ -1,7 +1,6 @@
 // SPDX-License-Identifier: BSD-2-Clause
 #include "tests/device/device.h"
 
-#include <dirent.h>
 #include <fcntl.h>
 #include <linux/close_range.h>
 #include <linux/magic.h>
@@ -19,7 +18,6 @@
 #include <cstring>
 #include <filesystem>
 #include <fstream>
-#include <iomanip>
 #include <iostream>
 #include <sstream>
 #include <stdexcept>
@@ -42,10 +40,8 @@ std::string bytes_of(const std::string& path) {
 }
 
 std::string target_of(const std::string& path) {
-  std::string target(4096, '\0');
-  const ssize_t length = ::readlink(path.c_str(), target.data(), target.size());
-  target.resize(length < 0 ? 0 : static_cast<std::size_t>(length));
-  return target;
+  std::error_code unreadable;
+  return fs::read_symlink(path, unreadable);
 }
 
 long nanoseconds(const timespec& time) {
@@ -61,13 +57,9 @@ void look_below(const std::string& path, snapshot& seen) {
   seen[path] = {status.st_mode, status.st_ino, nanoseconds(status.st_mtim),
                 nanoseconds(status.st_ctim), content};
   if (!S_ISDIR(status.st_mode)) return;
-  DIR* const directory = ::opendir(path.c_str());
-  if (directory == nullptr) return;
-  while (const dirent* const found = ::readdir(directory)) {
-    const std::string name = found->d_name;
-    if (name != "." && name != "..") look_below(path + "/" + name, seen);
-  }
-  ::closedir(directory);
+  std::error_code closed;
+  for (const auto& child : fs::directory_iterator(path, closed))
+    look_below(child.path(), seen);
 }
 
 std::string describe(const std::string& path, mode_t wanted,
@@ -172,44 +164,6 @@ void wipe(const std::string& path) {
   fs::remove(path);
 }
 
-lease::lease(const std::string& path) {
-  int ready[2];
-  must(::pipe(ready) == 0, "make a pipe");
-  sigset_t asked;
-  sigemptyset(&asked);
-  sigaddset(&asked, SIGIO);
-  sigset_t before;
-  ::sigprocmask(SIG_BLOCK, &asked, &before);
-  holder_ = ::fork();
-  must(holder_ >= 0, "fork");
-  if (holder_ == 0) {
-    const int file = ::open(path.c_str(), O_RDWR);
-    const char took = ::fcntl(file, F_SETLEASE, F_WRLCK) == 0 ? 'y' : 'n';
-    if (::write(ready[1], &took, 1) != 1) ::_exit(2);
-    int signal = 0;
-    ::sigwait(&asked, &signal);
-    ::fcntl(file, F_SETLEASE, F_UNLCK);
-    ::_exit(0);
-  }
-  ::sigprocmask(SIG_SETMASK, &before, nullptr);
-  char took = 'n';
-  must(::read(ready[0], &took, 1) == 1 && took == 'y', "lease " + path);
-  ::close(ready[0]);
-  ::close(ready[1]);
-}
-
-lease::~lease() {
-  ::kill(holder_, SIGKILL);
-  ::waitpid(holder_, nullptr, 0);
-}
-
-bool lease::was_asked_for() const {
-  siginfo_t ended{};
-  return ::waitid(P_PID, static_cast<id_t>(holder_), &ended,
-                  WEXITED | WNOWAIT) == 0 &&
-         ended.si_code == CLD_EXITED && ended.si_status == 0;
-}
-
 void install_system(const std::string& release, const std::string& format) {
   wipe(system_tree);
   make_file(system_tree + "/+VERSION", release + "\n");
@@ -263,8 +217,8 @@ void point_localtime_at(const std::string& target) {
 }
 
 void PrintTo(const entry& shown, std::ostream* out) {
-  *out << "inode " << shown.inode << ", mode " << std::oct << shown.mode
-       << std::dec << ", changed " << shown.changed << ", \""
+  *out << "mode " << std::oct << shown.mode << std::dec << ", inode "
+       << shown.inode << ", changed " << shown.changed << ", \""
        << shown.content.substr(0, 80) << "\"";
 }
 
@@ -279,11 +233,8 @@ snapshot look_at_everything() { return look_at({"/var/db", "/usr/share"}); }
 std::string listing() {
   std::ostringstream out;
   for (const auto& [path, shown] : look_at_everything()) {
-    out << "  " << std::oct << std::setw(6) << shown.mode << std::dec << " "
-        << path;
-    if (S_ISLNK(shown.mode)) out << " -> " << shown.content.substr(0, 200);
-    if (S_ISREG(shown.mode))
-      out << " \"" << shown.content.substr(0, 60) << "\"";
+    out << "  " << path << ": ";
+    PrintTo(shown, &out);
     out << "\n";
   }
   return out.str();

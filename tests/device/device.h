@@ -72,20 +72,6 @@ void install_and_use(const std::string& version, const std::string& schema);
 void point_zoneinfo_at(const std::string& target);
 void point_localtime_at(const std::string& target);
 
-// Another process has a lease on a file, and gives it up when it is asked to,
-// as a conflicting open(2) asks.
-class lease {
- public:
-  explicit lease(const std::string& path);
-  ~lease();
-  lease(const lease&) = delete;
-  lease& operator=(const lease&) = delete;
-  bool was_asked_for() const;
-
- private:
-  pid_t holder_;
-};
-
 // --- Looking at it ---------------------------------------------------------
 
 struct entry {

@@ -68,31 +68,14 @@ TEST_F(VersionRecord, IsQuietlyLeftOutWhenItCannotBeOpened) {
   EXPECT_EQ(file_at(record), nothing);
 }
 
-TEST_F(VersionRecord, IsNotWrittenToAFifoWhetherOrNotSomebodyReads) {
+TEST_F(VersionRecord, IsNotWrittenToAFifoThatIsReadNorToASocket) {
   make_fifo(record);
-  quietly(write);
   const int reader = ::open(record.c_str(), O_RDONLY | O_NONBLOCK);
   ASSERT_GE(reader, 0);
   quietly(write);
   char byte = 0;
   EXPECT_EQ(::read(reader, &byte, 1), 0);
   ::close(reader);
-}
-
-TEST_F(VersionRecord, IsNotWrittenToATerminal) {
-  const int terminal = ::posix_openpt(O_RDWR | O_NOCTTY);
-  ASSERT_GE(terminal, 0);
-  ASSERT_EQ(::grantpt(terminal), 0);
-  ASSERT_EQ(::unlockpt(terminal), 0);
-  make_link(record, ::ptsname(terminal));
-  quietly(write);
-  ASSERT_EQ(::fcntl(terminal, F_SETFL, O_NONBLOCK), 0);
-  char byte = 0;
-  EXPECT_LT(::read(terminal, &byte, 1), 0);
-  ::close(terminal);
-}
-
-TEST_F(VersionRecord, IsNotWrittenToASocketWhoseErrorStays) {
   make_socket(record);
   quietly([] {
     write();
@@ -108,14 +91,6 @@ TEST_F(VersionRecord, LeavesTheErrorOfAnEarlierCall) {
     write();
     EXPECT_EQ(errno, error);
   }
-}
-
-TEST_F(VersionRecord, OfALeasedFileIsWrittenOnceTheLeaseIsGivenUp) {
-  make_file(record, "old");
-  const lease held(record);
-  write();
-  EXPECT_TRUE(held.was_asked_for());
-  EXPECT_EQ(file_at(record), "2023c.1.0_2024a.1.0");
 }
 
 TEST_F(VersionRecord, LeavesNoDescriptorOpen) {
