@@ -15,7 +15,6 @@ made to fail. The sections go from the bottom up.
 """
 
 import functools
-import os
 import re
 from contextlib import suppress
 from errno import (EEXIST, EINVAL, EISDIR, ENAMETOOLONG, ENOENT, ENOTDIR, ENOTEMPTY,
@@ -63,8 +62,6 @@ class Kernel:
         self.calls = []  # (name, path)
         self.last_error = None  # the start-up of the process leaves anything
         self.changed = set()  # nodes that a call changed, made or removed
-        # A walk that cannot be started takes a lack of memory, not a failing call.
-        self.walk_error = lambda path: None
 
     @system_call
     def _call(self, name, path=None):
@@ -327,14 +324,7 @@ class Boot:
     def icu_schema(self, dataset_path):
         """The schema of an update: that of the first data file, in listing order;
         empty where there is none."""
-        icu_path = dataset_path + "/icutz"
-        error = self.kernel.walk_error(icu_path)
-        if error is not None:
-            # The text of the error stands twice: once here, once from warn itself.
-            self.kernel.last_error = error
-            self.warn(lines.WALK_NOT_STARTED, icu_path, os.strerror(error))
-            raise Thrown
-        schema = self.walk(icu_path, schema_of_data_file)
+        schema = self.walk(dataset_path + "/icutz", schema_of_data_file)
         if not schema:
             self.warn(lines.NO_SCHEMA, dataset_path)
         return schema
