@@ -35,6 +35,9 @@ CONTENT = dict(reversed(line.split(maxsplit=1)) for line in """
     755 /usr/libexec/marlin
     755 /usr/libexec/marlin-mend
     755 /usr/sbin/marlin-install
+    644 /usr/share/bash-completion/completions/marlin-install
+    644 /usr/share/bash-completion/completions/marlin-mend
+    644 /usr/share/bash-completion/completions/marlin-status
     644 /usr/share/doc/marlin/README.md
     644 /usr/share/doc/marlin/SECURITY.md
     644 /usr/share/doc/marlin/changelog.gz
@@ -56,6 +59,7 @@ CONTENT = dict(reversed(line.split(maxsplit=1)) for line in """
     644 /usr/share/man/man8/marlin-install.8.gz
     644 /usr/share/man/man8/marlin-mend.8.gz
     644 /usr/share/man/man8/marlin.8.gz
+    644 /usr/share/marlin/marlin-status.schema.json
 """.strip().splitlines())
 
 

@@ -16,7 +16,15 @@ endif()
 if(TARGET marlin-status)
   install(TARGETS marlin-status RUNTIME DESTINATION ${CMAKE_INSTALL_BINDIR})
   install(FILES docs/marlin-status.8 DESTINATION ${CMAKE_INSTALL_MANDIR}/man8)
+  install(FILES docs/marlin-status.schema.json
+          DESTINATION ${CMAKE_INSTALL_DATADIR}/marlin)
 endif()
+foreach(command marlin-install marlin-mend marlin-status)
+  if(TARGET ${command})
+    install(FILES packaging/completion RENAME ${command}
+            DESTINATION ${CMAKE_INSTALL_DATADIR}/bash-completion/completions)
+  endif()
+endforeach()
 install(FILES docs/marlin-layout.5 DESTINATION ${CMAKE_INSTALL_MANDIR}/man5)
 
 if(MARLIN_UNIT_DIR)
