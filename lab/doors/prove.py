@@ -82,8 +82,11 @@ def main() -> int:
     (BUILD / "prove").mkdir(exist_ok=True)
     if os.geteuid() == 0:
         # To a user without privileges any file of the machine is another's.
-        (BUILD / "prove/foreign").touch()
-        os.chown(BUILD / "prove/foreign", 1, 1)
+        foreign = BUILD / "prove/another-users"
+        foreign.mkdir(exist_ok=True)
+        (foreign / "file").touch()
+        os.chown(foreign, 1, 1)
+        os.chown(foreign / "file", 1, 1)
     build_program()
     if makes:
         try:

@@ -6,7 +6,6 @@
 
 #include <nlohmann/json.hpp>
 
-#include "tools/status/mounts.h"
 #include "tools/status/report.h"
 #include "tools/status/words.h"
 
@@ -15,44 +14,10 @@ namespace {
 using testing::AllOf;
 using testing::AnyOf;
 using testing::Each;
-using testing::ElementsAre;
 using testing::Ge;
 using testing::HasSubstr;
-using testing::IsEmpty;
 using testing::Le;
 using testing::Not;
-
-std::string mount_at(const std::string& place) {
-  return "36 35 98:0 / " + place + " rw,noatime - ext4 /dev/root rw\n";
-}
-
-TEST(MountsBelow, AreThoseInsideTheDirectory) {
-  EXPECT_THAT(mounts_below(mount_at("/a/b") + mount_at("/a") + mount_at("/ab") +
-                               mount_at("/"),
-                           "/a"),
-              ElementsAre("/a/b"));
-}
-
-TEST(MountsBelow, ComeParentsFirstAndOnce) {
-  EXPECT_THAT(mounts_below(mount_at("/a/b/c") + mount_at("/a/b") +
-                               mount_at("/a/b") + mount_at("/a/b/c/d"),
-                           "/a"),
-              ElementsAre("/a/b", "/a/b/c", "/a/b/c/d"));
-}
-
-TEST(MountsBelow, AreDecoded) {
-  EXPECT_THAT(mounts_below(mount_at("/a/x\\040y\\134z\\012"), "/a"),
-              ElementsAre("/a/x y\\z\n"));
-  EXPECT_THAT(mounts_below(mount_at("/a/x\\04"), "/a"),
-              ElementsAre("/a/x\\04"));
-  EXPECT_THAT(mounts_below(mount_at("/a/x\\189"), "/a"),
-              ElementsAre("/a/x\\189"));
-}
-
-TEST(MountsBelow, AreNoneInWhatIsNotAList) {
-  EXPECT_THAT(mounts_below("", "/a"), IsEmpty());
-  EXPECT_THAT(mounts_below("\n\n1 2 3\n/a/b /a/b\n", "/a"), IsEmpty());
-}
 
 std::string all_bytes() {
   std::string bytes;
@@ -70,7 +35,7 @@ report hostile() {
   told.device.system.version_text = all_bytes();
   told.device.system.version.year = 1;
   told.device.system.schema = all_bytes();
-  told.device.system.unreadable = {all_bytes()};
+  told.device.system.unreadable = {{all_bytes(), "not there"}};
   told.device.update = told.device.system;
   told.device.update->path = all_bytes();
   told.device.downloads = {{all_bytes(), {"zoneinfo"}}};

@@ -40,7 +40,8 @@ constexpr std::string_view walk_failed =
 struct row {
   std::string_view name, does, reason;
   verdict is;
-  // "%1" and "%2" are texts of the device, "%e" the text of an error.
+  // "%1" and "%2" are texts of the device, "%e" the text of an error. A reset
+  // of the links is told behind it.
   std::string_view text;
 };
 
@@ -68,34 +69,23 @@ constexpr row table[] = {
      "/var/db/icu cannot be looked at"},
     {"old_icu", "kept", "not_removed", wrong, "/var/db/icu cannot be removed"},
 
-    {"current", "not_reached", "earlier_failure", wrong, "not looked at"},
     {"current", "read", "system", sound, "zoneinfo names the system partition"},
     {"current", "read", "update", sound, "zoneinfo names the update %1"},
-    {"current", "reset", "no_link", changes,
-     "there is no link zoneinfo: a reset to the system partition"},
-    {"current", "reset", "bad_target", wrong,
-     "zoneinfo names no data set: a reset to the system partition"},
+    {"current", "reset", "no_link", changes, "there is no link zoneinfo"},
+    {"current", "reset", "bad_target", wrong, "zoneinfo names no data set"},
     {"current", "reset", "changed_by_the_boot", wrong,
-     "zoneinfo is reached through a link that the boot has just changed: a "
-     "reset to the system partition"},
-    {"current", "reset", "not_a_link", wrong,
-     "zoneinfo is not a link: a reset to the system partition"},
-    {"current", "reset", "unreadable", wrong,
-     "zoneinfo cannot be read: a reset to the system partition"},
+     "zoneinfo is reached through a link that the boot has just changed"},
+    {"current", "reset", "not_a_link", wrong, "zoneinfo is not a link"},
+    {"current", "reset", "unreadable", wrong, "zoneinfo cannot be read"},
 
-    {"usable", "not_reached", "earlier_failure", wrong, "not looked at"},
     {"usable", "kept", "fits", sound, "it fits the system"},
-    {"usable", "reset", "other_schema", wrong,
-     "it has %1, the system has %2: a reset to the system partition"},
+    {"usable", "reset", "other_schema", wrong, "it has %1, the system has %2"},
     {"usable", "reset", "older_than_system", wrong,
-     "it is %1, older than the system's %2: a reset to the system partition"},
+     "it is %1, older than the system's %2"},
     {"usable", "reset", "changed_by_the_boot", wrong,
-     "its data is reached through a link that the boot has just changed: a "
-     "reset to the system partition"},
-    {"usable", "reset", "no_version", wrong,
-     "its name %1 is no version: a reset to the system partition"},
+     "its data is reached through a link that the boot has just changed"},
+    {"usable", "reset", "no_version", wrong, "its name %1 is no version"},
 
-    {"update", "not_reached", "earlier_failure", wrong, "not looked at"},
     {"update", "nothing", "none", sound, "none is announced"},
     {"update", "refused", "same_set", sound, "%1 is in use already"},
     {"update", "refused", "other_schema", wrong, "%1 is refused: it has %2"},
@@ -131,7 +121,6 @@ constexpr row table[] = {
     {"last_resort", "reset", "walk_failed", wrong,
      "an ICU directory cannot be searched"},
 
-    {"localtime", "not_reached", "earlier_failure", wrong, "not looked at"},
     {"localtime", "kept", "accepted", sound, "the link is kept"},
     {"localtime", "corrected", "former_place", changes,
      "the link is corrected to %1"},
@@ -150,6 +139,21 @@ constexpr row table[] = {
      "it cannot be read: the default zone is set"},
     {"localtime", "failed", "not_made", wrong,
      "the default link cannot be made: %e"},
+
+    {"boot", "found", "abnormal_end", wrong, "it ends abnormally: %1"},
+    {"system", "found", "no_version", wrong, "its data has no version"},
+    {"system", "found", "no_schema", wrong, "its data has no ICU schema"},
+    {"links", "found", "update_without_icu", wrong, "after the boot %1"},
+    {"links", "found", "update_with_other_icu", wrong, "after the boot %1"},
+    {"links", "found", "system_with_icu", wrong, "after the boot %1"},
+    {"links", "found", "not_the_tree", wrong, "after the boot %1"},
+    {"links", "found", "no_dataset", wrong, "after the boot %1"},
+    {"links", "found", "not_writable", wrong,
+     "no boot can write in /var/db/timezone"},
+    {"links", "found", "closed", wrong,
+     "only root can read what is in use: %1 is closed to others"},
+    {"local_zone", "found", "missing", wrong,
+     "its file cannot be reached after the boot"},
 };
 
 constexpr bool is_once_in_the_table(const row& one) {
@@ -192,8 +196,10 @@ class account {
     select();
     localtime();
     if (!boot_.ends_normally)
-      is_wrong("the boot ends abnormally: " + boot_.thrown);
+      add("boot", "found", "abnormal_end", boot_.thrown);
     state_afterwards();
+    if (told_.is == sound && !(after_ == device_.links))
+      throw std::logic_error("a change without a reason");
     return std::move(told_);
   }
 
@@ -215,9 +221,9 @@ class account {
     return said != nullptr && said->format == cause;
   }
 
-  void is_wrong(const std::string& reason) {
-    told_.is = wrong;
-    told_.reasons.push_back(reason);
+  void skip(const std::string& name) {
+    told_.steps.push_back(
+        {name, "not_reached", "earlier_failure", "not looked at"});
   }
 
   void add(std::string_view name, std::string_view does,
@@ -229,21 +235,21 @@ class account {
                  known.reason == reason;
         });
     if (found == std::end(table)) throw std::logic_error("no such reason");
-    std::string text;
+    step done{std::string(name), std::string(does), std::string(reason), {}};
     for (std::size_t i = 0; i < found->text.size(); ++i) {
       if (found->text[i] != '%') {
-        text += found->text[i];
+        done.text += found->text[i];
         continue;
       }
       const char what = found->text[++i];
-      text += what == 'e' ? std::strerror(error)
-                          : escaped(what == '1' ? first : second);
+      done.text += what == 'e' ? std::strerror(error)
+                               : escaped(what == '1' ? first : second);
     }
-    if (found->is != sound && does != "not_reached")
-      told_.reasons.push_back(text);
+    if (does == "reset" && (name == "current" || name == "usable"))
+      done.text += ": a reset to the system partition";
     told_.is = std::max(told_.is, found->is);
-    told_.steps.push_back(
-        {std::string(name), std::string(does), std::string(reason), text});
+    if (found->is != sound) told_.reasons.push_back(done);
+    if (does != "found") told_.steps.push_back(done);
   }
 
   void legacy_icu_link() {
@@ -335,7 +341,7 @@ class account {
   }
 
   void current(bool not_reached) {
-    if (not_reached) return add("current", "not_reached", "earlier_failure");
+    if (not_reached) return skip("current");
     if (!has(lines::invalid_links)) {
       const std::string& path = device_.links.current_path.value();
       return add("current", "read", path.empty() ? "system" : "update", path);
@@ -354,7 +360,7 @@ class account {
 
   void usable(bool not_reached) {
     const dataset_facts& set = compared();
-    if (not_reached) return add("usable", "not_reached", "earlier_failure");
+    if (not_reached) return skip("usable");
     if (!has(lines::incompatible)) return add("usable", "kept", "fits");
     if (!set.fits_system)
       return add("usable", "reset", "other_schema", schema_of(set),
@@ -368,12 +374,13 @@ class account {
   }
 
   void update(bool not_reached, bool failed) {
-    if (not_reached) return add("update", "not_reached", "earlier_failure");
+    if (not_reached) return skip("update");
     if (failed)
       return add("update", "failed", "last_resort",
                  device_.links.tz_latest.text);
-    if (!device_.update) return add("update", "nothing", "none");
-    const dataset_facts& set = *device_.update;
+    if (!device_.update && !has(lines::refused))
+      return add("update", "nothing", "none");
+    const dataset_facts& set = device_.update.value();
     const dataset_facts& in_use = compared();
     if (!has(lines::refused))
       return add("update", "activated", "newer", set.version_text,
@@ -398,7 +405,9 @@ class account {
       return add("record", "nothing", "no_activation");
     const dataset_facts& active =
         has(lines::incompatible) ? device_.system : compared();
-    if (!after_.is_recordable)
+    const link_facts& before = device_.links;
+    if (!after_.recorded ||
+        (after_.recorded == before.recorded && after_.record == before.record))
       return add("record", "not_written", "not_opened");
     add("record", "written", "activation",
         active.version_text + "_" + device_.update->version_text);
@@ -414,8 +423,7 @@ class account {
   void localtime() {
     const char* const name = "localtime";
     const bool is_invalid = has(lines::localtime_invalid);
-    if (!boot_.ends_normally && !is_invalid)
-      return add(name, "not_reached", "earlier_failure");
+    if (!boot_.ends_normally && !is_invalid) return skip(name);
     if (!boot_.ends_normally)
       return add(name, "failed", "not_made", {}, {}, boot_.lines.back().error);
     if (!is_invalid) {
@@ -432,16 +440,17 @@ class account {
   // What no later boot mends either.
   void state_afterwards() {
     if (device_.system.ends == dataset_facts::state::number_too_large) return;
-    if (!device_.system.has_version())
-      is_wrong("the system partition's data has no version");
-    if (device_.system.schema.empty())
-      is_wrong("the system partition's data has no ICU schema");
+    if (!device_.system.has_version()) add("system", "found", "no_version");
+    if (device_.system.schema.empty()) add("system", "found", "no_schema");
     if (!boot_.ends_normally) return;
-    if (after_.pair != link_pair::system && after_.pair != link_pair::update)
-      is_wrong(std::string("after the boot ") +
-               words_for(after_.pair).sentence);
-    if (!after_.zone_is_file)
-      is_wrong("the local zone's file cannot be reached after the boot");
+    if (!fits(after_.pair))
+      add("links", "found", words_for(after_.pair).name,
+          words_for(after_.pair).sentence);
+    if (!after_.is_writable && device_.has_known_owner)
+      add("links", "found", "not_writable");
+    if (const std::string closed = closed_part(); !closed.empty())
+      add("links", "found", "closed", closed);
+    if (!after_.zone_is_file) add("local_zone", "found", "missing");
   }
 
   const device_facts& device_;
@@ -454,6 +463,12 @@ class account {
 };
 
 }  // namespace
+
+std::string step::sentence() const {
+  std::string words = name;
+  std::replace(words.begin(), words.end(), '_', ' ');
+  return words + ": " + text;
+}
 
 explanation explain(const device_facts& device, const rehearsal& boot,
                     const link_facts& after) {

@@ -21,12 +21,16 @@ struct step {
   std::string does;    // such as "refused"
   std::string reason;  // such as "older"; together they name a row of the table
   std::string text;    // the same for a person, device texts escaped
+
+  std::string sentence() const;  // the text, after the name in words
 };
 
 struct explanation {
   std::vector<step> steps{};  // in the order of the boot
   verdict is = verdict::sound;
-  std::vector<std::string> reasons{};  // for a verdict other than sound
+  // For a verdict other than sound: of the steps, and what is found beside
+  // them.
+  std::vector<step> reasons{};
 };
 
 // `after` is what read_links() gives when the boot is over. Throws

@@ -8,10 +8,13 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <climits>
+#include <cstdlib>
 #include <cstring>
-#include <functional>
+#include <map>
 #include <memory>
 #include <new>
+#include <set>
 #include <stdexcept>
 #include <utility>
 
@@ -26,16 +29,15 @@ namespace {
 
 constexpr std::size_t longest_text = 4096;   // of a link or a record
 constexpr std::size_t longest_word = 65536;  // of a version or a schema
-constexpr std::size_t most_names = 10000;
 // How an owner appears whom this user namespace does not have.
 constexpr uid_t nobody = 65534;
 
-unsigned refusals = 0;
+unsigned refused = 0;
 bool walk_was_refused = false;
 
-void note_refusal() {
-  ++refusals;
-  throw std::bad_alloc();
+bool is_directory(const std::string& path) {
+  struct stat status {};
+  return ::stat(path.c_str(), &status) == 0 && S_ISDIR(status.st_mode);
 }
 
 bool is_same_directory(const std::string& left, const std::string& right) {
@@ -51,19 +53,23 @@ bool is_regular(const std::string& path) {
   return ::stat(path.c_str(), &status) == 0 && S_ISREG(status.st_mode);
 }
 
-entry entry_at(const char* path) {
-  struct stat status {};
-  if (::lstat(path, &status) != 0) {
-    if (errno == ENOENT) return {};
-    return {entry::kind::unknown, {}, errno};
+std::string real_path(const std::string& path) {
+  char real[PATH_MAX];
+  return ::realpath(path.c_str(), real) == nullptr ? "" : real;
+}
+
+// Whether others than root keep their way to what is there, and may read it.
+// What is not there is closed to nobody.
+bool is_closed(const std::string& path) {
+  const std::string real = real_path(path);
+  for (std::size_t end = 0; end < real.size();) {
+    end = std::min(real.find('/', end + 1), real.size());
+    struct stat status {};
+    if (::stat(real.substr(0, end).c_str(), &status) != 0) return true;
+    if ((status.st_mode & (S_ISDIR(status.st_mode) ? S_IXOTH : S_IROTH)) == 0)
+      return true;
   }
-  if (S_ISREG(status.st_mode)) return {entry::kind::file};
-  if (S_ISDIR(status.st_mode)) return {entry::kind::directory};
-  if (!S_ISLNK(status.st_mode)) return {entry::kind::special};
-  char target[longest_text];
-  const ssize_t length = ::readlink(path, target, sizeof target);
-  if (length < 0) return {entry::kind::unknown, {}, errno};
-  return {entry::kind::link, {target, static_cast<std::size_t>(length)}};
+  return false;
 }
 
 entry record_at(const char* path) {
@@ -76,6 +82,7 @@ entry record_at(const char* path) {
   }
   char text[longest_text];
   const ssize_t length = ::read(file, text, sizeof text);
+  if (length < 0) record.error = errno;
   ::close(file);
   if (length > 0) record.text.assign(text, static_cast<std::size_t>(length));
   return record;
@@ -95,125 +102,112 @@ link_pair pair_of(const link_facts& links) {
              : link_pair::update_with_other_icu;
 }
 
-// As a boot finds one: links, and what others may not read, do not count.
-bool is_icu_data(const std::string& path) {
-  struct stat status {};
-  return ::lstat(path.c_str(), &status) == 0 && S_ISREG(status.st_mode) &&
-         (status.st_mode & S_IROTH) != 0;
-}
-
-// The names in a directory, as it lists them, no more than anybody reads.
-int list(const std::string& path, std::vector<std::string>& names) {
-  DIR* const directory = ::opendir(path.c_str());
-  if (directory == nullptr) return errno;
-  while (const dirent* const item = ::readdir(directory)) {
-    const std::string name = item->d_name;
-    if (name != "." && name != "..") names.push_back(name);
-    if (names.size() == most_names) break;
-  }
-  ::closedir(directory);
-  return 0;
-}
-
-// By its text or by where it leads; what is in a directory needs that.
-bool needs(const char* link, const std::string& set) {
+void note_need(const char* label, const char* link,
+               std::map<std::string, std::vector<std::string>>& sets) {
   const entry here = entry_at(link);
-  if (here.what != entry::kind::link) return false;
-  if (here.text == set || here.text.starts_with(set + "/")) return true;
-  return is_same_directory(link, set) ||
-         is_same_directory(std::string(link) + "/..", set);
+  if (here.what != entry::kind::link) return;
+  // By its text, or by where it leads; what is in a directory needs that.
+  const std::pair<std::string, std::string> ways[] = {
+      {here.text, paths::download_root},
+      {real_path(link), real_path(paths::download_root) + "/"}};
+  for (const auto& [target, root] : ways) {
+    if (!target.starts_with(root)) continue;
+    const std::string name =
+        target.substr(root.size(), target.find('/', root.size()) - root.size());
+    if (name.empty() || name == "." || name == ".." ||
+        !is_directory(paths::download_root + name))
+      continue;
+    auto& needed_by = sets[name];
+    if (needed_by.empty() || needed_by.back() != label)
+      needed_by.emplace_back(label);
+  }
 }
 
 void list_downloads(device_facts& device) {
   std::vector<std::string> names;
-  device.downloads_error = list(paths::download_root, names);
-  device.has_more_downloads = names.size() == most_names;
-  for (const auto& name : names) {
-    const std::string set = paths::download_root + name;
-    if (!is_same_directory(set, set)) continue;
-    download found{name, {}};
-    for (const auto& [label, link] :
-         {std::pair{"zoneinfo", paths::zoneinfo_link},
-          std::pair{"icutz", paths::icu_link},
-          std::pair{"tz_latest", paths::latest_update_link},
-          std::pair{"/var/db/icutz", paths::legacy_icu_link}})
-      if (needs(link, set)) found.needed_by.emplace_back(label);
-    device.downloads.push_back(found);
-  }
-  std::sort(device.downloads.begin(), device.downloads.end(),
-            [](const download& left, const download& right) {
-              if (left.needed_by.empty() != right.needed_by.empty())
-                return right.needed_by.empty();
-              return left.name < right.name;
-            });
+  device.downloads_error = list_directory(paths::download_root, names);
+  device.has_more_downloads = names.size() > most_names;
+  std::map<std::string, std::vector<std::string>> sets;
+  for (const auto& name : names)
+    if (is_directory(paths::download_root + name)) sets[name];
+  note_need("zoneinfo", paths::zoneinfo_link, sets);
+  note_need("icutz", paths::icu_link, sets);
+  note_need("tz_latest", paths::latest_update_link, sets);
+  note_need("/var/db/icutz", paths::legacy_icu_link, sets);
+  for (const bool is_needed : {true, false})
+    for (const auto& [name, needed_by] : sets)
+      if (needed_by.empty() != is_needed)
+        device.downloads.push_back({name, needed_by});
 }
 
-// Notes whose the parts are that a boot reads or changes. Whose those are that
-// it only reads does not matter where everybody may read them.
+// Notes whose the parts are that a boot reads. That does not matter where
+// everybody may read them.
 void note_rights(device_facts& device) {
-  const auto look_at = [&](const std::string& part, bool is_changed) {
+  const auto look_at = [&](const std::string& part) {
     struct stat status {};
     if (::stat(part.c_str(), &status) != 0) return;
     const mode_t for_all = S_ISDIR(status.st_mode) ? 0555 : 0444;
-    const bool is_closed = (status.st_mode & for_all) != for_all;
-    device.has_closed_part = device.has_closed_part || is_closed;
-    if (status.st_uid == nobody && (is_changed || is_closed) &&
-        device.foreign_part.empty())
+    if ((status.st_mode & for_all) == for_all) return;
+    device.has_closed_part = true;
+    if (status.st_uid == nobody && device.foreign_part.empty())
       device.foreign_part = part;
   };
   const auto look_at_update = [&](const std::string& path) {
-    look_at(path, false);
-    for (const char* entry : paths::update_entries)
-      look_at(path + "/" + entry, false);
-    look_at(path + "/zoneinfo/+VERSION", false);
+    look_at(path);
+    for (const char* entry : paths::update_entries) look_at(path + "/" + entry);
+    look_at(path + "/zoneinfo/+VERSION");
   };
-  // The owner of "/" is the device's root.
-  for (const char* part :
-       {"/", "/var/db", "/var/db/timezone", paths::version_record})
-    look_at(part, true);
   const std::string& zone = device.links.localtime.text;
   for (const std::string& part :
-       {std::string("/usr"), std::string("/usr/share"),
+       {std::string("/"), std::string("/var/db"),
+        std::string("/var/db/timezone"), std::string(paths::version_record),
+        std::string("/usr"), std::string("/usr/share"),
         std::string(paths::system_zoneinfo),
         std::string(paths::system_zoneinfo) + "/+VERSION",
         std::string(paths::system_icu),
         std::string(paths::system_icu) + "/icutzformat.txt",
         std::string("/var"), std::string(paths::download_root),
         zone.substr(0, zone.rfind('/'))})
-    look_at(part, false);
+    look_at(part);
   for (const auto* set : {&device.current, &device.update})
     if (*set && !(*set)->path.empty()) look_at_update((*set)->path);
 }
 
 void expect_file(dataset_facts& facts, const std::string& path) {
+  errno = 0;
   if (is_regular(path) && ::access(path.c_str(), R_OK) == 0) return;
   facts.unreadable.push_back(
-      path + ": " +
-      (is_regular(path) || errno != 0 ? std::strerror(errno) : "not a file"));
+      {path, errno == 0 ? "Not a file" : std::strerror(errno)});
 }
 
 void note_unreadable(dataset_facts& facts) {
-  errno = 0;
   if (facts.path.empty()) {
     expect_file(facts, std::string(paths::system_zoneinfo) + "/+VERSION");
-    errno = 0;
     expect_file(facts, std::string(paths::system_icu) + "/icutzformat.txt");
     return;
   }
   expect_file(facts, facts.path + "/zoneinfo/+VERSION");
   std::vector<std::string> names;
   const std::string icu = facts.path + "/icutz";
-  if (const int error = list(icu, names); error != 0)
-    facts.unreadable.push_back(icu + ": " + std::strerror(error));
-  std::vector<std::string> schemas;
+  if (const int error = list_directory(icu, names); error != 0)
+    facts.unreadable.push_back({icu, std::strerror(error)});
+  std::set<std::string> schemas;
   for (const auto& name : names) {
     const std::string schema(icu_schema_in(name));
-    if (!schema.empty() && is_icu_data(icu + "/" + name))
-      schemas.push_back(schema);
+    if (schema.empty()) continue;
+    // As a boot finds one: what others may not read does not count.
+    const std::string path = icu + "/" + name;
+    struct stat status {};
+    if (::lstat(path.c_str(), &status) != 0)
+      facts.unreadable.push_back({path, std::strerror(errno)});
+    else if (!S_ISREG(status.st_mode))
+      facts.unreadable.push_back({path, "Not a file"});
+    else if ((status.st_mode & S_IROTH) == 0)
+      facts.unreadable.push_back({path, "Others may not read it"});
+    else
+      schemas.insert(schema);
   }
-  facts.has_several_schemas =
-      std::adjacent_find(schemas.begin(), schemas.end(),
-                         std::not_equal_to<>()) != schemas.end();
+  facts.has_several_schemas = schemas.size() > 1;
 }
 
 std::string icu_schema_of(const mln_dataset& built) {
@@ -227,7 +221,7 @@ std::string icu_schema_of(const mln_dataset& built) {
 dataset_facts facts_of(const std::string& path, const mln_dataset* system) {
   dataset_facts facts;
   facts.path = path;
-  const unsigned before = refusals;
+  const unsigned before = refused;
   errno = 0;
   walk_was_refused = false;
   try {
@@ -246,13 +240,58 @@ dataset_facts facts_of(const std::string& path, const mln_dataset* system) {
   } catch (const std::bad_alloc&) {
     facts.ends = dataset_facts::state::no_memory;
   }
-  facts.word_is_cut = refusals != before;
+  facts.word_is_cut = refused != before;
   if (walk_was_refused) facts.ends = dataset_facts::state::no_memory;
   if (facts.ends != dataset_facts::state::bad_path) note_unreadable(facts);
   return facts;
 }
 
 }  // namespace
+
+entry entry_at(const char* path) {
+  struct stat status {};
+  if (::lstat(path, &status) != 0) {
+    if (errno == ENOENT) return {};
+    return {entry::kind::unknown, {}, errno};
+  }
+  if (S_ISREG(status.st_mode)) return {entry::kind::file};
+  if (S_ISDIR(status.st_mode)) return {entry::kind::directory};
+  if (!S_ISLNK(status.st_mode)) return {entry::kind::special};
+  char target[longest_text];
+  const ssize_t length = ::readlink(path, target, sizeof target);
+  if (length < 0) return {entry::kind::unknown, {}, errno};
+  return {entry::kind::link, {target, static_cast<std::size_t>(length)}};
+}
+
+int list_directory(const std::string& path, std::vector<std::string>& names) {
+  const std::unique_ptr<DIR, int (*)(DIR*)> directory(::opendir(path.c_str()),
+                                                      &::closedir);
+  if (!directory) return errno;
+  while (names.size() <= most_names) {
+    errno = 0;
+    const dirent* const item = ::readdir(directory.get());
+    if (item == nullptr) return errno;
+    const std::string name = item->d_name;
+    if (name != "." && name != "..") names.push_back(name);
+  }
+  return 0;
+}
+
+void count_refusals() {
+  std::set_new_handler([] {
+    ++refused;
+    throw std::bad_alloc();
+  });
+}
+
+unsigned refusals() { return refused; }
+
+std::string closed_part() {
+  for (const char* path :
+       {"/var/db/timezone", paths::localtime_link, paths::icu_link})
+    if (is_closed(path)) return path;
+  return {};
+}
 
 link_facts read_links() {
   link_facts links;
@@ -263,8 +302,11 @@ link_facts read_links() {
   links.record = record_at(paths::version_record);
   links.legacy_icutz = entry_at(paths::legacy_icu_link);
   links.old_icu = entry_at(paths::obsolete_icu);
-  links.is_recordable = is_regular(paths::version_record) &&
-                        ::access(paths::version_record, W_OK) == 0;
+  struct stat record {};
+  if (::stat(paths::version_record, &record) == 0 && S_ISREG(record.st_mode))
+    links.recorded =
+        record.st_mtim.tv_sec * 1'000'000'000LL + record.st_mtim.tv_nsec;
+  links.is_writable = ::access("/var/db/timezone", W_OK | X_OK) == 0;
   links.zone_is_file = is_regular(paths::localtime_link);
   try {
     links.current_path = current_dataset_path();
@@ -275,7 +317,6 @@ link_facts read_links() {
 }
 
 device_facts read_device() {
-  std::set_new_handler(note_refusal);
   // A walk that gets no memory looks like one that finds nothing.
   take_lines([](const line& said) {
     if (said.error == ENOMEM) walk_was_refused = true;

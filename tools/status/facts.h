@@ -18,6 +18,18 @@ struct entry {
 
   bool operator==(const entry&) const = default;
 };
+entry entry_at(const char* path);
+
+// The names in a directory, as it lists them, no more than anybody reads.
+// Returns an errno, or 0.
+inline constexpr std::size_t most_names = 10000;
+int list_directory(const std::string& path, std::vector<std::string>& names);
+
+// What should be there, and why it does not count.
+struct flaw {
+  std::string path{};
+  std::string error{};
+};
 
 // One data set as the boot program would build it.
 struct dataset_facts {
@@ -37,7 +49,7 @@ struct dataset_facts {
   std::string schema{};
   bool fits_system = false;  // every component accepts the system's
   bool word_is_cut = false;  // memory did not suffice for a first word
-  std::vector<std::string> unreadable{};  // what should be there, and why not
+  std::vector<flaw> unreadable{};
   bool has_several_schemas = false;
 
   bool has_version() const { return !(version == mln_version()); }
@@ -64,8 +76,11 @@ struct link_facts {
   entry old_icu{};
   std::optional<std::string> current_path{};  // if "zoneinfo" is accepted
   link_pair pair = link_pair::no_dataset;
-  bool zone_is_file = false;   // "localtime" leads to a regular file
-  bool is_recordable = false;  // a record, through links, that a boot may write
+  bool zone_is_file = false;            // "localtime" leads to a regular file
+  std::optional<long long> recorded{};  // when the record's file was written
+  bool is_writable = false;             // the links' directory, by a boot
+
+  bool operator==(const link_facts&) const = default;
 };
 
 // A directory among the downloads, and the links that need it.
@@ -83,15 +98,23 @@ struct device_facts {
   std::optional<dataset_facts> update{};
   std::vector<download> downloads{};  // those that are needed first
   int downloads_error = 0;
-  bool has_more_downloads = false;  // than are listed
+  bool has_more_downloads = false;  // perhaps; more entries than are listed
   std::string foreign_part{};       // the first that is another user's
   bool has_closed_part = false;     // one that not everybody may read
+  bool has_known_owner = true;      // the links' directory
 };
 
 // The links as they are, also after a boot. Neither throws anything but
-// std::bad_alloc, and neither changes anything. lstat(2), readlink(2), stat(2),
-// open(2).
+// std::bad_alloc, and neither changes anything. Calls: lstat(2), readlink(2),
+// stat(2), open(2), access(2).
 link_facts read_links();
+
+// What readers need and only root may read, as it is now; empty: nothing.
+std::string closed_part();
+
+// How often memory was refused to this process from now on is counted.
+void count_refusals();
+unsigned refusals();
 
 // All of it. The data sets are read as a boot reads them.
 device_facts read_device();

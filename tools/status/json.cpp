@@ -27,12 +27,6 @@ json version_of(const dataset_facts& set) {
   return set.has_version() ? text_or_null(set.version_text) : json();
 }
 
-json list_of(const std::vector<std::string>& texts) {
-  json list = json::array();
-  for (const auto& text : texts) list.push_back(escaped(text));
-  return list;
-}
-
 std::string name_of(dataset_facts::state ends) {
   static constexpr std::array names = {
       "readable", "elsewhere", "number_too_large", "walk_failed", "no_memory"};
@@ -40,11 +34,14 @@ std::string name_of(dataset_facts::state ends) {
 }
 
 json object_of(const dataset_facts& set) {
+  json unreadable = json::array();
+  for (const auto& [path, error] : set.unreadable)
+    unreadable.push_back({{"path", escaped(path)}, {"error", error}});
   json object{{"path", text_or_null(set.path)},
               {"version", version_of(set)},
               {"schema", text_or_null(set.schema)},
               {"state", name_of(set.ends)},
-              {"unreadable", list_of(set.unreadable)}};
+              {"unreadable", unreadable}};
   if (!set.path.empty()) {
     object["fits_system"] = set.fits_system;
     object["has_several_schemas"] = set.has_several_schemas;
@@ -88,7 +85,12 @@ json object_of(const rehearsal& boot) {
 std::string in_json(const report& told) {
   json object{{"format", 1}};
   object["status"] = static_cast<int>(told.why.is);
-  object["reasons"] = told.why.reasons;
+  json reasons = json::array();
+  for (const auto& found : told.why.reasons)
+    reasons.push_back({{"subject", found.name},
+                       {"code", found.reason},
+                       {"text", found.text}});
+  object["reasons"] = reasons;
   object["now"] = object_of(told.device.links);
   object["system"] = object_of(told.device.system);
   object["current"] = object_or_null(told.device.current);

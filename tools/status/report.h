@@ -16,7 +16,12 @@ struct report {
   link_facts after{};
   explanation why{};
   std::vector<std::string> cannot_know{};
+  bool is_mended_by_a_removal = false;  // of "zoneinfo", before another boot
 };
+
+// Runs the device's next boot where it leaves no trace, for good: this process
+// then sees nothing else. Throws cannot_tell, or what explain() throws.
+report examine(const std::string& root);
 
 // How rows are shown: `width` 0 means without wrapping, as into a pipe.
 struct look {
@@ -31,5 +36,5 @@ std::string in_rows(const report& told, const look& wanted);
 // does, so that any bytes give valid JSON; see marlin-status(8) for the names.
 std::string in_json(const report& told);
 
-// The reasons for a status other than 0, each a line.
+// The reasons for a status other than 0, each a line with its subject.
 std::string in_reasons(const report& told);

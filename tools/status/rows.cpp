@@ -54,15 +54,6 @@ std::string version_and_schema(const dataset_facts& set) {
                              : ", ICU schema " + escaped(set.schema));
 }
 
-// Not if something else than a link is in the way.
-bool is_mended_by_a_reset(const link_facts& links) {
-  const bool is_mixed = links.pair == link_pair::update_without_icu ||
-                        links.pair == link_pair::update_with_other_icu ||
-                        links.pair == link_pair::system_with_icu;
-  return is_mixed && (links.icutz.what == entry::kind::none ||
-                      links.icutz.what == entry::kind::link);
-}
-
 // Breaks at blanks where it can.
 std::string wrapped(std::string text, std::size_t width) {
   std::string lines;
@@ -98,10 +89,17 @@ class rows {
   std::string text_{};
 };
 
+void add_flaws(rows& shown, const dataset_facts& set) {
+  for (const auto& [path, error] : set.unreadable)
+    shown.add("", escaped(path) + ": " + error);
+}
+
 void add_data(rows& shown, const report& told) {
   const link_facts& links = told.device.links;
   if (!told.device.current)
-    shown.add("in use", "none: zoneinfo " + plain(links.zoneinfo));
+    shown.add("in use", links.zoneinfo.what == entry::kind::none
+                            ? "none: there is no link zoneinfo"
+                            : "none: zoneinfo names no data set");
   else if (links.current_path->empty())
     shown.add("in use", "the system partition's");
   else
@@ -109,12 +107,10 @@ void add_data(rows& shown, const report& told) {
               "the update " + version_and_schema(*told.device.current));
   if (told.device.current && !told.device.current->path.empty()) {
     shown.add("", plain(links.zoneinfo));
-    for (const auto& file : told.device.current->unreadable)
-      shown.add("", escaped(file));
+    add_flaws(shown, *told.device.current);
   }
   shown.add("system", version_and_schema(told.device.system));
-  for (const auto& file : told.device.system.unreadable)
-    shown.add("", escaped(file));
+  add_flaws(shown, told.device.system);
 }
 
 void add_links(rows& shown, const report& told) {
@@ -124,7 +120,7 @@ void add_links(rows& shown, const report& told) {
     shown.add("", "zoneinfo " + plain(links.zoneinfo));
     shown.add("", "icutz " + plain(links.icutz));
   }
-  if (told.after.pair == links.pair && is_mended_by_a_reset(links))
+  if (told.is_mended_by_a_removal)
     shown.add(
         "",
         "To mend it remove /var/db/timezone/zoneinfo: the next boot then "
@@ -134,8 +130,7 @@ void add_links(rows& shown, const report& told) {
   if (told.device.update &&
       told.device.update->ends != dataset_facts::state::bad_path) {
     shown.add("", version_and_schema(*told.device.update));
-    for (const auto& file : told.device.update->unreadable)
-      shown.add("", escaped(file));
+    add_flaws(shown, *told.device.update);
   }
 
   const std::string zone = zone_of(links);
@@ -160,11 +155,11 @@ void add_downloads(rows& shown, const report& told) {
     label = "";
   }
   if (found.size() > most_downloads)
-    shown.add("",
-              std::string(told.device.has_more_downloads ? "more than " : "")
-                  .append(std::to_string(found.size() - most_downloads))
-                  .append(" more"));
-  if (told.device.downloads_error != 0)
+    shown.add("", std::to_string(found.size() - most_downloads) + " more");
+  if (told.device.has_more_downloads)
+    shown.add(label,
+              "only " + std::to_string(most_names) + " entries were looked at");
+  else if (told.device.downloads_error != 0)
     shown.add(label, error_text(told.device.downloads_error));
   else if (found.empty())
     shown.add(label, "none");
@@ -174,10 +169,7 @@ void add_boot(rows& shown, const report& told) {
   const char* label = "next boot";
   for (const auto& done : told.why.steps) {
     if (done.does == "nothing") continue;
-    std::string name = done.name;
-    for (char& letter : name)
-      if (letter == '_') letter = ' ';
-    shown.add(label, name + ": " + done.text);
+    shown.add(label, done.sentence());
     label = "";
   }
   label = "it prints";
@@ -196,7 +188,7 @@ void add_boot(rows& shown, const report& told) {
 
 std::string in_reasons(const report& told) {
   std::string text;
-  for (const auto& reason : told.why.reasons) text += reason + "\n";
+  for (const auto& reason : told.why.reasons) text += reason.sentence() + "\n";
   return text;
 }
 
@@ -211,6 +203,6 @@ std::string in_rows(const report& told, const look& wanted) {
                       : told.why.is == verdict::changes
                           ? "the next boot changes something"
                           : "something is wrong");
-  for (const auto& reason : told.why.reasons) shown.add("", reason);
+  for (const auto& reason : told.why.reasons) shown.add("", reason.sentence());
   return shown.text();
 }

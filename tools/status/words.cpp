@@ -16,29 +16,23 @@ std::string data_in_use(const link_facts& links) {
   return links.current_path->empty() ? "system" : "update";
 }
 
+bool fits(link_pair pair) {
+  return pair == link_pair::system || pair == link_pair::update;
+}
+
 pair_words words_for(link_pair pair) {
-  const char* const same = "zoneinfo and icutz name the same data";
-  switch (pair) {
-    case link_pair::system:
-      return {"system", same};
-    case link_pair::update:
-      return {"update", same};
-    case link_pair::update_without_icu:
-      return {"update_without_icu",
-              "zoneinfo names an update, but there is no link icutz"};
-    case link_pair::update_with_other_icu:
-      return {"update_with_other_icu",
-              "icutz does not name the ICU data of zoneinfo's update"};
-    case link_pair::system_with_icu:
-      return {"system_with_icu",
-              "zoneinfo names the system partition, but there is a link icutz"};
-    case link_pair::not_the_tree:
-      return {"not_the_tree",
-              "zoneinfo leads into an update, but not to its tree"};
-    case link_pair::no_dataset:
-      break;
-  }
-  return {"no_dataset", "zoneinfo names no data set"};
+  static constexpr pair_words words[] = {
+      {"system", "zoneinfo and icutz name the same data"},
+      {"update", "zoneinfo and icutz name the same data"},
+      {"update_without_icu",
+       "zoneinfo names an update, but there is no link icutz"},
+      {"update_with_other_icu",
+       "icutz does not name the ICU data of zoneinfo's update"},
+      {"system_with_icu",
+       "zoneinfo names the system partition, but there is a link icutz"},
+      {"not_the_tree", "zoneinfo leads into an update, but not to its tree"},
+      {"no_dataset", "zoneinfo names no data set"}};
+  return words[static_cast<std::size_t>(pair)];
 }
 
 std::string zone_of(const link_facts& links) {

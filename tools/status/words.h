@@ -20,6 +20,7 @@ struct pair_words {
   const char* sentence;
 };
 pair_words words_for(link_pair pair);
+bool fits(link_pair pair);
 
 // The zone that "localtime" names, below the active tree; empty: none.
 std::string zone_of(const link_facts& links);
