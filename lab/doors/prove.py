@@ -14,6 +14,7 @@ takes samples, in a quarter of an hour.
   status     what marlin-status says, against what then happens
   install    the installer of updates: calls that fail, kills, several at once
   make       what makes updates and a system's data, and what it refuses
+  component  the third component of CONTRIBUTING.md
   fuzz       hostile texts
   sanitize   the tests under sanitizers and (not with --quick) valgrind
   coverage   lines and branches that the tests run through
@@ -41,6 +42,7 @@ TRIALS = {  # lab/proofs/NAME.py, each
     "states": ["states"], "load": ["load"], "log": ["log"], "status": ["status"],
     "install": ["install_faults", "install_kills", "install_races"], "make": ["make"]}
 OTHERS = {  # the whole, and with --quick
+    "component": ([], []),
     "fuzz": (["--seconds", "600"], ["--seconds", "60"]),
     "sanitize": ([], ["--sanitizers"]),
     "coverage": ([], []),

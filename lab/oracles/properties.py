@@ -4,8 +4,9 @@
 The second of two oracles. It looks only at what a boot found, left and printed, and at
 which calls failed if they were traced: what may be in use, what may be activated, what
 the record says, which line follows which and ends with which error, that every reset,
-refusal and correction has its reason, and that nothing else is touched. It knows nothing of the model's boot, so that a mistake that the model and the
-program share is noticed.
+refusal and correction has its reason, and that nothing else is touched. It knows
+nothing of the model's boot, so that a mistake that the model and the program share is
+noticed.
 """
 
 import errno

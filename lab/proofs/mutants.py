@@ -33,7 +33,7 @@ from concurrent.futures import ThreadPoolExecutor
 from pathlib import Path
 from typing import NamedTuple
 
-from lab.carriers.building import locked, need
+from lab.carriers.building import copy_the_project, locked, need
 from lab.words.command import Options, number
 from lab.words.places import BUILD, PROJECT
 
@@ -254,10 +254,7 @@ class Tree:
     def __init__(self, number: int):
         """Builds and tests the copy as it is; finds each program's slow tests."""
         self.root = PLACE / f"tree{number}"
-        # What is the same keeps its time, and so its objects.
-        subprocess.run(["rsync", "-rlp", "--checksum", "--delete", "--mkpath",
-                        "--exclude=/build", "--exclude=/.git",
-                        f"{PROJECT}/", f"{self.root}/"], check=True)
+        copy_the_project(self.root)
         if not (self.root / "build/build.ninja").exists():
             subprocess.run(
                 ["cmake", "-S", self.root, "-B", self.root / "build", "-G", "Ninja",
