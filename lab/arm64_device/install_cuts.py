@@ -58,7 +58,8 @@ done
 
 
 def installing_device() -> Device:
-    """With an update on its system partition, and a place for the account's own."""
+    """A device that can install: updates wait on its system partition, and the account
+    owns the place for them."""
     device = sound_device()
     for zone in ZONES:
         device.file(f"{TEMPLATE}/zoneinfo/{zone}", zones("U24A")["Europe/Paris"])

@@ -226,7 +226,7 @@ class Machine:
         return console
 
     def wait_for(self, emulator: subprocess.Popen, text: str, seconds=120):
-        """Until the console says so."""
+        """Waits until the console shows the text."""
         end = time.monotonic() + seconds
         while text not in Console(self.console).said:
             if time.monotonic() > end or emulator.poll() is not None:

@@ -102,7 +102,7 @@ def kind_of_record(device: Device) -> str:
 
 
 def mended(device: Device) -> Device:
-    """Without the link "zoneinfo", if it and "icutz" are of two sets."""
+    """The device without the link "zoneinfo", if that and "icutz" are of two sets."""
     if "MIXED" in described(device):
         device.drop(ZONEINFO)
     return device

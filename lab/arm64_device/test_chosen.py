@@ -19,7 +19,7 @@ BOOT_EACH = side_by_side.each("/var/chosen/*", """
 
 @pytest.fixture(scope="module")
 def looks(machine):
-    """At the disk, with a boot of every chosen device in between."""
+    """Two looks at the disk, with a boot of every chosen device in between."""
     here = machine("chosen")
     here.build(sound_device(), owner=1, chosen=side_by_side.disk(
         {name: make() for name, make in CHOSEN.items()}))

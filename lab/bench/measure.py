@@ -49,7 +49,7 @@ def placed(scene: str, programs) -> list[str]:
 
 
 def counts(*programs: str) -> dict[str, list]:
-    """By scene, in the order of the programs."""
+    """The costs of each scene, in the order of the programs."""
     found = {}
     for scene, describe in SCENES.items():
         restore = functools.partial(namespace.build, describe())

@@ -33,7 +33,7 @@ def prepare():
 
 
 def names() -> releases.Names:
-    """With the versions of updates, as 2025c.1.0, in place of their releases."""
+    """The names of the releases; updates have their versions, such as 2025c.1.0."""
     found = releases.names()
     return found._replace(update=f"{found.update}.1.0", refused=f"{found.refused}.1.0")
 

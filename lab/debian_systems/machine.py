@@ -95,7 +95,7 @@ class System:
 
     def boot(self, then="", options="", more: tuple[str, ...] = (),
              seconds=SECONDS) -> Seen:
-        """From power-on to power-off. `then` is what a shell does on the system after
+        """One boot, from power-on to power-off. `then` is what a shell does on the system after
         it has told what was seen; `options` are the kernel's."""
         with tarfile.open(self.told, "w") as archive:
             entry = tarfile.TarInfo("then")
@@ -118,7 +118,7 @@ class System:
 
     @staticmethod
     def emulate(command: list[str], console: Path, seconds: float) -> str:
-        """Until the system is off, or has told all and does not end."""
+        """Runs until the system is off, or has told all and does not end."""
         emulator = subprocess.Popen(command, stdin=subprocess.DEVNULL)
         end = time.monotonic() + seconds
         while emulator.poll() is None and time.monotonic() < end:

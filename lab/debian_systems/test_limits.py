@@ -23,7 +23,7 @@ def test_a_terabyte_for_a_word():
 
 
 def test_no_directory():
-    """And nothing that makes it. The journal names it."""
+    """Nothing makes it either. The journal names it."""
     system = System("no-directory", """
         mkdir -p etc/tmpfiles.d
         ln -s /dev/null etc/tmpfiles.d/marlin.conf""")

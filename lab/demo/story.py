@@ -161,7 +161,7 @@ class Story:
         self.device.announce(version)
 
     def install(self, data_set: str):
-        """With marlin-install, on the device as it is."""
+        """Has marlin-install install a data set on the device as it is."""
         self.make_real()
         version = getattr(self.names, data_set)
         unpacked = Path("/tmp", version)

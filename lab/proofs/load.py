@@ -118,7 +118,7 @@ def test_an_icu_directory_with_nothing_that_counts(load):
 
 @pytest.mark.parametrize("data_first", [False, True])
 def test_a_deep_tree(load, data_first):
-    """Beside the ICU data, before it and after it in the listing."""
+    """It stands beside the ICU data, before it and after it in the listing."""
     device = activation("2023d.1.0")
     icu = f"{UPDATE}/icutz"
     if not data_first:
@@ -182,7 +182,7 @@ def test_a_long_link_target(load, path, start, end, without, length):
 @pytest.mark.parametrize("path", [
     VERSION, f"{SYSTEM_ICU}/icutzformat.txt", f"{UPDATE}/zoneinfo/+VERSION", RECORD])
 def test_a_link_to_a_device(load, path, target):
-    """As good as nothing to read, or to write to."""
+    """It counts as nothing to read, and as nothing to write to."""
     if not stat.S_ISCHR(os.stat(target).st_mode):
         pytest.skip(f"on this machine {target} is not a device")
     device = activation("2023d.1.0")

@@ -303,7 +303,7 @@ def test_a_past_change(place):
 
 
 def test_a_system_compiled_otherwise(place):
-    """As fat files, with directories of other clocks beside them."""
+    """Its files are fat, and directories of other clocks stand beside them."""
     compiled = place / "system/zoneinfo.default"
     for folder in (compiled, compiled / "right", compiled / "posix"):
         releases.output("/usr/sbin/zic", "-b", "fat", "-d", folder,
@@ -661,7 +661,7 @@ def test_failing_tools(place, fake, tool, script):
 
 
 def test_a_file_that_cannot_be_written(place):
-    """As on a full disk, in the middle of the tree."""
+    """The disk is as good as full, in the middle of the tree."""
     (place / "rules/leapseconds").write_bytes(bytes(3 << 20))
     refused(ran(["/usr/bin/prlimit", "--fsize=2000000", *make_update(place)]),
             "File too large; nothing was made")

@@ -75,7 +75,7 @@ def booted(expected: str):
 
 @contextlib.contextmanager
 def serving(reader: Reader, cluster: Path, *before: str) -> Iterator[None]:
-    """With what the program needs beside it."""
+    """Runs what the program needs beside it: a server."""
     if reader.command != PSQL:
         yield
         return

@@ -34,7 +34,7 @@ class Reader:
     runs_on: bool = True  # one process answers all
 
     def setting(self) -> str:
-        """As docs/readers.md has it."""
+        """The cell "set for it" of docs/readers.md."""
         told = [f"`{name}={value}`" for name, value in self.environment.items()]
         told += [f"link *{name}*" for name in self.links]
         return ", ".join(told) or "nothing"

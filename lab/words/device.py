@@ -117,7 +117,7 @@ class Device:
         self.link(TZ_LATEST, update_path(version))
 
     def point_links_at(self, version: str | None):
-        """At an update, or with None at the system partition."""
+        """None stands for the system partition."""
         if version is None:
             self.link(ZONEINFO, SYSTEM_ZONEINFO)
             self.drop(ICUTZ)
