@@ -58,8 +58,8 @@ done
 
 
 def installing_device() -> Device:
-    """A device that can install: updates wait on its system partition, and the account
-    owns the place for them."""
+    """A device that can install: an update to copy is on its system partition, and the
+    account has a place of its own."""
     device = sound_device()
     for zone in ZONES:
         device.file(f"{TEMPLATE}/zoneinfo/{zone}", zones("U24A")["Europe/Paris"])

@@ -95,8 +95,8 @@ class System:
 
     def boot(self, then="", options="", more: tuple[str, ...] = (),
              seconds=SECONDS) -> Seen:
-        """One boot, from power-on to power-off. `then` is what a shell does on the system after
-        it has told what was seen; `options` are the kernel's."""
+        """One boot, from power-on to power-off. `then` is what a shell does on the
+        system after it has told what was seen; `options` are the kernel's."""
         with tarfile.open(self.told, "w") as archive:
             entry = tarfile.TarInfo("then")
             entry.size = len(then.encode())
