@@ -31,9 +31,9 @@ def gcovr(*options):
 
 
 def run_tests(program: Path):
-    """Two kinds are left out. A boot that may write only five bytes into any file cannot
-    write its counters. A whole list of calls would end with those that write the
-    counters."""
+    """Two kinds are left out. A boot that may write only five bytes into any file
+    cannot write its counters. A whole list of calls would end with those that write
+    the counters."""
     quietly(LOG.with_name(f"log of {program.name}"), program, "--gtest_brief=1",
             "--gtest_filter=-*CannotBeWrittenWhole*:WholeListOfCalls.*")
 
