@@ -1,12 +1,12 @@
 # SPDX-License-Identifier: BSD-2-Clause
-"""usage: scripts/bench --check | --record | --companions
+"""usage: scripts/bench [--check | --record | --companions]
 
 Measures marlin, as it ships, inside a private device, beside the least that its system
 calls can cost: "the floor", lab/bench/floor.c.
 
-  --check       compares instructions, system calls and size with
-                lab/bench/baseline.txt; fails when one has grown by more than 3
-                percent, for calls by a single one
+  --check       what is done without an option: compares instructions, system calls and
+                size with lab/bench/baseline.txt; fails when one has grown by more than
+                3 percent, for calls by a single one
   --record      writes lab/bench/baseline.txt anew
   --companions  marlin-install with an update of 1 MB, which may take 100 ms beside
                 fsync(2) and 16 MB; marlin-mend, which has to cost less than marlin
@@ -132,10 +132,10 @@ def companions():
 
 def main():
     parser = Options(__doc__)
-    jobs = parser.add_mutually_exclusive_group(required=True)
+    jobs = parser.add_mutually_exclusive_group()
     for job in (check, record, companions):
         jobs.add_argument(f"--{job.__name__}", dest="job", action="store_const",
-                          const=job)
+                          const=job, default=check)
     options = parser.parse_args()
     need("build", "private-device", "pytest", "bench")
     options.job()
