@@ -701,13 +701,24 @@ def test_it_tells_about_itself():
 
 
 @pytest.mark.parametrize("limit", [[], ["/usr/bin/prlimit", "--fsize=0"]])
-def test_a_full_standard_output_is_a_failure(limit):
+@pytest.mark.parametrize("words, failure", [
+    (["--root", TREE], b"cannot tell: standard output: "),
+    (["--help"], b"standard output: ")])
+def test_a_full_standard_output_is_a_failure(words, failure, limit):
     unpack()
     with open("/tmp/full" if limit else "/dev/full", "wb") as full:
-        done = subprocess.run([*limit, STATUS, "--root", TREE], stdout=full,
+        done = subprocess.run([*limit, STATUS, *words], stdout=full,
                               stderr=subprocess.PIPE)
     assert done.returncode == 77
-    assert done.stderr.startswith(b"marlin-status: cannot tell: standard output: ")
+    assert done.stderr.startswith(b"marlin-status: " + failure)
+
+
+def test_a_record_that_a_limit_on_files_cuts_is_not_told():
+    unpack(("announce", UPDATE))
+    done = subprocess.run(["/usr/bin/prlimit", "--fsize=5", STATUS, "--root", TREE],
+                          capture_output=True)
+    assert (done.returncode, done.stdout) == (77, b"")
+    assert done.stderr.endswith(b"a limit on the size of files cuts the record\n")
 
 
 def test_rows_fit_a_terminal():

@@ -8,6 +8,7 @@
 #include <utility>
 
 #include "tools/escaped.h"
+#include "tools/status/failure.h"
 #include "tools/status/words.h"
 
 namespace {
@@ -409,8 +410,13 @@ class account {
     if (!after_.recorded ||
         (after_.recorded == before.recorded && after_.record == before.record))
       return add("record", "not_written", "not_opened");
-    add("record", "written", "activation",
-        active.version_text + "_" + device_.update->version_text);
+    const std::string text =
+        active.version_text + "_" + device_.update->version_text;
+    // The layer has space for it, but this process may have less than a boot.
+    if (after_.record.what == entry::kind::file && after_.record.error == 0 &&
+        after_.record.text != text.substr(0, longest_text))
+      throw cannot_tell("a limit on the size of files cuts the record");
+    add("record", "written", "activation", text);
   }
 
   void last_resort(bool failed) {

@@ -27,7 +27,6 @@
 
 namespace {
 
-constexpr std::size_t longest_text = 4096;   // of a link or a record
 constexpr std::size_t longest_word = 65536;  // of a version or a schema
 // How an owner appears whom this user namespace does not have.
 constexpr uid_t nobody = 65534;

@@ -3,6 +3,7 @@
 // What stands on a device, read with the boot program's own classes.
 #pragma once
 
+#include <cstddef>
 #include <optional>
 #include <string>
 #include <vector>
@@ -18,6 +19,8 @@ struct entry {
 
   bool operator==(const entry&) const = default;
 };
+// No more of a text is read.
+inline constexpr std::size_t longest_text = 4096;
 entry entry_at(const char* path);
 
 // The names in a directory, as it lists them, no more than anybody reads.

@@ -68,9 +68,9 @@ int tell_or_say_why_not(const options& chosen) {
 }  // namespace
 
 int main(int count, char** words) {
-  const options chosen = options_in(count, words);
   // A limit on the size of files fails a write, which is told.
   std::signal(SIGXFSZ, SIG_IGN);
+  const options chosen = options_in(count, words);
   // If it is ignored, nobody is told how a child ends.
   std::signal(SIGCHLD, SIG_DFL);
   const pid_t child = ::fork();
