@@ -22,7 +22,7 @@ report with(const std::string& text) {
   dataset_facts& system = told.device.system;
   system.path = system.version_text = system.schema = text;
   system.version.year = 1;
-  system.unreadable = {{text, text}};
+  system.unreadable = {{text, "not there"}};
   told.device.current = told.device.update = system;
   told.device.downloads = {{text, {"zoneinfo"}}};
   told.boot.lines = {{"%s", text, 0}};
