@@ -1,6 +1,6 @@
 # SPDX-License-Identifier: BSD-2-Clause
 """What the demonstration looks like: headings, paragraphs, and the device before and
-after a boot side by side. With colours on a terminal."""
+after a boot as a difference. With colours on a terminal."""
 
 import locale
 import os
@@ -8,8 +8,7 @@ import sys
 import textwrap
 from collections.abc import Iterable
 
-WIDTH, NAME = 100, 13  # columns: of the whole, and of the names of rows
-LEAST_BEFORE = 41  # of what was there before the boot
+WIDTH, NAME = 72, 13  # columns: of the whole, and of the names of rows
 
 COLOURED = "FORCE_COLOR" in os.environ or (
     sys.stdout.isatty() and "NO_COLOR" not in os.environ
@@ -42,30 +41,20 @@ def field(name: str, *lines: str):
         name = ""
 
 
-def row(name: str, before: str, after: str, width=LEAST_BEFORE, marker=" ", colour=DIM):
-    print(paint(colour, f"{marker} {name:<{NAME - 2}}") +
-          paint(colour if marker == " " else "", f"{before:<{width}}") +
-          paint(colour, after))
-
-
-def changes(was: dict[str, str], found: dict[str, str], remade: set[str]):
-    """A row for everything found before and after a boot. "+" marks what is new, "-"
-    what is gone, "~" what has changed; `remade` are those that were made again."""
-    width = max(LEAST_BEFORE, *(len(text) + 2 for text in was.values()))
+def changes(was: dict[str, str], found: dict[str, str], remade=()):
+    """What was found before a boot, "-", and after it, "+", or both times; `remade` are
+    those that were made again."""
     print()
-    row("", "before the boot", "after it", width)
     for name, before in was.items():
-        after, marker, colour = found[name], "~", GREEN
-        if before == after and name in remade:
-            after = "made again, the same"
-        elif before == after:
-            marker, colour = " ", DIM
-            after = "none" if after == "none" else "unchanged"
-        elif before == "none":
-            marker = "+"
-        elif after == "none":
-            marker, colour = "-", YELLOW
-        row(name, before, after, width, marker, colour)
+        after = found[name]
+        name = f"{name:<{NAME - 2}}"
+        if before != after:
+            print(paint(RED, f"- {name}{before}"))
+            print(paint(GREEN, f"+ {name}{after}"))
+        elif name.rstrip() in remade:
+            print(paint(GREEN, f"~ {name}{after}, made again"))
+        else:
+            print(paint(DIM, f"  {name}{after}"))
 
 
 def broken(text: str) -> list[str]:

@@ -4,7 +4,7 @@
 Shows what marlin does, on a private device with real time-zone data: eight
 boots, from a first one to damaged links. Installs what it needs, as root, and
 builds the release program; changes nothing else outside the folder "build".
-With --facts only what was found is printed, a "scene: fact" line each.
+With --facts only what was found is printed, as lab/demo/facts has it.
 
 Prints colours on a terminal, unless NO_COLOR is set; with FORCE_COLOR anywhere.
 

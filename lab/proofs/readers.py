@@ -232,6 +232,12 @@ def rows_in(document: str) -> list[list[str]]:
             for line in table.strip().splitlines()[2:]]
 
 
+def by_any_name(cells: list[str]) -> list[str]:
+    """Where WET is another name of Lisbon, a program may say either."""
+    is_lisbon = "WET" in releases.names_of_lisbon()
+    return [cell.replace(", as WET", "") if is_lisbon else cell for cell in cells]
+
+
 def test_the_pack_alone_is_not_read(cluster):
     """Stock ICU wants the four files beside it."""
     reader = next(reader for reader in READERS if reader.environment == FILES)
@@ -254,7 +260,7 @@ def test_a_reader(number, cluster):
     cells = [cell.replace(NAMES.update, "RELEASE") for cell in
              [reader.name, reader.setting(), *scenes(reader, cluster)]]
     print("| " + " | ".join(cells) + " |")
-    assert cells in rows_in(DOCUMENT.read_text())
+    assert by_any_name(cells) in map(by_any_name, rows_in(DOCUMENT.read_text()))
 
 
 def test_every_row_is_tested():
