@@ -3,8 +3,8 @@
 
 Builds the program and all tests with a preset (dev by default; clang, asan, coverage,
 arm64-dev), and runs them, or those whose names match REGEX, each on a private device
-of its own. Installs what that takes, as root: some 400 MB of Debian packages on a bare
-Debian 12; otherwise says what is missing. Nothing else is touched outside of the folder
+of its own. Installs what that takes, as root: some 100 MB of Debian packages, 400 MB on
+the disk; otherwise says what is missing. Nothing else is touched outside of the folder
 "build", or the one that MARLIN_BUILD names, an absolute path.
 
 Exit status: 0 when all tests pass, 1 when one fails or something does not build, 2 for
