@@ -149,6 +149,20 @@ TEST_F(Calls, NeverOpenAFifoOrADevice) {
   }
 }
 
+TEST_F(Calls, ThatFailAreReportedWhateverTheErrorButThatThePathIsMissing) {
+  wipe(tz_latest);
+  for (const int error : {EPERM, EIO, EACCES, EBUSY, ENOTDIR, EISDIR, EINVAL,
+                          EROFS, ELOOP, ENAMETOOLONG, ENOMEM}) {
+    const auto booted =
+        trace({"-P", tz_latest, "-P", icutz, "-e",
+               "inject=?readlink,?readlinkat,?unlink,unlinkat:error=" +
+                   std::to_string(error)});
+    EXPECT_THAT(booted.lines(),
+                lines(cannot_read(tz_latest, error), unable_to_locate(error),
+                      icu_link_stays(icutz, error)));
+  }
+}
+
 // Of 4096 bytes and some more the first part is kept.
 TEST_F(Calls, ThatFailToReadTheRestOfAWordKeepItsStart) {
   const std::string file = system_tree + "/+VERSION";

@@ -103,6 +103,11 @@ TEST_F(Dataset, OfAPathThatEndsInNoVersionIsTakenAsItIsWithAnUnsetVersion) {
     };
     EXPECT_THAT(printed_by(build), lines(unparsed(name), no_schema_in(path)));
   }
+  printed_by([] {
+    const mln_dataset odd(update("2024a.1.0\n"));
+    EXPECT_EQ(odd.version_string, "2024a.1.0\n");
+    EXPECT_TRUE(odd.version == mln_version());
+  });
 }
 
 TEST_F(Dataset, OfASystemAlwaysGetsItsTwoNumbers) {

@@ -3,6 +3,7 @@
 
 #include <gtest/gtest.h>
 
+#include <regex>
 #include <string>
 
 namespace {
@@ -31,11 +32,20 @@ TEST(IcuFileName, OfANearMissCarriesNothing) {
     EXPECT_EQ(icu_schema_in(name), "") << name;
 }
 
-TEST(IcuFileName, WithANulByteCarriesNothing) {
-  for (std::size_t place = 0; place <= 12; ++place) {
-    std::string name = "icutz44l.dat";
-    name.insert(place, 1, '\0');
-    EXPECT_EQ(icu_schema_in(name), "") << place;
+TEST(IcuFileName, AgreesWithTheRegularExpressionOnEveryByteAnywhere) {
+  const std::regex grammar(R"(icutz([0-9]+[lbe])\.dat)");
+  const std::string valid = "icutz44l.dat";
+  for (std::size_t place = 0; place <= valid.size(); ++place) {
+    for (int byte = 0; byte < 256; ++byte) {
+      for (const std::size_t replaced : {0u, 1u}) {
+        std::string name = valid;
+        name.replace(place, replaced, 1, static_cast<char>(byte));
+        std::smatch groups;
+        std::regex_match(name, groups, grammar);
+        EXPECT_EQ(icu_schema_in(name), groups[1].str())
+            << testing::PrintToString(name);
+      }
+    }
   }
 }
 

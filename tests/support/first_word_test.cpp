@@ -133,25 +133,4 @@ TEST_F(FirstWord, LeavesTheErrorOfOpeningTheFileOrOfAnEarlierCall) {
   EXPECT_EQ(left_by_reading(), EXDEV);
 }
 
-TEST_F(FirstWord, IsReadThroughDescriptorZeroToo) {
-  make_file(path, "2016a");
-  const int standard_input = ::dup(0);
-  ::close(0);
-  EXPECT_EQ(read_first_word(path), "2016a");
-  ::dup2(standard_input, 0);
-  ::close(standard_input);
-}
-
-TEST_F(FirstWord, LeavesNoDescriptorOpen) {
-  const int before = ::dup(0);
-  ::close(before);
-  of("2016a");
-  of(std::string(10'000, 'x'));
-  make_directory("/usr/share/directory");
-  read_first_word("/usr/share/directory");
-  const int after = ::dup(0);
-  ::close(after);
-  EXPECT_EQ(after, before);
-}
-
 }  // namespace
