@@ -5,11 +5,10 @@
 set(root ${CPACK_TEMPORARY_DIRECTORY})
 
 if(CPACK_PACKAGE_FILES)
-  # Packed once more: the archive's members have the modes of cpack's umask.
-  file(REMOVE ${CPACK_PACKAGE_FILES})
   execute_process(
-    COMMAND ar rcD ${CPACK_PACKAGE_FILES} debian-binary control.tar.gz data.tar.gz
-    WORKING_DIRECTORY ${root} COMMAND_ERROR_IS_FATAL ANY)
+    COMMAND ${CMAKE_CURRENT_LIST_DIR}/pack-again ${root} ${CPACK_PACKAGE_FILES}
+            ${CPACK_PACKAGE_DIRECTORY} ${CPACK_MARLIN_BUILT}
+    COMMAND_ERROR_IS_FATAL ANY)
   return()
 endif()
 

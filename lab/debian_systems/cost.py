@@ -53,41 +53,34 @@ def only(lines: list[str], *keys: str) -> list[str]:
     return [line for line in lines if line.partition("=")[0] in keys]
 
 
-UNITS = PROJECT / "packaging"
-# By the place that the filter of system calls, or an empty set of capabilities, has.
-FILTERS = ("LockPersonality", "MemoryDenyWriteExecute", "RestrictAddressFamilies",
-           "RestrictNamespaces", "RestrictRealtime", "RestrictSUIDSGID")
-KERNEL = ("ProtectControlGroups", "ProtectKernelLogs",
-          "ProtectKernelModules", "ProtectKernelTunables", "ProtectProc")
-NETWORK = ("PrivateNetwork", "IPAddressDeny")
 CALLS = ("SystemCallFilter", "SystemCallArchitectures", "SystemCallErrorNumber")
 PROGRAM = ("Type", "RemainAfterExit", "ExecStart", "SyslogLevel", "SyslogLevelPrefix")
+STAYS = ("MemoryDenyWriteExecute", "RestrictAddressFamilies", "RestrictSUIDSGID",
+         "DevicePolicy", "ReadOnlyPaths")
+LEFT_OUT = ("LockPersonality", "RestrictRealtime", "RestrictNamespaces", "PrivateIPC",
+            "PrivateNetwork", "PrivateDevices", "PrivateTmp", "ProtectHome",
+            "ProtectHostname", "ProtectClock", "ProtectKernelLogs")
 
 
 def shipped() -> list[str]:
-    text = (UNITS / "marlin.service.in").read_text()
-    return section(text.replace("@CMAKE_INSTALL_FULL_LIBEXECDIR@", "/usr/libexec"))
+    text = (PROJECT / "packaging/marlin.service.in").read_text()
+    for name, value in (("CMAKE_INSTALL_FULL_LIBEXECDIR", "/usr/libexec"),
+                        ("MARLIN_ROOT", "/usr/lib/marlin"), ("MARLIN_LIBRARIES", "")):
+        text = text.replace(f"@{name}@", value)
+    return section(text)
 
 
 def variants() -> dict[str, list[str]]:
     unit = shipped()
-    lean = section((UNITS / "examples/lean.conf").read_text().replace(
-        "[Service]", "\n[Service]"))
     return {
         "no restriction": only(unit, *PROGRAM),
         "the list of system calls alone": only(unit, *PROGRAM, *CALLS),
         "as shipped": unit,
-        "with the lean drop-in": [*unit, *lean],
-        **{f"without {key}": without(unit, key) for key in (
-            "ProtectSystem", "ProtectHome", "InaccessiblePaths", "DevicePolicy",
-            "PrivateNetwork")},
-        "without " + ", ".join(KERNEL): without(unit, *KERNEL),
-        "without " + ", ".join(NETWORK): without(unit, *NETWORK),
-        "without " + ", ".join(FILTERS): without(unit, *FILTERS),
-        "with PrivateDevices, PrivateIPC, ProtectHostname, ProcSubset": [
-            *unit, "PrivateDevices=yes", "PrivateIPC=yes", "ProtectHostname=yes",
-            "ProcSubset=pid"],
-        "with InaccessiblePaths=/etc": [*unit, "InaccessiblePaths=/etc"],
+        "without the three empty places": [
+            line for line in unit if not line.startswith("BindPaths=/")],
+        **{f"without {key}": without(unit, key) for key in STAYS},
+        **{f"with {key}": [*unit, f"{key}=yes"] for key in LEFT_OUT},
+        "with ProtectSystem=strict": [*unit, "ProtectSystem=strict"],
     }
 
 

@@ -20,7 +20,7 @@ from lab.words.places import BUILD, PROJECT
 
 WORK = BUILD / "systems"
 GUEST = Path(__file__).parent / "guest"
-ROOT_PACKAGES = "apparmor,dbus,systemd,systemd-sysv,tzdata,udev"
+ROOT_PACKAGES = "apparmor,dbus,systemd,systemd-container,systemd-sysv,tzdata,udev"
 SYSVINIT = "sysvinit-core", "initscripts", "sysv-rc", "insserv", "startpar"
 # Nobody asks these systems anything, and nobody reads on them.
 LEFT_OUT = [word for place in ("doc", "info", "locale", "man", "lintian")

@@ -32,6 +32,7 @@ static const char* const new_files[] = {
     "/run/entry",
     "/run/lock/entry",
     "/run/systemd/entry",
+    "/run/systemd/incoming/entry",
     "/run/systemd/system/entry.service",
     "/run/user/entry",
     "/tmp/entry",

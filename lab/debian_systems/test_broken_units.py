@@ -47,7 +47,7 @@ def forged(init: str) -> Callable[[], None]:
 FAULTS = {
     "a directory for devices": Fault(
         test_var.test_a_read_only_root_without_tmp,
-        without("BindReadOnlyPaths") + added("PrivateDevices=yes"),
+        added("PrivateDevices=yes"),
         (ENDED + "('exit-code', 'failed', '226')",)),
     "directories for temporary files": Fault(
         test_var.test_a_read_only_root_without_tmp, added("PrivateTmp=yes"),
@@ -76,8 +76,8 @@ FAULTS = {
         test_package_on_a_system.test_a_package_comes_and_goes,
         STARTED, ("['refused to stop'] == ",)),
     "open places": Fault(
-        test_probe.test_the_probe_is_refused,
-        without("ProtectSystem", "DevicePolicy", "LimitCORE", "InaccessiblePaths") +
+        lambda: test_probe.test_the_probe_is_refused("rw"),
+        without("RootDirectory", "Bind", "ReadOnlyPaths", "DevicePolicy", "LimitCORE") +
         added("SystemCallFilter=rename"),
         ("marlin.service: call rename: No such file or directory",
          "marlin.service: write /usr/entry: done",

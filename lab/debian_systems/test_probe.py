@@ -1,6 +1,6 @@
 # SPDX-License-Identifier: BSD-2-Clause
-"""What a program can do in marlin's place, under the unit as it ships, with the lean
-example beside it, and under no restriction; and what a profile adds to that."""
+"""What a program can do in marlin's place, under the unit as it ships, with drop-ins of
+somebody else's, and under no restriction; and what a profile adds to that."""
 
 import re
 
@@ -12,11 +12,19 @@ from lab.debian_systems.scene import (ZONE, device, fail, insist, install_update
 from lab.words import lines
 from lab.words.paths import LOCALTIME, RECORD, ZONEINFO
 
-LEAN = "/usr/share/doc/marlin/examples/lean.conf"
 APPARMOR = "/usr/share/doc/marlin/examples/apparmor"
-# All else is refused. The program is the owner of what is root's, and this is.
-DONE = {"write /var/db/entry", "write /var/db/timezone/entry",
-        "read /etc/shadow", "read /run/secret"}
+# All else is refused: there is nothing else.
+DONE = {"write /var/db/entry", "write /var/db/timezone/entry"}
+# What a fleet may set for all services, and the empty places that come with it.
+FOREIGN = {
+    "ProtectSystem=strict": (), "ReadOnlyPaths=/": (), "ReadWritePaths=/": (),
+    "ProtectHome=yes": (), "ProtectHome=tmpfs": ("/home", "/root", "/run/user"),
+    "PrivateTmp=yes": ("/tmp", "/var/tmp"), "PrivateDevices=yes": (),
+    "PrivateIPC=yes": ("/dev/mqueue",), "ProtectKernelLogs=yes": (),
+    "ProtectKernelTunables=yes": (), "ProtectControlGroups=yes": (),
+    "ProtectProc=invisible": (), "MountAPIVFS=yes": ()}
+UNITS = {UNIT: ("", ()), **{
+    f"foreign-{number}.service": row for number, row in enumerate(FOREIGN.items())}}
 
 
 def results(seen: Seen, unit: str) -> dict[str, str]:
@@ -52,31 +60,50 @@ def shortcomings(tried: dict[str, str], may: set[str], free: dict[str, str]):
             yield f"{what}: {result}; without restrictions: {unrestricted}"
 
 
-def test_the_probe_is_refused():
-    system = System("probe", f"""
+def probed(root="rw") -> Seen:
+    """One boot with the probe in marlin's place, under each of UNITS, without most of
+    the unit's root, to read what the kernel tells of the probe, and under nothing."""
+    added = "".join(f"made {name} '{line}'\n" for name, (line, _) in UNITS.items()
+                    if line)
+    return System(f"probe-{root}", f"""
         cp usr/lib/lab/probe/marlin usr/libexec/marlin
         {linked(device())}
         chmod 640 etc/shadow
-        echo 'f /run/secret 0600 - - - secret' >etc/tmpfiles.d/secret.conf""")
-    seen = system.boot(f"""
+        echo 'f /run/secret 0600 - - - secret' >etc/tmpfiles.d/secret.conf
+        {"echo '/dev/nvme0n3 /var ext4 defaults 0 0' >etc/fstab" * (root == "ro")}
+        """, apart="var" * (root == "ro")).boot(f"""
         cd /run/systemd/system
-        grep -v ^Refuse /usr/lib/systemd/system/{UNIT} >lean.service
-        mkdir lean.service.d
-        cp {LEAN} lean.service.d
-        grep -Ev '^(Refuse|InaccessiblePaths)' /usr/lib/systemd/system/{UNIT} \
-          >open.service
+        made() {{
+          grep -v ^Refuse /usr/lib/systemd/system/{UNIT} >$1
+          mkdir $1.d
+          printf '[Service]\\n%s\\n' "$2" >$1.d/fleet.conf
+        }}
+        {added}
+        made open.service MountAPIVFS=yes
+        sed -i '/^BindPaths=.*:/d' open.service
         printf %s '{BARE}' >bare.service
         systemctl daemon-reload
-        systemctl start lean.service open.service bare.service""")
+        mkdir /run/systemd/incoming
+        [ -w /tmp ] || mount -t tmpfs tmpfs /tmp
+        systemctl start foreign-*.service open.service
+        mount -o remount,rw /
+        systemctl start bare.service""", options=root)
+
+
+@pytest.mark.parametrize("root", ["rw", pytest.param("ro", marks=pytest.mark.rest)])
+def test_the_probe_is_refused(root):
+    seen = probed(root)
+    free = results(seen, "bare.service")
+    assert list(free)[-1] == "call mmap of writable code"
     capabilities = {what: result.strip() for what, result in results(
         seen, "open.service").items() if what.startswith("Cap")}
     assert set(capabilities.values()) == {"0" * 16} and len(capabilities) == 5
-    free = results(seen, "bare.service")
-    assert list(free)[-1] == "call mmap of writable code"
-    lean = {what for what in DONE if what.startswith("write")}
-    fail(seen, [f"{unit}: {text}" for unit, may in (
-        (UNIT, DONE), ("lean.service", lean))
-                for text in shortcomings(results(seen, unit), may, free)])
+    found = []
+    for unit, (line, empty) in UNITS.items():
+        may = DONE | {f"write {place}/entry" for place in empty}
+        found += [f"{unit} {line}".strip() + f": {text}"
+                  for text in shortcomings(results(seen, unit), may, free)]
+    fail(seen, found)
 
 
 @pytest.mark.parametrize("enforced", [True, False], ids=["enforced", "not loaded"])

@@ -43,18 +43,17 @@ def test_a_read_only_root_without_tmp():
 
 
 @pytest.mark.rest
-def test_a_read_only_root_with_the_lean_unit_and_the_mend():
+def test_a_read_only_root_with_the_mend():
     """Links of two data sets; the update is announced."""
     drop_ins = f"etc/systemd/system/{UNIT}.d"
     made = device(active=True, announced=True)
     made.drop(ICUTZ)
     update = names().update
-    system = System("lean", f"""
+    system = System("mend", f"""
         {install_update_here()} {linked(made)}
         echo '{VAR.format("defaults")}' >etc/fstab
         rmdir tmp
         mkdir {drop_ins}
-        cp {EXAMPLES}/lean.conf {drop_ins}
         cp {EXAMPLES}/{UNIT}.d/mend.conf {drop_ins}""", apart="var")
     seen = system.boot(options="ro")
     mended = f" marlin-mend: {ZONEINFO} did not fit {ICUTZ}; marlin makes both anew"

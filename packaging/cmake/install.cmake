@@ -28,6 +28,29 @@ endforeach()
 install(FILES docs/marlin-layout.5 DESTINATION ${CMAKE_INSTALL_MANDIR}/man5)
 
 if(MARLIN_UNIT_DIR)
+  # The root that the unit shows marlin: places to mount what it sees, and what
+  # others may want to mount. Not even the owner may write where only "run" and
+  # the like are.
+  set(MARLIN_ROOT ${CMAKE_INSTALL_PREFIX}/lib/marlin)
+  if(NOT MARLIN_STATIC)
+    set(MARLIN_LIBRARIES "BindReadOnlyPaths=-/lib -/lib64 -/usr/lib\n")
+    install(DIRECTORY DESTINATION lib/marlin/lib)
+    install(DIRECTORY DESTINATION lib/marlin/lib64)
+    install(DIRECTORY DESTINATION lib/marlin/usr/lib)
+  endif()
+  foreach(place usr/share/icu usr/share/zoneinfo.default var/db)
+    install(DIRECTORY DESTINATION lib/marlin/${place})
+  endforeach()
+  foreach(place dev/mqueue dev etc home proc root run/systemd/incoming run/systemd
+                run/user run sys/fs/cgroup sys/fs sys tmp var/tmp)
+    install(DIRECTORY DESTINATION lib/marlin/${place}
+            DIRECTORY_PERMISSIONS OWNER_READ OWNER_EXECUTE)
+  endforeach()
+  file(WRITE ${PROJECT_BINARY_DIR}/packaging/empty "")
+  foreach(program marlin marlin-mend)
+    install(FILES ${PROJECT_BINARY_DIR}/packaging/empty
+            DESTINATION lib/marlin/usr/libexec RENAME ${program})
+  endforeach()
   configure_file(packaging/marlin.service.in packaging/marlin.service @ONLY)
   install(FILES ${PROJECT_BINARY_DIR}/packaging/marlin.service
           DESTINATION ${MARLIN_UNIT_DIR})

@@ -13,6 +13,7 @@ set(CPACK_INSTALL_DEFAULT_DIRECTORY_PERMISSIONS
 # The system's name for the processor; a cross build has no dpkg to ask.
 set(architecture_x86_64 amd64)
 set(architecture_aarch64 arm64)
+set(architecture_arm armhf)
 set(CPACK_DEBIAN_PACKAGE_ARCHITECTURE
     ${architecture_${CMAKE_SYSTEM_PROCESSOR}})
 set(CPACK_DEBIAN_FILE_NAME DEB-DEFAULT)
@@ -31,5 +32,6 @@ endif()
 set(CPACK_PRE_BUILD_SCRIPTS ${PROJECT_SOURCE_DIR}/packaging/finish-package.cmake)
 set(CPACK_POST_BUILD_SCRIPTS ${CPACK_PRE_BUILD_SCRIPTS})
 set(CPACK_MARLIN_STATIC ${MARLIN_STATIC})
+set(CPACK_MARLIN_BUILT ${PROJECT_BINARY_DIR} ${CMAKE_CXX_COMPILER} ${CMAKE_OBJCOPY})
 
 include(CPack)
