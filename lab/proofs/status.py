@@ -778,7 +778,7 @@ def test_a_record_of_another_user(status, change):
     assert (done.returncode, done.stdout) == (status, "")
     assert done.stderr == ("" if status == 0 else
                            f"marlin-status: cannot tell: {RECORD} belongs to another "
-                           "user, whose rights this user has not; run this as root\n")
+                           "user or group, or has an access list; run this as root\n")
 
 
 def test_a_directory_of_another_user():
@@ -788,7 +788,7 @@ def test_a_directory_of_another_user():
         [*AS_ROOT, f"""mount --bind {another_users("", "/etc")} {TREE}/var/db
              exec {STATUS} --root {TREE}"""], capture_output=True, text=True)
     assert Answer(done.returncode, done.stdout, done.stderr) == cannot_tell(
-        "/var/db belongs to another user, whose rights this user has not; run this as "
+        "/var/db belongs to another user or group, or has an access list; run this as "
         "root")
 
 

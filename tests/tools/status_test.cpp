@@ -7,7 +7,6 @@
 #include <nlohmann/json.hpp>
 
 #include "tools/status/report.h"
-#include "tools/status/words.h"
 
 namespace {
 

@@ -11,7 +11,6 @@
 #include "tools/status/limits.h"
 #include "tools/status/report.h"
 #include "tools/status/throwaway.h"
-#include "tools/status/words.h"
 
 namespace {
 
@@ -52,12 +51,11 @@ void insist_on_enough_memory(const report& told) {
 // sound.
 void insist_on_rights(const report& told, const place& here) {
   const std::string& foreign = told.device.foreign_part;
-  if (!here.has_all_users && !foreign.empty() &&
-      (told.why.is != verdict::sound || told.device.has_closed_part ||
-       !here.has_one_owner))
+  if (!foreign.empty() && (told.why.is != verdict::sound ||
+                           told.device.has_closed_part || !here.has_one_owner))
     throw cannot_tell(escaped(foreign) +
-                      " belongs to another user, whose rights this user has "
-                      "not; run this as root");
+                      " belongs to another user or group, or has an access "
+                      "list; run this as root");
 }
 
 // Tried, because it does not follow from the links.
@@ -78,9 +76,9 @@ report examine(const std::string& root) {
   report told;
   told.device = read_device();
   if (!here.has_all_users) {
-    if (!here.foreign_part.empty())
-      told.device.foreign_part = here.foreign_part;
+    told.device.foreign_part = here.foreign_part;
     told.device.has_known_owner = !here.has_foreign_links;
+    note_rights(told.device);
   }
   insist_on_enough_memory(told);
   told.boot = rehearse_boot();

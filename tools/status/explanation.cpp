@@ -9,7 +9,6 @@
 
 #include "tools/escaped.h"
 #include "tools/status/failure.h"
-#include "tools/status/words.h"
 
 namespace {
 
@@ -41,8 +40,8 @@ constexpr std::string_view walk_failed =
 struct row {
   std::string_view name, does, reason;
   verdict is;
-  // "%1" and "%2" are texts of the device, "%e" the text of an error. A reset
-  // of the links is told behind it.
+  // "%1" and "%2" are texts of the device, "%e" the text of an error. What is
+  // refused stands before it, what a reset leads to behind it.
   std::string_view text;
 };
 
@@ -88,16 +87,13 @@ constexpr row table[] = {
     {"usable", "reset", "no_version", wrong, "its name %1 is no version"},
 
     {"update", "nothing", "none", sound, "none is announced"},
-    {"update", "refused", "same_set", sound, "%1 is in use already"},
-    {"update", "refused", "other_schema", wrong, "%1 is refused: it has %2"},
-    {"update", "refused", "same_version", wrong,
-     "%1 is refused: %2 is of the same version"},
-    {"update", "refused", "no_version", wrong,
-     "%1 is refused: the name is no version"},
-    {"update", "refused", "older", wrong, "%1 is refused: %2 is newer"},
+    {"update", "refused", "same_set", sound, "it is in use already"},
+    {"update", "refused", "other_schema", wrong, "it has %2"},
+    {"update", "refused", "same_version", wrong, "%2 is of the same version"},
+    {"update", "refused", "no_version", wrong, "the name is no version"},
+    {"update", "refused", "older", wrong, "%2 is newer"},
     {"update", "refused", "changed_by_the_boot", wrong,
-     "%1 is refused: its data is reached through a link that the boot has just "
-     "changed"},
+     "its data is reached through a link that the boot has just changed"},
     {"update", "failed", "last_resort", wrong, "%1 cannot be used"},
     {"update", "activated", "newer", changes, "%1 is activated: newer than %2"},
 
@@ -125,19 +121,14 @@ constexpr row table[] = {
     {"localtime", "kept", "accepted", sound, "the link is kept"},
     {"localtime", "corrected", "former_place", changes,
      "the link is corrected to %1"},
-    {"localtime", "reset", "no_link", changes,
-     "there is no link: the default zone is set"},
-    {"localtime", "reset", "elsewhere", wrong,
-     "the link leads elsewhere: the default zone is set"},
+    {"localtime", "reset", "no_link", changes, "there is no link"},
+    {"localtime", "reset", "elsewhere", wrong, "the link leads elsewhere"},
     {"localtime", "reset", "zone_unreachable", wrong,
-     "the zone in the corrected link cannot be reached: the default zone is "
-     "set"},
+     "the zone in the corrected link cannot be reached"},
     {"localtime", "reset", "not_replaced", wrong,
-     "the corrected link cannot be made: the default zone is set"},
-    {"localtime", "reset", "not_a_link", wrong,
-     "it is not a link: the default zone is set"},
-    {"localtime", "reset", "unreadable", wrong,
-     "it cannot be read: the default zone is set"},
+     "the corrected link cannot be made"},
+    {"localtime", "reset", "not_a_link", wrong, "it is not a link"},
+    {"localtime", "reset", "unreadable", wrong, "it cannot be read"},
     {"localtime", "failed", "not_made", wrong,
      "the default link cannot be made: %e"},
 
@@ -156,16 +147,6 @@ constexpr row table[] = {
     {"local_zone", "found", "missing", wrong,
      "its file cannot be reached after the boot"},
 };
-
-constexpr bool is_once_in_the_table(const row& one) {
-  return std::count_if(
-             std::begin(table), std::end(table), [&](const row& other) {
-               return other.name == one.name && other.does == one.does &&
-                      other.reason == one.reason;
-             }) == 1;
-}
-static_assert(std::all_of(std::begin(table), std::end(table),
-                          is_once_in_the_table));
 
 // Why a link is reset; `of_its_target`, if it is one that can be read.
 std::string_view flaw_of(const entry& here, std::string_view of_its_target) {
@@ -246,7 +227,11 @@ class account {
       done.text += what == 'e' ? std::strerror(error)
                                : escaped(what == '1' ? first : second);
     }
-    if (does == "reset" && (name == "current" || name == "usable"))
+    if (does == "refused")
+      done.text = escaped(first) + " is refused: " + done.text;
+    if (does == "reset" && name == "localtime")
+      done.text += ": the default zone is set";
+    else if (does == "reset" && name != "last_resort")
       done.text += ": a reset to the system partition";
     told_.is = std::max(told_.is, found->is);
     if (found->is != sound) told_.reasons.push_back(done);

@@ -7,6 +7,7 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <array>
 #include <cerrno>
 #include <climits>
 #include <cstdlib>
@@ -23,7 +24,7 @@
 #include "driver/dataset_links.h"
 #include "support/fsutil.h"
 #include "support/paths.h"
-#include "tools/status/line.h"
+#include "tools/status/rehearsal.h"
 
 namespace {
 
@@ -57,18 +58,24 @@ std::string real_path(const std::string& path) {
   return ::realpath(path.c_str(), real) == nullptr ? "" : real;
 }
 
-// Whether others than root keep their way to what is there, and may read it.
-// What is not there is closed to nobody.
-bool is_closed(const std::string& path) {
-  const std::string real = real_path(path);
+// Whose the first part is, on the way or at its end, that others than its owner
+// may not pass or, a directory too if `lists`, read.
+std::optional<uid_t> owner_of_closed(const std::string& path, bool lists) {
+  char resolved[PATH_MAX];
+  // What is on the way is there too if this process may not go on.
+  if (::realpath(path.c_str(), resolved) == nullptr && errno != EACCES)
+    return std::nullopt;
+  const std::string real = resolved;
+  struct stat status {};
   for (std::size_t end = 0; end < real.size();) {
     end = std::min(real.find('/', end + 1), real.size());
-    struct stat status {};
-    if (::stat(real.substr(0, end).c_str(), &status) != 0) return true;
-    if ((status.st_mode & (S_ISDIR(status.st_mode) ? S_IXOTH : S_IROTH)) == 0)
-      return true;
+    if (::stat(real.substr(0, end).c_str(), &status) != 0) return status.st_uid;
+    const mode_t needed = !S_ISDIR(status.st_mode) ? S_IROTH
+                          : lists                  ? S_IXOTH | S_IROTH
+                                                   : S_IXOTH;
+    if ((status.st_mode & needed) != needed) return status.st_uid;
   }
-  return false;
+  return std::nullopt;
 }
 
 entry record_at(const char* path) {
@@ -137,39 +144,6 @@ void list_downloads(device_facts& device) {
     for (const auto& [name, needed_by] : sets)
       if (needed_by.empty() != is_needed)
         device.downloads.push_back({name, needed_by});
-}
-
-// Notes whose the parts are that a boot reads. That does not matter where
-// everybody may read them.
-void note_rights(device_facts& device) {
-  const auto look_at = [&](const std::string& part) {
-    struct stat status {};
-    if (::stat(part.c_str(), &status) != 0) return;
-    const mode_t for_all = S_ISDIR(status.st_mode) ? 0555 : 0444;
-    if ((status.st_mode & for_all) == for_all) return;
-    device.has_closed_part = true;
-    if (status.st_uid == nobody && device.foreign_part.empty())
-      device.foreign_part = part;
-  };
-  const auto look_at_update = [&](const std::string& path) {
-    look_at(path);
-    for (const char* entry : paths::update_entries) look_at(path + "/" + entry);
-    look_at(path + "/zoneinfo/+VERSION");
-  };
-  const std::string& zone = device.links.localtime.text;
-  for (const std::string& part :
-       {std::string("/"), std::string("/var/db"),
-        std::string("/var/db/timezone"), std::string(paths::version_record),
-        std::string("/usr"), std::string("/usr/share"),
-        std::string(paths::system_zoneinfo),
-        std::string(paths::system_zoneinfo) + "/+VERSION",
-        std::string(paths::system_icu),
-        std::string(paths::system_icu) + "/icutzformat.txt",
-        std::string("/var"), std::string(paths::download_root),
-        zone.substr(0, zone.rfind('/'))})
-    look_at(part);
-  for (const auto* set : {&device.current, &device.update})
-    if (*set && !(*set)->path.empty()) look_at_update((*set)->path);
 }
 
 void expect_file(dataset_facts& facts, const std::string& path) {
@@ -288,8 +262,27 @@ unsigned refusals() { return refused; }
 std::string closed_part() {
   for (const char* path :
        {"/var/db/timezone", paths::localtime_link, paths::icu_link})
-    if (is_closed(path)) return path;
+    if (owner_of_closed(path, false)) return path;
   return {};
+}
+
+void note_rights(device_facts& device) {
+  std::vector<std::string> parts = {
+      "/var/db/timezone", paths::system_zoneinfo,
+      std::string(paths::system_zoneinfo) + "/+VERSION", paths::system_icu,
+      std::string(paths::system_icu) + "/icutzformat.txt"};
+  const std::string& zone = device.links.localtime.text;
+  parts.push_back(zone.substr(0, zone.rfind('/')));
+  for (const auto* set : {&device.current, &device.update})
+    if (*set && !(*set)->path.empty())
+      for (const char* part : {"", "/zoneinfo", "/zoneinfo/+VERSION", "/icutz"})
+        parts.push_back((*set)->path + part);
+  for (const auto& part : parts)
+    if (const auto owner = owner_of_closed(part, true)) {
+      device.has_closed_part = true;
+      if (*owner == nobody && device.foreign_part.empty())
+        device.foreign_part = part;
+    }
 }
 
 link_facts read_links() {
@@ -333,7 +326,42 @@ device_facts read_device() {
   if (device.links.tz_latest.what == entry::kind::link)
     device.update = facts_of(latest_update_path(), system.get());
   list_downloads(device);
-  note_rights(device);
   take_lines(nullptr);
   return device;
+}
+
+std::string kind_of(const entry& here) {
+  static constexpr std::array names = {"none",      "link",    "file",
+                                       "directory", "special", "unknown"};
+  return names.at(static_cast<std::size_t>(here.what));
+}
+
+std::string data_in_use(const link_facts& links) {
+  if (!links.current_path) return "none";
+  return links.current_path->empty() ? "system" : "update";
+}
+
+bool fits(link_pair pair) {
+  return pair == link_pair::system || pair == link_pair::update;
+}
+
+pair_words words_for(link_pair pair) {
+  static constexpr pair_words words[] = {
+      {"system", "zoneinfo and icutz name the same data"},
+      {"update", "zoneinfo and icutz name the same data"},
+      {"update_without_icu",
+       "zoneinfo names an update, but there is no link icutz"},
+      {"update_with_other_icu",
+       "icutz does not name the ICU data of zoneinfo's update"},
+      {"system_with_icu",
+       "zoneinfo names the system partition, but there is a link icutz"},
+      {"not_the_tree", "zoneinfo leads into an update, but not to its tree"},
+      {"no_dataset", "zoneinfo names no data set"}};
+  return words[static_cast<std::size_t>(pair)];
+}
+
+std::string zone_of(const link_facts& links) {
+  const std::string tree = std::string(paths::zoneinfo_link) + "/";
+  if (!links.localtime.text.starts_with(tree)) return {};
+  return links.localtime.text.substr(tree.size());
 }

@@ -115,9 +115,30 @@ link_facts read_links();
 // What readers need and only root may read, as it is now; empty: nothing.
 std::string closed_part();
 
+// Notes whose the parts are that a boot reads, where not everybody may.
+void note_rights(device_facts& device);
+
 // How often memory was refused to this process from now on is counted.
 void count_refusals();
 unsigned refusals();
 
 // All of it. The data sets are read as a boot reads them.
 device_facts read_device();
+
+// The words in which they are told, the same for people and for programs.
+std::string kind_of(const entry& here);
+
+// Which data is in use: "system", "update", or "none" when "zoneinfo" names no
+// data set.
+std::string data_in_use(const link_facts& links);
+
+// How the links fit: a name, such as "update_without_icu", and a sentence.
+struct pair_words {
+  const char* name;
+  const char* sentence;
+};
+pair_words words_for(link_pair pair);
+bool fits(link_pair pair);
+
+// The zone that "localtime" names, below the active tree; empty: none.
+std::string zone_of(const link_facts& links);

@@ -5,7 +5,6 @@
 
 #include "tools/escaped.h"
 #include "tools/status/report.h"
-#include "tools/status/words.h"
 
 namespace {
 

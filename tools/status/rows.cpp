@@ -4,7 +4,6 @@
 #include "support/paths.h"
 #include "tools/escaped.h"
 #include "tools/status/report.h"
-#include "tools/status/words.h"
 
 namespace {
 

@@ -10,12 +10,14 @@
 #include <sys/stat.h>
 #include <sys/statvfs.h>
 #include <sys/syscall.h>
+#include <sys/xattr.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <cerrno>
 #include <cstdint>
 #include <cstdio>
+#include <cstring>
 #include <memory>
 #include <optional>
 #include <set>
@@ -183,57 +185,61 @@ void attach(const descriptor& tree, const descriptor& target) {
 }
 
 // The layers over "/var/db" and what is mounted below. All paths here are seen
-// from the base, in which the device is "/root". `original` is the device as it
-// was, if what is read only there is to stay so, otherwise none.
+// from the base, in which the device is "/root".
 class layers {
  public:
-  layers(const descriptor& root, const process& self, const place& here,
-         const descriptor& original)
-      : root_(root), self_(self), here_(here), original_(original) {}
-
-  void lay() {
+  // Finds what has to be covered, before everything becomes read only.
+  layers(const descriptor& root, const process& self, const place& here)
+      : root_(root), self_(self), here_(here) {
     const descriptor base = open_inside(root_.number(), writable, O_DIRECTORY);
     // Without the directory there is nothing that a boot could write to.
     if (base.number() < 0) return;
     const std::string top = self_.path_of(base);
+    std::set<std::string> places = self_.mounts_below(top);
+    places.insert(top);
+    for (const auto& place : places) find(place.substr(std::strlen("/root")));
     // Without the layer, which shows some files of an update as missing.
-    const descriptor kept = open_inside(root_.number(), downloads, O_DIRECTORY);
+    kept_ = open_inside(root_.number(), downloads, O_DIRECTORY);
+  }
 
-    std::vector<std::pair<std::string, descriptor>> mounted;
-    for (const auto& place : self_.mounts_below(top))
-      mounted.emplace_back(place, open_inside(root_.number(), inside(place)));
-    cover(base, base, inside(top));
-    for (const auto& [place, lower] : mounted) {
-      const descriptor target = open_inside(root_.number(), inside(place));
-      if (lower.number() >= 0 && target.number() >= 0)
-        cover(lower, target, inside(place));
+  void lay() const {
+    for (const auto& one : found_) {
+      const descriptor target = open_inside(root_.number(), one.path);
+      if (target.number() >= 0) cover(one, target);
     }
-    protect_downloads(kept);
+    const descriptor tz = open_inside(root_.number(), downloads, O_DIRECTORY);
+    if (kept_.number() < 0 || tz.number() < 0) return;
+    const descriptor copy = clone_tree(kept_, AT_RECURSIVE);
+    set_attributes(copy.number(), AT_RECURSIVE, MOUNT_ATTR_RDONLY);
+    attach(copy, tz);
   }
 
  private:
-  static std::string inside(const std::string& place) {
-    return place.substr(std::string("/root").size());
-  }
+  struct covered {
+    std::string path;
+    descriptor place;
+    bool is_read_only;  // as the running system has it
+  };
 
-  bool is_read_only(const std::string& place) const {
-    if (original_.number() < 0) return false;
-    const descriptor before = open_inside(original_.number(), place);
+  void find(const std::string& path) {
+    descriptor place = open_inside(root_.number(), path);
+    if (place.number() < 0) return;
     struct statvfs status {};
-    must(::fstatvfs(before.number(), &status), "statvfs");
-    return (status.f_flag & ST_RDONLY) != 0;
+    must(::fstatvfs(place.number(), &status), "statvfs");
+    found_.push_back(
+        {path, std::move(place),
+         here_.is_running_system && (status.f_flag & ST_RDONLY) != 0});
   }
 
-  void cover(const descriptor& lower, const descriptor& target,
-             const std::string& place) {
+  void cover(const covered& below, const descriptor& target) const {
     struct stat status {};
-    must(::fstat(lower.number(), &status), "stat");
-    const std::string name = std::to_string(count_++);
+    must(::fstat(below.place.number(), &status), "stat");
+    const std::string name = std::to_string(&below - found_.data());
     const descriptor cover =
-        S_ISDIR(status.st_mode)   ? layer(lower, name, status)
-        : S_ISREG(status.st_mode) ? copy(lower, name, status)
-                                  : clone_tree(lower);
-    if (is_read_only(place))
+        S_ISDIR(status.st_mode)   ? layer(below.place, name, status)
+        : S_ISREG(status.st_mode) ? copy(below.place, name, status)
+                                  : clone_tree(below.place);
+    if (below.is_read_only)
       set_attributes(cover.number(), 0, MOUNT_ATTR_RDONLY);
     attach(cover, target);
   }
@@ -295,20 +301,25 @@ class layers {
     return clone_tree(to);
   }
 
-  void protect_downloads(const descriptor& kept) const {
-    const descriptor tz = open_inside(root_.number(), downloads, O_DIRECTORY);
-    if (kept.number() < 0 || tz.number() < 0) return;
-    const descriptor copy = clone_tree(kept, AT_RECURSIVE);
-    set_attributes(copy.number(), AT_RECURSIVE, MOUNT_ATTR_RDONLY);
-    attach(copy, tz);
-  }
-
   const descriptor& root_;
   const process& self_;
   const place& here_;
-  const descriptor& original_;
-  int count_ = 0;
+  std::vector<covered> found_{};  // parents first
+  descriptor kept_{};
 };
+
+// What this user cannot stand in for: in a layer, it cannot be changed.
+void note_foreign_parts(place& here) {
+  for (const char* path : {"/", writable, links, paths::version_record}) {
+    struct stat status {};
+    if (::stat(path, &status) != 0) continue;
+    const bool is_foreign =
+        status.st_uid != 0 || status.st_gid != 0 ||
+        ::getxattr(path, "system.posix_acl_access", nullptr, 0) > 0;
+    if (is_foreign && here.foreign_part.empty()) here.foreign_part = path;
+    if (path == links) here.has_foreign_links = status.st_uid != 0;
+  }
+}
 
 void insist_on_a_device(const std::string& root) {
   struct stat status {};
@@ -342,15 +353,9 @@ place enter_throwaway_device(const std::string& root) {
   const process self;
   here.has_all_users = self.has_all_users();
   here.is_running_system = self.path_of(device) == "/";
-  for (const char* path : {"/", writable, links, paths::version_record})
-    if (owner_of(device.number(), path).value_or(0) != 0) {
-      if (here.foreign_part.empty()) here.foreign_part = path;
-      if (path == links) here.has_foreign_links = true;
-    }
 
   // Taken before anything is covered.
   const descriptor tree = clone_tree(device, AT_RECURSIVE);
-  set_attributes(tree.number(), AT_RECURSIVE, MOUNT_ATTR_RDONLY);
   // A base of our own. Where it lies does not matter: this process sees nothing
   // else from then on, and no other process sees it.
   must(::mount("base", "/proc", "tmpfs", 0, "mode=0755,size=64m"), "tmpfs",
@@ -360,13 +365,15 @@ place enter_throwaway_device(const std::string& root) {
   must(::mkdir("/root", 0700), "mkdir");
   attach(tree, open_directory("/root"));
   const descriptor inside = open_directory("/root");
+  const layers covers(inside, self, here);
+  set_attributes(inside.number(), AT_RECURSIVE, MOUNT_ATTR_RDONLY);
 
   enter(inside);
   insist_on_a_device(root);
+  note_foreign_parts(here);
   const sight before = look_around();
   enter(base);
-  const descriptor none;
-  layers(inside, self, here, here.is_running_system ? device : none).lay();
+  covers.lay();
   enter(inside);
   insist_on_the_same(before, look_around());
   return here;
