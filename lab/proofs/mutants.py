@@ -3,11 +3,11 @@
 
 Breaks the program on purpose and shows which breaks no test notices. Mutants of
 driver/, dataset/ and support/ are made by rule, in one place at a time: an operator, a
-constant, a text, a name, a condition, a statement; and by hand, each to break a
-sentence of what the program must do: mutants_by_hand.txt. Every one is built in a copy
-of the project and the test programs run against it, the one named after its folder
-first, slow tests last, up to the first failure; one that hangs is killed too. Survivors
-are printed.
+constant, a text, a name, a condition, a statement, two neighbours; and by hand, each to
+break a sentence of what the program must do: mutants_by_hand.txt. Every one is built in
+a copy of the project and the test programs run against it, the one named after its
+folder first, slow tests last, up to the first failure; one that hangs is killed too.
+Survivors are printed, and mutants by hand that do not build.
 
 Those that change nothing that anybody could notice are listed, with a reason each, in
 mutants_equivalent.txt. Exit status: 0 when there is no other, 1 when there is, 2 for
@@ -25,7 +25,6 @@ import random
 import re
 import subprocess
 import sys
-import threading
 import time
 from collections import Counter
 from collections.abc import Iterator
@@ -40,6 +39,9 @@ from lab.words.places import BUILD, PROJECT
 PLACE = BUILD / "mutants"
 FOLDERS = ("support", "dataset", "driver")
 SLOW = 200  # milliseconds; a test that takes longer comes last
+# What the mutants take.
+HEADERS = ("clocale cstdlib exception fcntl.h stdexcept sys/file.h sys/stat.h "
+           "unistd.h").split()
 
 
 class Mutant(NamedTuple):
@@ -68,7 +70,11 @@ REPLACED = [  # what stands in the group of a pattern, and by what
       for name, other in zip(NAMES[::2], NAMES[1::2])),
     *((rf"(?<= )({re.escape(operator)})(?= |\n)", others.split())
       for operator, others in OPERATORS.items()),
-    (r"(?<![\w!])(!)(?=[\w(:])", [""]), (r"catch \((\.\.\.)\)", ["char", "int"])]
+    (r"(?<![\w!])(!)(?=[\w(:])", [""]),
+    (r"catch \((\.\.\.)\)", ["char", "int", "const std::exception&"])]
+MOVABLE = (r"(?!\s|for\b|return\b|throw\b|using\b|(?:inline )?constexpr\b)"
+           r"(?:[^;{}]|\{[^;{}]*\})+;")
+NEIGHBOURS = re.compile(rf"(?<=[;:{{}}])\s*\n\s*(?=({MOVABLE})\s*\n\s*({MOVABLE}))")
 STATEMENT = re.compile(
     r"(?:(?<=[;{})])|(?<=else))\s+"
     r"((?:throw|return)\b[^;{}]*;|[*\w:.>[\]-]+(?:\(| \+?= )[^;]*;)")
@@ -176,6 +182,13 @@ def changes(source):
             yield *found.span(1), "throw 0;"
         if re.match(r"return (?!{|0;|false;|std::nullopt;)", found[1]):
             yield *found.span(1), "return {};"
+    for found in NEIGHBOURS.finditer(code):  # statements and members, swapped
+        (start, middle), (rest, end) = found.span(1), found.span(2)
+        first, second = source[start:middle], source[rest:end]
+        # In a header the order of functions means nothing, unless they are virtual.
+        if ("#pragma once" not in source or "(" not in first + second or
+                first.startswith("virtual") and second.startswith("virtual")):
+            yield start, end, second + source[middle:rest] + first
 
 
 def by_rule() -> Iterator[Mutant]:
@@ -201,38 +214,30 @@ def by_rule() -> Iterator[Mutant]:
                          f"{file}: {change}")
 
 
-def edits(body: str) -> Iterator[tuple[str, str, str]]:
-    """(file, before, after) of each edit of a mutant by hand."""
-    def lines(sign: str, edit: str) -> str:
-        return "\n".join(line[2:] for line in edit.splitlines() if line[0] == sign)
-
-    for edit in re.split(r"^  ", body, flags=re.M)[1:]:
-        yield edit.partition("\n")[0], lines("-", edit), lines("+", edit)
+def listed(name: str) -> Iterator[tuple[str, str]]:
+    """(sentence, line) for each line below a sentence; a deeper line goes on."""
+    text = Path(__file__).with_name(f"mutants_{name}.txt").read_text()
+    for paragraph in re.findall(r"^[^\s#].*\n(?: .*\n)+", text, re.M):
+        sentence, *lines = re.split(r"\n  (?! )", paragraph.rstrip())
+        for line in lines:
+            yield sentence, line
 
 
 def by_hand() -> Iterator[Mutant]:
-    listed = Path(__file__).with_name("mutants_by_hand.txt").read_text()
-    for name, sentence, body in re.findall(
-            r"^([A-Za-z0-9][\w-]*): (.*)\n((?:[-+ ].*\n|[-+]\n)+)", listed, re.M):
+    for sentence, line in listed("by_hand"):
         texts = {}
-        for file, before, after in edits(body):
+        for edit in line.split("\n    and "):
+            file, before, after = re.fullmatch(
+                r"(\S+): (.*?) -> (.*)", " ".join(edit.split())).groups()
             text = texts.get(file) or (PROJECT / file).read_text()
-            if text.count(before) != 1:
-                sys.exit(f"mutants: by hand: {name}: found {text.count(before)} times, "
-                         f"not once, in {file}: {before!r}")
-            texts[file] = text.replace(before, after)
-        key = f"by hand: {name}"
-        yield Mutant("by hand", texts, f"{key}: {sentence}", key)
-
-
-def reasons() -> dict[str, str]:
-    """The mutants that are explained: a line each, then the reason, indented."""
-    path = Path(__file__).with_name("mutants_equivalent.txt")
-    found = dict(re.findall(r"^([^ #\n].*)\n((?: .*\n)*)", path.read_text(), re.M))
-    for key, reason in found.items():
-        if not reason:
-            sys.exit(f"mutants: {path.name} gives no reason for {key}")
-    return found
+            form = r"\s+".join(map(re.escape, before.split()))
+            if len(found := [*re.finditer(form, text)]) != 1:
+                sys.exit(f"mutants: by hand: found {len(found)} times: {edit}")
+            start, end = found[0].span()
+            after = after.replace("@", text[start:end])
+            texts[file] = text[:start] + after + text[end:]
+        shown = f"by hand: {sentence}: {' '.join(line.split())}"
+        yield Mutant("by hand", texts, shown, shown)
 
 
 def run(seconds: int, *command, file_size="unlimited") -> tuple[bool, str]:
@@ -255,13 +260,13 @@ class Tree:
         """Builds and tests the copy as it is; finds each program's slow tests."""
         self.root = PLACE / f"tree{number}"
         copy_the_project(self.root)
-        if not (self.root / "build/build.ninja").exists():
-            subprocess.run(
-                ["cmake", "-S", self.root, "-B", self.root / "build", "-G", "Ninja",
-                 "-DBUILD_TESTING=ON", "-DMARLIN_TOOLS=OFF", "-DCMAKE_BUILD_TYPE=None",
-                 "-DCMAKE_CXX_FLAGS=-O0 -w -D_GLIBCXX_ASSERTIONS -fsanitize=return",
-                 "-DCMAKE_GTEST_DISCOVER_TESTS_DISCOVERY_MODE=PRE_TEST"],
-                check=True, stdout=subprocess.DEVNULL)
+        subprocess.run(
+            ["cmake", "-S", self.root, "-B", self.root / "build", "-G", "Ninja",
+             "-DBUILD_TESTING=ON", "-DMARLIN_TOOLS=OFF", "-DCMAKE_BUILD_TYPE=None",
+             "-DCMAKE_CXX_FLAGS=-O0 -w -D_GLIBCXX_ASSERTIONS -fsanitize=return " +
+             " ".join(f"-include {header}" for header in HEADERS),
+             "-DCMAKE_GTEST_DISCOVER_TESTS_DISCOVERY_MODE=PRE_TEST"],
+            check=True, stdout=subprocess.DEVNULL)
         built, output = self.build("all")
         if not built:
             sys.exit(f"{output}\nmutants: the unchanged project does not build")
@@ -327,14 +332,16 @@ class Tree:
 
 
 def fates(trees: list[Tree], mutants: list[Mutant]) -> Iterator[tuple[Mutant, str]]:
-    """Every mutant with its fate. Each worker has a tree of its own."""
-    own = threading.local()
+    """Every mutant with its fate. Each worker has a tree to itself."""
+    def fate(mutant):
+        tree = trees.pop()
+        try:
+            return mutant, tree.fate_of(mutant)
+        finally:
+            trees.append(tree)
 
-    def take_a_tree():
-        own.tree = trees.pop()
-
-    with ThreadPoolExecutor(len(trees), initializer=take_a_tree) as pool:
-        yield from pool.map(lambda mutant: (mutant, own.tree.fate_of(mutant)), mutants)
+    with ThreadPoolExecutor(len(trees)) as pool:
+        yield from pool.map(fate, mutants)
 
 
 def figures(counts: Counter) -> str:
@@ -353,7 +360,8 @@ def main() -> int:
     options = parser.parse_args()
     need("build", "private-device", "test", "mutants")
 
-    mutants, equivalent = [*by_rule(), *by_hand()], reasons()
+    mutants, equivalent = [*by_rule(), *by_hand()], {
+        " ".join(line.split()): reason for reason, line in listed("equivalent")}
     for key in equivalent.keys() - {mutant.key for mutant in mutants}:
         sys.exit(f"mutants: explained, but there is none: {key}")
     mutants = [mutant for mutant in mutants if options.only in mutant.shown]
@@ -379,11 +387,11 @@ def judge(mutants: list[Mutant], equivalent: dict[str, str], chosen: str) -> int
         explained = mutant.key in equivalent
         if fate == "survivor" and explained:
             fate = "equivalent"
-        elif fate == "survivor":
-            print(mutant.shown, flush=True)
-        elif explained:
-            print(f"{mutant.shown}: {fate}, though explained as equivalent")
-        wrong |= fate == "survivor" or explained and fate != "equivalent"
+        elif explained or fate == "survivor" or (
+                fate == "not built" and mutant.kind == "by hand"):
+            print(f"{fate}{', though explained' * explained}: {mutant.shown}",
+                  flush=True)
+            wrong = True
         counts[mutant.kind][fate] += 1
         if sys.stderr.isatty():
             print(f"\r{done} of {len(mutants)} ", end="", file=sys.stderr)
