@@ -6,6 +6,7 @@
 #include <fts.h>
 #include <gtest/gtest.h>
 #include <sys/stat.h>
+#include <sys/syscall.h>
 #include <unistd.h>
 
 #include <cerrno>
@@ -84,6 +85,11 @@ int fts_set(FTS*, FTSENT* entry, int instruction) {
   EXPECT_EQ(instruction, FTS_SKIP);
   walk.skipped.emplace_back(entry->fts_name);
   return 0;
+}
+
+// A byte at a time.
+ssize_t read(int file, void* bytes, size_t size) {
+  return ::syscall(SYS_read, file, bytes, std::min<size_t>(size, 1));
 }
 
 int fts_close(FTS*) {
