@@ -107,6 +107,9 @@ def check():
               f"{percent:+6.2f} %{'  GROWN' if bad else ''}")
         grown += bad
         shrunk += percent < -3
+    if grown and any(name in TOOLCHAIN for name in differs):
+        stop(77, f"recorded with {was['compiler']} and {was['libc']}, which this "
+             "machine lacks: what grows may be another's code")
     if grown:
         stop(1, f"{grown} figures have grown; if that is meant: --record")
     if shrunk and not differs:

@@ -8,7 +8,8 @@ processors, as SHORT/FULL; "-" marks what only --full does:
 {stages}
 Installs what that takes, as root. Ends with the first stage that does not hold.
 
-Exit status: 0 when everything holds, 1 when something does not, 2 for bad use.
+Exit status: 0 when everything holds, 1 when something does not, 2 for bad use, 77 when
+this machine lacks something.
 """
 
 import os
@@ -32,7 +33,8 @@ def run(*command, words=""):
     """Runs a command in the project's folder; `words` go to its standard input."""
     status = subprocess.run(command, cwd=PROJECT, input=words, text=True).returncode
     if status:
-        stop(1, f"exit status {status}: {shlex.join(map(str, command))}")
+        stop(77 if status == 77 else 1,
+             f"exit status {status}: {shlex.join(map(str, command))}")
 
 
 def files(*patterns: str) -> list[str]:
