@@ -15,7 +15,7 @@ import re
 from lab.arm64_device.machine import Console, Machine, zones
 from lab.arm64_device.power_cuts import Victim, insist
 from lab.carriers import image
-from lab.oracles.installer import announced, below, icu_data, names
+from lab.oracles.installer import announced, below, manifest, names
 from lab.words.device import Device, sound_device
 from lab.words.paths import DOWNLOADS, TIMEZONE
 from lab.words.seen import Entries
@@ -25,13 +25,16 @@ NUMBERED = ("/zoneinfo/+VERSION", "/icutz/icutz44l.dat")  # end with the set's n
 ZONES = ("America/Los_Angeles", "Europe/Paris", "Europe/Lisbon", "Asia/Tokyo")
 ACCOUNT = 1  # "owner", in the device's passwd
 
+SEAL = "seal() { (cd $1; sha256sum $(find * -type f | sort) >SHA256SUMS); }"
 LOOP = f"""
+{SEAL}
 as_owner() {{ su owner -c "exec marlin-install $*" >/dev/kmsg 2>&1; }}
 make() {{
   rm -rf /run/update
   mkdir /run/update
   cp -r {TEMPLATE} /run/update/$1
   for file in {' '.join(NUMBERED)}; do echo $n >>/run/update/$1$file; done
+  seal /run/update/$1
 }}
 run() {{
   local what="$1"
@@ -64,7 +67,7 @@ def installing_device() -> Device:
     for zone in ZONES:
         device.file(f"{TEMPLATE}/zoneinfo/{zone}", zones("U24A")["Europe/Paris"])
     device.file(f"{TEMPLATE}/zoneinfo/+VERSION", "2024a\n")
-    device.file(f"{TEMPLATE}/icutz/icutz44l.dat", icu_data("ICU data\n" * 20_000))
+    device.file(f"{TEMPLATE}/icutz/icutz44l.dat", "ICU data\n" * 20_000)
     device.directory(DOWNLOADS)
     device.directory(TIMEZONE, 0o1775)
     return device
@@ -133,6 +136,9 @@ class Installer(Victim):
         here = below(entries, start)
         wanted = {path: (kind, mode, text + f"{number}\n" * (path in NUMBERED))
                   for path, (kind, mode, text) in self.template.items()}
+        wanted["/SHA256SUMS"] = "file", 0o644, manifest({
+            path[1:]: text for path, (kind, _, text) in wanted.items()
+            if kind == "file"})
         insist([f"{name}{path} is not as it was in the update"
                 for path in sorted(here.keys() | wanted.keys())
                 if here.get(path) != wanted.get(path)])

@@ -5,7 +5,8 @@ then it installs, and the next boot takes the update."""
 
 import pytest
 
-from lab.arm64_device.install_cuts import TEMPLATE, give_to_account, installing_device
+from lab.arm64_device.install_cuts import (SEAL, TEMPLATE, give_to_account,
+                                          installing_device)
 from lab.arm64_device.machine import NO_BLOCK, NO_FILLER, NO_INODE
 from lab.carriers import image
 from lab.oracles.installer import HIDDEN, announced, hidden
@@ -21,6 +22,8 @@ install() {{
 }}
 mkdir /run/update
 cp -r {TEMPLATE} /run/update/{UPDATE}
+{SEAL}
+seal /run/update/{UPDATE}
 """
 TROUBLES = {
     "no block": ((), "No space left on device", NO_BLOCK),

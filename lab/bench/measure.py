@@ -14,7 +14,7 @@ import time
 
 from lab.bench.costs import costs, instructions, peak, run
 from lab.carriers import namespace
-from lab.oracles.installer import SOURCE, icu_data, put_update, zone
+from lab.oracles.installer import SOURCE, put_update
 from lab.words.chosen_devices import activation
 from lab.words.device import Device, sound_device
 from lab.words.paths import DOWNLOADS, LOCALTIME
@@ -71,10 +71,9 @@ def companions(marlin: str, install: str, mend: str) -> dict:
     on the same quiet boot: instructions, calls, kB."""
     device = sound_device()
     device.directory(DOWNLOADS)
-    put_update(device, SOURCE, "2024b", 3600)
-    for number in range(600):
-        device.file(f"{SOURCE}/zoneinfo/Area{number % 20}/Zone{number}", zone(0, 125))
-    device.file(f"{SOURCE}/icutz/icutz44l.dat", icu_data("x" * 200_000))
+    put_update(device, SOURCE, "2024b", more={"icutz/icutz44l.dat": "x" * 200_000} | {
+        f"zoneinfo/Area{number % 20}/Zone{number}": f"TZif {number}".ljust(1243)
+        for number in range(600)})
     times = []
     for _ in range(11):
         namespace.build(device)

@@ -2,12 +2,12 @@
 """The installer of updates on the device of this namespace, and what must hold after
 each run of it, however it ended."""
 
+import hashlib
 import os
-import struct
 
 from lab.carriers import boot, namespace
 from lab.oracles.trial import fail, trial
-from lab.words.device import Device, sound_device
+from lab.words.device import Device, encoded, sound_device
 from lab.words.paths import (DOWNLOADS, ICUTZ, LOCALTIME, RECORD, TIMEZONE, TZ_LATEST,
                              ZONEINFO, update_path)
 from lab.words.seen import Call, Entries, as_device
@@ -20,34 +20,28 @@ NOT_ITS_OWN = (ZONEINFO, ICUTZ, LOCALTIME, RECORD)
 DONE, FAILED, BAD_USE, BUSY, NOT_NEWER = (f"exit {status}" for status in range(5))
 
 
-def zone(offset: int, times=0) -> str:
-    """A zone file, version 2, with one type of local time, and so many times."""
-    def block(count, start):
-        return (b"TZif2" + bytes(15) + struct.pack(">6I", 0, 0, 0, count, 1, 4) + start
-                + bytes(count) + struct.pack(">iBB", offset, 0, 0) + b"LMT\0")
-
-    second = block(times, struct.pack(f">{times}q", *range(times)))
-    return (block(0, b"") + second + b"\nLMT0\n").decode("latin-1")
+def manifest(files: dict[str, str]) -> str:
+    """What sha256sum(1) prints of these files; contents by path."""
+    return "".join(f"{hashlib.sha256(encoded(content)).hexdigest()}  {path}\n"
+                   for path, content in sorted(files.items()))
 
 
-def icu_data(text: str) -> str:
-    return "\x20\0\xda\x27".ljust(32, "\0") + text
-
-
-def put_update(device: Device, place: str, release: str, offset: int):
-    """Three zones and a table in two directories, and a link between zones."""
-    device.file(f"{place}/zoneinfo/+VERSION", f"{release}\n")
-    device.file(f"{place}/zoneinfo/America/Los_Angeles", zone(-offset))
-    device.file(f"{place}/zoneinfo/Europe/Paris", zone(offset))
-    device.link(f"{place}/zoneinfo/MET", "Europe/Paris")
-    device.file(f"{place}/icutz/icutz44l.dat", icu_data(release))
+def put_update(device: Device, place: str, release: str, text="", more=None):
+    """Three zones and a table in two directories, more files, and the manifest."""
+    files = {"icutz/icutz44l.dat": f"ICU {release}{text}",
+             "zoneinfo/+VERSION": f"{release}\n",
+             "zoneinfo/America/Los_Angeles": f"TZif {text}, west",
+             "zoneinfo/Europe/Paris": f"TZif {text}, east",
+             "zoneinfo/MET": f"TZif {text}, east"} | (more or {})
+    for path, content in (files | {"SHA256SUMS": manifest(files)}).items():
+        device.file(f"{place}/{path}", content)
 
 
 def first() -> Device:
     """The first update of a device."""
     device = sound_device()
     device.directory(DOWNLOADS)
-    put_update(device, SOURCE, "2024b", 3600)
+    put_update(device, SOURCE, "2024b")
     return device
 
 
@@ -56,21 +50,41 @@ def next_one() -> Device:
     stopped here before, in the middle and shortly before the end."""
     device = first()
     for name in (OLD, "2023d.1.0", NEW):
-        put_update(device, update_path(name), name[:5], 7200)
+        put_update(device, update_path(name), name[:5], "older")
     device.drop(f"{update_path(NEW)}/zoneinfo")
     device.point_links_at(OLD)
     device.announce(OLD)
     device.file(f"{DOWNLOADS}{HIDDEN}new/zoneinfo/Europe/Paris", "TZ")
-    device.file(f"{DOWNLOADS}{HIDDEN}old/icutz/icutz44l.dat", "ICU")
     device.link(f"{TIMEZONE}/{HIDDEN}tz_latest", update_path(NEW))
+    return device
+
+
+def damaged() -> Device:
+    """The set that is in use is not whole, and a part of it is gone."""
+    device = first()
+    put_update(device, update_path(NEW), "2024b")
+    device.drop(f"{update_path(NEW)}/zoneinfo/America")
+    device.point_links_at(NEW)
+    device.announce(NEW)
+    return device
+
+
+def booted() -> Device:
+    """What was announced is in use."""
+    device = next_one()
+    put_update(device, update_path(NEW), "2024b")
+    device.point_links_at(NEW)
+    device.announce(NEW)
     return device
 
 
 SCENES = {
     "a first update": (first, [SOURCE]),
-    "the next update": (next_one, [SOURCE]),
+    "the next update": (next_one, ["--verify", "/usr/bin/true", SOURCE]),
+    "putting back": (damaged, [SOURCE]),
     "pruning": (next_one, ["--prune"]),
     "withdrawing": (next_one, ["--withdraw"]),
+    "settling": (booted, ["--settle"]),
 }
 
 
@@ -110,7 +124,7 @@ def announced(entries: Entries) -> str | None:
 
 
 def announced_at_the_end(words: list[str], before: Entries) -> str | None:
-    return {"--prune": announced(before), "--withdraw": None}.get(
+    return {"--prune": announced(before), "--withdraw": None, "--settle": None}.get(
         words[0], update_path(NEW))
 
 
@@ -130,7 +144,8 @@ def violations(words: list[str], before: Entries, after: Entries) -> list[str]:
     target = announced(after)
     if target not in (announced(before), announced_at_the_end(words, before)):
         found.append(f"{target} is announced")
-    if target == update_path(NEW) and below(after, target) != source:
+    if target == update_path(NEW) and below(after, target) not in (
+            source, announced(before) == target and below(before, target)):
         found.append(f"{NEW} is announced and not whole")
     if target and target not in after:
         found.append(f"{target} is announced and gone")
@@ -152,6 +167,6 @@ def runs_again(words: list[str], before: Entries):
         found.append(f"the next run ends with {again.ending}: {again.log}")
     if announced(after) != announced_at_the_end(words, before):
         found.append(f"after the next run {announced(after)} is announced")
-    if words == ["--prune"] and set(names(after)) - {OLD, NEW}:
+    if words[0] in ("--prune", "--settle") and set(names(after)) - {OLD, NEW}:
         found.append(f"the next run leaves {names(after)}")
     fail("the next run", found, before)

@@ -10,7 +10,7 @@ import sys
 
 from lab.carriers import boot, namespace
 from lab.carriers.building import copy_the_project, locked, need, quietly, trials
-from lab.oracles.installer import DONE, NEW, SOURCE, first, run
+from lab.oracles.installer import DONE, NEW, SOURCE, first, put_update, run
 from lab.proofs.status import ask
 from lab.words.paths import TIMEZONE, TZ_LATEST, ZONEINFO, update_path
 from lab.words.places import BUILD, PROJECT
@@ -22,7 +22,7 @@ LEAP = f"{update_path(NEW)}/leapseconds"
 
 def test_a_set_of_three_components():
     device = first()
-    device.file(f"{SOURCE}/leapseconds", "of the update")
+    put_update(device, SOURCE, "2024b", more={"leapseconds": "of the update"})
     namespace.build(device)
     assert run([SOURCE]) == (DONE, "")
     assert namespace.look()[LEAP].text == "of the update"

@@ -6,16 +6,17 @@ update is announced, and whole; one line tells the reason; the next boot takes w
 announced, or stays; and the next run is undisturbed."""
 
 import re
-from errno import (EAGAIN, EDQUOT, EEXIST, EINTR, EIO, EMLINK, ENOLCK, ENOSPC,
-                   ENOTDIR, ENOTEMPTY, EPERM, EROFS, EXDEV, errorcode)
+from errno import (EAGAIN, ECHILD, EDQUOT, EEXIST, EINTR, EIO, EMFILE, EMLINK, ENFILE,
+                   ENOLCK, ENOMEM, ENOSPC, ENOTDIR, ENOTEMPTY, EPERM, EROFS, EXDEV,
+                   errorcode)
 
 import pytest
 
 from lab.carriers import boot, namespace
 from lab.oracles.conditions import refusals
 from lab.oracles.installer import (BUSY, DONE, FAILED, HIDDEN, NEW, NOT_NEWER, PROGRAM,
-                                   SCENES, announced, calls, hidden, names, next_boot,
-                                   runs_again, traced, violations)
+                                   SCENES, SOURCE, announced, below, calls, hidden,
+                                   names, next_boot, runs_again, traced, violations)
 from lab.oracles.trial import fail
 from lab.proofs.faults import CHANGE, ERRORS, LASTING, OPEN
 from lab.words.paths import DOWNLOADS, update_path
@@ -28,12 +29,16 @@ MORE = {
     "chmod": [EIO, EPERM, EROFS],
     "fsync": [EDQUOT, EIO, ENOSPC, EROFS],
     "flock": [EAGAIN, EIO, ENOLCK],
+    "memfd_create": [EMFILE, ENFILE, ENOMEM],
+    "clone3": [EAGAIN, ENOMEM],
+    "wait4": [ECHILD, EINTR],
 }
 EXPECTED = {**ERRORS, **MORE}
 # No run that met such a failure may say that it is done.
 # One that means that a name is taken may lead to another name.
 TAKEN = {EEXIST, ENOTDIR, ENOTEMPTY}
-TELLING = {"create", "mkdir", "link", "rename", "symlink", "chmod", "fsync", "write"}
+TELLING = {"create", "mkdir", "link", "rename", "symlink", "chmod", "fsync", "write",
+           "memfd_create", "clone3", "wait4"}
 
 
 def disturbances(option):
@@ -77,10 +82,11 @@ def test_a_call_that_fails(scene, call, error, when, telling, count):
     mute = call.name == "write" and when.endswith("+")
     if len(lines) != (told.ending != DONE and not mute):
         found.append(f"it ends with {told.ending} and prints {told.log!r}")
-    if words[0][0] != "-":
-        is_new = announced(after) == update_path(NEW)
-        said = told.ending == DONE or any("; it is announced, but" in line
-                                          for line in lines)
+    if words[-1] == SOURCE:
+        is_new = (announced(after) == update_path(NEW) and
+                  below(after, update_path(NEW)) == below(after, SOURCE))
+        said = told.ending == DONE or re.search(
+            "; it is announced, but|; all else is done", told.log) is not None
         if is_new != said and not mute:
             found.append(f"announced is {announced(after)}, it says {told.log!r}")
     if any("nothing was changed" in line for line in lines):
@@ -115,16 +121,33 @@ def test_memory_is_refused(scene, count):
         runs_again(words, before)
 
 
-@pytest.mark.parametrize("scene, fails, name", [
-    # What another user left stands in the way of a directory of its name only.
-    ("the next update", boot.failing("unlinkat", EPERM, "1+"), HIDDEN + "new"),
-    ("the next update", [], NEW), ("pruning", [], f"({NEW}|2023d.1.0)")])
-def test_a_set_of_another_user(scene, fails, name):
+@pytest.mark.parametrize("scene, own, fails, name", [
+    # What another account left stands in the way of a directory of its name only.
+    ("the next update", 2, boot.failing("unlinkat", EPERM, "1+"), HIDDEN + "new"),
+    ("the next update", 3, [], NEW), ("pruning", 2, [], "2023d.1.0")])
+def test_a_set_of_another_account(scene, own, fails, name):
+    """Only so many of the questions who it is are answered with the owner."""
+    refused_in(scene, [*boot.inject("geteuid", "retval=4711", f"{own + 1}+"), *fails],
+               f"marlin-install: (.*: )?{DOWNLOADS}{name} belongs to another account, "
+               "which has to remove it(; .*)?\n")
+
+
+@pytest.mark.parametrize("scene", SCENES)
+@pytest.mark.parametrize("first", [2, 3])
+def test_a_place_of_another_account(scene, first):
+    """Its owner could exchange what is checked for what is not."""
+    if first == 3 and SCENES[scene][1][-1] != SOURCE:
+        pytest.skip("it makes no directory")
+    place = DOWNLOADS + (f"{HIDDEN}new" if first == 3 else "")
+    refused_in(scene, boot.inject("geteuid", "retval=4711", first),
+               f'marlin-install: (.*: )?{place} belongs to ([^ ]*); run this as that '
+               r'account, as in "runuser -u \2 -- marlin-install ..."(; .*)?\n')
+
+
+def refused_in(scene, options, line):
     make, words = SCENES[scene]
     namespace.build(make())
     before = namespace.look()
-    told = traced(words, *boot.inject("geteuid", "retval=4711", "1+"), *fails)
-    assert told.ending == FAILED
-    assert re.fullmatch(f"marlin-install: (.*: )?{DOWNLOADS}{name} belongs to another "
-                        "user, who has to remove it(; .*)?\n", told.log)
+    told = traced(words, *options)
+    assert told.ending == FAILED and re.fullmatch(line, told.log), f"{told}"
     fail(f"{told}", violations(words, before, namespace.look()), before)

@@ -55,6 +55,8 @@ CONTENT = dict(reversed(line.split(maxsplit=1)) for line in """
     644 /usr/share/doc/marlin/examples/inittab
     644 /usr/share/doc/marlin/examples/marlin.service.d/mend.conf
     644 /usr/share/doc/marlin/examples/openrc
+    755 /usr/share/doc/marlin/examples/verify-minisign
+    755 /usr/share/doc/marlin/examples/verify-signify
     644 /usr/share/lintian/overrides/marlin
     644 /usr/share/man/man5/marlin-layout.5.gz
     644 /usr/share/man/man8/marlin-status.8.gz

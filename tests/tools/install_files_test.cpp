@@ -5,27 +5,11 @@
 #include "tests/device/device.h"
 #include "tools/install/device_facts.h"
 #include "tools/install/failure.h"
-#include "tools/install/path_text.h"
 #include "tools/install/removal.h"
 
 using namespace device;
 
 namespace {
-
-TEST(JoinedPath, IsTheWayByTheTextAlone) {
-  EXPECT_EQ(joined("a/b", "../c//./d"), "a/c/d");
-  EXPECT_EQ(joined("zoneinfo/US", "../America/New_York"),
-            "zoneinfo/America/New_York");
-  EXPECT_EQ(joined("", "/Europe//Paris"), "Europe/Paris");
-  EXPECT_EQ(joined("a", ".."), "");
-  EXPECT_EQ(joined("a", "../.."), "");
-  EXPECT_EQ(joined("a", "../../a/b"), "");
-  EXPECT_EQ(joined("a", "."), "a/");
-  EXPECT_EQ(joined("a/b", ".."), "a/");
-  EXPECT_EQ(joined("a", "b/../c"), "a/b/../c") << "b may be missing, or a file";
-  EXPECT_EQ(joined("a", "b/"), "a/b/") << "b may be a file";
-  EXPECT_EQ(joined("a", "b/./"), "a/b/");
-}
 
 class Removal : public DeviceTest {
  protected:
@@ -105,15 +89,20 @@ TEST_F(DeviceFacts, ASetIsNeededByAnyLinkIntoIt) {
   EXPECT_TRUE(needed_sets().contains("2024a.1.0")) << "by the way of tz_latest";
 }
 
-TEST_F(DeviceFacts, TheUsersZoneIsReadFromTheText) {
+TEST_F(DeviceFacts, TheUsersZoneIsReadFromTheTextAndHasToBeThere) {
+  install_system("2023c", "44l");
+  point_links_at_system();
+  make_file(system_tree + "/Asia/Tokyo");
   for (const auto& [text, zone] :
        std::vector<std::pair<std::string, std::string>>{
            {zoneinfo + "/Europe/Paris", "Europe/Paris"},
-           {zoneinfo + "//Europe/./Paris", "Europe/Paris"},
+           {zoneinfo + "//Europe/./Paris", "/Europe/./Paris"},
            {"/usr/share/zoneinfo/Asia/Tokyo", "Asia/Tokyo"},
+           {zoneinfo + "/Mars/Base", ""},
+           {zoneinfo + "/Europe", ""},
            {zoneinfo, ""},
-           {zoneinfo + "x/Europe", ""},
-           {zoneinfo + "/../../x", ""},
+           {zoneinfo + "x/Europe/Paris", ""},
+           {zoneinfo + "/../zoneinfo/Europe/Paris", ""},
            {"/elsewhere/Europe/Paris", ""}}) {
     point_localtime_at(text);
     EXPECT_EQ(zone_of_the_user(), zone) << text;
@@ -122,13 +111,18 @@ TEST_F(DeviceFacts, TheUsersZoneIsReadFromTheText) {
   EXPECT_EQ(zone_of_the_user(), "");
 }
 
-TEST_F(DeviceFacts, OnlyASetThatIsThereIsAnnouncedOrInUse) {
-  announce("2024a.1.0");
-  point_links_at_update("2024a.1.0");
-  EXPECT_EQ(announced_set() + set_in_use(), "");
+// Whatever order a directory has, and as the boot reads it.
+TEST_F(DeviceFacts, ASetFitsByAFileThatTheBootCounts) {
+  install_system("2023c", "44l");
   install_update("2024a.1.0", "44l");
-  EXPECT_EQ(announced_set(), "2024a.1.0");
-  EXPECT_EQ(set_in_use(), "2024a.1.0");
+  const std::string file = update("2024a.1.0") + "/icutz/icutz44l.dat";
+  EXPECT_TRUE(fits_system("2024a.1.0"));
+  set_mode(file, 0600);
+  EXPECT_FALSE(printed_by([] { fits_system("2024a.1.0"); }).empty());
+  EXPECT_FALSE(fits_system("2024a.1.0"));
+  make_link(file, system_icu + "/icutzformat.txt");
+  EXPECT_FALSE(fits_system("2024a.1.0"));
+  EXPECT_FALSE(fits_system("2024b.1.0")) << "is not there";
 }
 
 TEST_F(DeviceFacts, NoTextPrintsALine) {

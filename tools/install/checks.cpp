@@ -1,9 +1,13 @@
 // SPDX-License-Identifier: BSD-2-Clause
 #include "tools/install/checks.h"
 
-#include "support/paths.h"
+#include <string_view>
+
+#include "dataset/icu_file_name.h"
+#include "support/first_word.h"
 #include "support/version_grammar.h"
 #include "tools/escaped.h"
+#include "tools/install/contents.h"
 #include "tools/install/device_facts.h"
 #include "tools/install/failure.h"
 
@@ -22,36 +26,56 @@ std::string release_in(const std::string& name) {
   return groups ? std::string(groups->year) + std::string(groups->letters) : "";
 }
 
-void check_age(const mln_version& version) {
-  check_newer(version, system_version(), "the system's");
-  // What the next boot will refuse is no reason to stay with it.
-  if (fits_system(announced_set()))
-    check_newer(version, announced_set(), "announced");
-  check_newer(version, set_in_use(), "in use");
+// The schema in the name of the only ICU data file.
+std::string schema_in(const file_names& files) {
+  std::string schema;
+  for (const auto& [name, first] : files) {
+    const std::string_view path = name;
+    if (!path.starts_with("icutz/")) continue;
+    const auto found = icu_schema_in(path.substr(6));
+    if (found.empty()) continue;
+    if (!schema.empty()) refuse("icutz holds more than one file icutzNNx.dat");
+    schema = found;
+  }
+  if (schema.empty()) refuse("icutz holds no file icutzNNx.dat");
+  return schema;
 }
 
 }  // namespace
 
-void check_version(const std::string& name, bool any_age) {
+bool check_version(const std::string& name, bool any_age) {
   const auto version = version_in(name);
-  if (!version) refuse("its name is no version such as 2024a.1.0");
-  if (!any_age) check_age(*version);
+  if (!version) refuse("its name is not a version such as 2024a.1.0");
+  const std::string announced = announced_set(), in_use = set_in_use();
+  const bool needed = needed_sets().contains(name);
+  const bool broken = needed && condition_of(name).is != condition::whole;
+  if (!any_age && !(broken && name == in_use)) {
+    check_newer(*version, system_version(), "the system's");
+    // What the next boot will refuse is no reason to stay with it.
+    if (!(broken && name == announced) && fits_system(announced))
+      check_newer(*version, announced, "announced");
+    if (is_installed(in_use)) check_newer(*version, in_use, "in use");
+  }
   // No set ever changes.
-  if (needed_sets().contains(name))
+  if (needed && !broken)
     refuse(
         "a set of this version is in use or announced; give other data "
         "another");
+  return broken && (name == in_use || name == announced);
 }
 
-void check_contents(const std::string& name, const contents& update) {
-  if (update.release != release_in(name))
-    refuse("zoneinfo/+VERSION says " + escaped(update.release.substr(0, 40)) +
+void check_contents(const std::string& name, const std::string& copy,
+                    const file_names& files) {
+  const std::string release = read_first_word(copy + "/zoneinfo/+VERSION");
+  if (release.empty()) refuse("zoneinfo/+VERSION names no release");
+  if (release != release_in(name))
+    refuse("zoneinfo/+VERSION says " + escaped(release.substr(0, 40)) +
            ", another release than its name");
-  const std::string schema = system_schema();
-  if (update.schema != schema)
-    refuse("its ICU schema is " + escaped(update.schema) + ", the system's " +
-           (schema.empty() ? "is missing" : "is " + escaped(schema)));
+  const std::string schema = schema_in(files), system = system_schema();
+  if (schema != system)
+    refuse("its ICU schema is " + escaped(schema) + ", the system's is " +
+           (system.empty() ? "missing" : escaped(system)));
   const std::string zone = zone_of_the_user();
-  if (!zone.empty() && !update.zones.contains(zone))
+  if (!zone.empty() && !is_file(copy + "/zoneinfo/" + zone))
     refuse("it lacks the zone that the device is set to, " + escaped(zone));
 }

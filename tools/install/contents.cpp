@@ -5,35 +5,19 @@
 #include <unistd.h>
 
 #include <algorithm>
-#include <array>
 #include <cerrno>
-#include <iterator>
 #include <map>
-#include <memory>
+#include <string_view>
 #include <utility>
+#include <vector>
 
-#include "dataset/icu_file_name.h"
 #include "support/paths.h"
 #include "tools/escaped.h"
 #include "tools/install/failure.h"
 #include "tools/install/files.h"
-#include "tools/install/path_text.h"
-#include "tools/install/tzif.h"
+#include "tools/install/program.h"
 
 namespace {
-
-constexpr std::string_view tree = "zoneinfo/";
-
-// Tables that come with the rules and are no zones.
-bool is_table(std::string_view path) {
-  static constexpr std::array<std::string_view, 3> endings{".tab", ".zi",
-                                                           ".list"};
-  if (path == "zoneinfo/+VERSION" || path == "zoneinfo/leapseconds")
-    return true;
-  return path.rfind('/') == tree.size() - 1 &&
-         std::any_of(endings.begin(), endings.end(),
-                     [&](auto ending) { return path.ends_with(ending); });
-}
 
 bool is_plain_name(std::string_view name) {
   return std::all_of(name.begin(), name.end(), [](char byte) {
@@ -43,13 +27,17 @@ bool is_plain_name(std::string_view name) {
   });
 }
 
+bool is_of_manifest(const std::string& path) {
+  return path == manifest_name || path.starts_with("SHA256SUMS.");
+}
+
 const char* kind_of(mode_t mode) {
   if (S_ISLNK(mode)) return "a link";
   if (S_ISFIFO(mode)) return "a FIFO";
   if (S_ISSOCK(mode)) return "a socket";
   if (S_ISBLK(mode) || S_ISCHR(mode)) return "a device";
   if (S_ISDIR(mode)) return "a directory";
-  return mode == 0 ? "gone" : "a file";
+  return mode == 0 ? "missing" : "a file";
 }
 
 void check_mode(const std::string& path, mode_t mode) {
@@ -58,187 +46,221 @@ void check_mode(const std::string& path, mode_t mode) {
     refuse(escaped(path) + " cannot be read by all");
   if ((mode & S_IWOTH) != 0) refuse(escaped(path) + " can be written by all");
   if (S_ISREG(mode) && (mode & (S_ISUID | S_ISGID | S_ISVTX)) != 0)
-    refuse(escaped(path) + " runs as somebody else");
+    refuse(escaped(path) +
+           " has the set-user-ID, the set-group-ID or the sticky bit");
 }
 
-// In the name of a file of ICU data; otherwise empty.
-std::string_view icu_schema_of(std::string_view path) {
-  constexpr std::string_view directory = "icutz/";
-  if (!path.starts_with(directory)) return {};
-  return icu_schema_in(path.substr(directory.size()));
-}
-
-// ICU's header: its size, a magic number, and from byte 8 the byte order and
-// the character set of the data. The letter of the schema says both.
-void check_icu(const std::string& path, std::string_view content, char letter) {
-  if (content.size() < 32 || !content.substr(2).starts_with("\xda\x27"))
-    refuse(escaped(path) + " is not a file of ICU data");
-  const bool big = content[8] != 0;
-  const bool ebcdic = content[9] != 0;
-  if (big != (letter != 'l') || ebcdic != (letter == 'e'))
-    refuse(escaped(path) + " has another byte order than its name says");
-}
-
-std::string first_word(std::string_view text) {
-  static constexpr std::string_view blanks = " \t\n\v\f\r";
-  const auto start = std::min(text.find_first_not_of(blanks), text.size());
-  text.remove_prefix(start);
-  return std::string(text.substr(0, text.find_first_of(blanks)));
+// Explicitly: neither a umask nor an access list decides about the modes of a
+// set.
+void set_mode(int file, mode_t mode, const std::string& path) {
+  if (::fchmod(file, mode) != 0) fail("set the mode of", path);
 }
 
 class walk {
  public:
-  explicit walk(receiver& to) : to_(to) {}
+  walk(int copy, const std::string& where) : copy_(copy), where_(where) {}
 
-  contents all_of(int directory) {
-    check_mode("the update", status_of(directory, ".", "the update").st_mode);
-    const auto names =
-        names_in(directory, std::size(paths::update_entries) + 1, "the update");
-    for (const auto& name : names) {
-      if (std::ranges::count(paths::update_entries, name) == 0)
+  file_names through(int set) {
+    check_mode("the update", status_of(set, ".", "the update").st_mode);
+    for (const auto& name : names_in(set, limits::entries, "the update")) {
+      if (std::ranges::count(paths::update_entries, name) == 0 &&
+          !is_of_manifest(name))
         refuse(escaped(name) + " does not belong in an update");
+      // Another component's, which an older update lacks.
+      if (name != "icutz" && name != "zoneinfo") entry(set, name, name, 0);
     }
-    enter(directory, "icutz", 1);
-    enter(directory, "zoneinfo", 1);
-    // Another component's, which an older update lacks.
-    for (const auto& name : names) {
-      if (name != "icutz" && name != "zoneinfo")
-        entry(directory, name, name, 0);
+    for (const std::string name : {"icutz", "zoneinfo"}) {
+      const mode_t mode = status_of(set, name, name).st_mode;
+      if (!S_ISDIR(mode))
+        refuse(name + " is " + kind_of(mode) + ", not a directory");
+      enter(set, name, mode, 1);
     }
-    if (found_.schema.empty()) refuse("icutz holds no file icutzNNx.dat");
-    if (found_.release.empty()) refuse("zoneinfo/+VERSION names no release");
-    for (const auto& [path, target] : links_) {
-      if (!found_.zones.contains(target.substr(tree.size())))
-        refuse(escaped(path) + " is a link that does not lead to a zone");
-    }
-    for (const auto& [path, target] : links_)
-      found_.zones.insert(path.substr(tree.size()));
-    if (found_.zones.empty()) refuse("zoneinfo holds no zone");
-    to_.end();
-    return std::move(found_);
+    return std::move(files_);
   }
 
  private:
-  void enter(int parent, const std::string& path, std::size_t depth) {
-    const std::string name = path.substr(path.rfind('/') + 1);
-    const mode_t mode = status_of(parent, name, path).st_mode;
-    if (!S_ISDIR(mode))
-      refuse(escaped(path) + " is " + kind_of(mode) + ", not a directory");
+  std::string shown(const std::string& path) const {
+    return where_ + "/" + path;
+  }
+
+  void enter(int parent, const std::string& path, mode_t mode,
+             std::size_t depth) {
     check_mode(path, mode);
     if (depth > limits::depth)
       refuse(escaped(path) + " is deeper than a zone can be");
-    const descriptor directory = open_directory(parent, name, path);
-    to_.enter(path);
-    for (const auto& below :
+    const descriptor directory =
+        open_directory(parent, path.substr(path.rfind('/') + 1), path);
+    if (copy_ >= 0) {
+      if (::mkdirat(copy_, path.c_str(), 0700) != 0)
+        fail("make the directory", shown(path));
+      set_mode(open_directory(copy_, path, shown(path)).number(), 0755,
+               shown(path));
+    }
+    for (const auto& name :
          names_in(directory.number(), limits::entries + 1, path))
-      entry(directory.number(), below, path + "/" + below, depth);
-    to_.leave(path);
+      entry(directory.number(), name, path + "/" + name, depth);
   }
 
   void entry(int parent, const std::string& name, const std::string& path,
              std::size_t depth) {
-    if (++found_.entries > limits::entries)
+    if (++entries_ > limits::entries)
       refuse("it has more than " + std::to_string(limits::entries) +
              " entries");
-    if (!is_plain_name(name)) refuse(escaped(path) + " is no name for a zone");
+    if (!is_plain_name(name))
+      refuse(escaped(path) + " has a name that no zone has");
     const struct stat status = status_of(parent, name, path);
-    const bool in_tree = path.starts_with(tree);
-    if (S_ISREG(status.st_mode)) {
-      file(parent, name, path, status);
-    } else if (S_ISLNK(status.st_mode) && in_tree) {
-      link(parent, name, path);
-    } else if (S_ISDIR(status.st_mode) && (in_tree || depth == 0)) {
-      enter(parent, path, depth + 1);
-    } else {
+    if (S_ISDIR(status.st_mode) && !is_of_manifest(path) &&
+        !path.starts_with("icutz/"))
+      return enter(parent, path, status.st_mode, depth + 1);
+    if (!S_ISREG(status.st_mode))
       refuse(escaped(path) + " is " + kind_of(status.st_mode));
-    }
+    check_mode(path, status.st_mode);
+    const std::pair identity(status.st_dev, status.st_ino);
+    const auto [first, is_new] = names_.emplace(identity, path);
+    if (!is_of_manifest(path)) files_.emplace(path, first->second);
+    if (copy_ < 0) return;
+    if (is_new)
+      file(parent, name, path, identity);
+    else if (::linkat(copy_, first->second.c_str(), copy_, path.c_str(), 0) !=
+             0)
+      fail("make the file", shown(path));
   }
 
   void file(int parent, const std::string& name, const std::string& path,
-            const struct stat& status) {
-    check_mode(path, status.st_mode);
-    const std::pair identity(status.st_dev, status.st_ino);
-    const bool zone = path.starts_with(tree) && !is_table(path);
-    if (const auto before = names_.find(identity);
-        zone && before != names_.end()) {
-      to_.name(path, before->second);
-    } else {
-      read(parent, name, path, identity);
-      check_content(path, zone);
-      to_.file(path, content_);
-      if (zone) names_.emplace(identity, path);
-    }
-    if (zone) found_.zones.insert(path.substr(tree.size()));
-  }
-
-  void check_content(const std::string& path, bool zone) {
-    if (zone) {
-      if (const char* const flaw = tzif_flaw(content_))
-        refuse(escaped(path) + " " + flaw);
-    } else if (path == "zoneinfo/+VERSION") {
-      found_.release = first_word(content_);
-    } else if (const auto schema = icu_schema_of(path); !schema.empty()) {
-      if (!found_.schema.empty())
-        refuse("icutz holds more than one file icutzNNx.dat");
-      found_.schema = schema;
-      check_icu(path, content_, schema.back());
-    }
-  }
-
-  void read(int parent, const std::string& name, const std::string& path,
             std::pair<dev_t, ino_t> identity) {
-    const descriptor file(
+    const descriptor from(
         ::openat(parent, name.c_str(),
                  O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
-    if (file.number() < 0) fail("open", path);
+    if (from.number() < 0) fail("open", path);
     struct stat status {};
-    if (::fstat(file.number(), &status) != 0) fail("look at", path);
+    if (::fstat(from.number(), &status) != 0) fail("look at", path);
     if (!S_ISREG(status.st_mode) ||
         std::pair(status.st_dev, status.st_ino) != identity)
       refuse(escaped(path) + " was replaced meanwhile");
-    constexpr std::size_t most = limits::file_bytes + 1;
-    std::size_t length = 0;
-    while (length < most) {
-      const ssize_t count =
-          ::read(file.number(), buffer_.get() + length, most - length);
+    const descriptor to(::openat(
+        copy_, path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, 0600));
+    if (to.number() < 0) fail("make the file", shown(path));
+    transfer(from.number(), to.number(), path);
+    set_mode(to.number(), 0644, shown(path));
+  }
+
+  void transfer(int from, int to, const std::string& path) {
+    char buffer[1 << 16];
+    for (std::uint64_t length = 0;;) {
+      const ssize_t count = ::read(from, buffer, sizeof buffer);
       if (count < 0 && errno == EINTR) continue;
       if (count < 0) fail("read", path);
-      if (count == 0) break;
-      length += static_cast<std::size_t>(count);
+      const auto size = static_cast<std::size_t>(count);
+      if ((length += size) > limits::file_bytes)
+        refuse(escaped(path) + " is larger than " +
+               std::to_string(limits::file_bytes >> 20) + " MiB");
+      if ((bytes_ += size) > limits::bytes)
+        refuse("it is larger than " + std::to_string(limits::bytes >> 20) +
+               " MiB");
+      write_all(to, {buffer, size}, path);
+      // What comes after the end of a file is not of the update.
+      if (size < sizeof buffer) return;
     }
-    if (length > limits::file_bytes)
-      refuse(escaped(path) + " is larger than " +
-             std::to_string(limits::file_bytes >> 20) + " MiB");
-    content_ = {buffer_.get(), length};
-    found_.bytes += length;
-    if (found_.bytes > limits::bytes)
-      refuse("it is larger than " + std::to_string(limits::bytes >> 20) +
-             " MiB");
   }
 
-  void link(int parent, const std::string& name, const std::string& path) {
-    const std::string text = link_text(parent, name, path);
-    const std::string target = joined(path.substr(0, path.rfind('/')), text);
-    if (text.empty() || text.front() == '/' || !target.starts_with(tree))
-      refuse(escaped(path) + " is a link that leads out, to " + escaped(text));
-    links_.emplace(path, target);
-    to_.link(path, text);
+  void write_all(int to, std::string_view content, const std::string& path) {
+    while (!content.empty()) {
+      const ssize_t count = ::write(to, content.data(), content.size());
+      if (count < 0 && errno == EINTR) continue;
+      if (count < 0) fail("write", shown(path));
+      content.remove_prefix(static_cast<std::size_t>(count));
+    }
   }
 
-  receiver& to_;
-  contents found_{};
-  // Of the file that is looked at, and the room for it.
-  std::string_view content_{};
-  std::unique_ptr<char[]> buffer_ =
-      std::make_unique_for_overwrite<char[]>(limits::file_bytes + 1);
-  std::map<std::string, std::string> links_{};  // what each leads to
-  // The first name of each zone file: rules compilers make links of zones that
-  // are alike.
+  int copy_;
+  const std::string& where_;
+  file_names files_{};
+  std::size_t entries_ = 0;
+  std::uint64_t bytes_ = 0;
+  // The first name of each file: rules compilers give zones that are alike one
+  // file.
   std::map<std::pair<dev_t, ino_t>, std::string> names_{};
 };
 
+std::string manifest_of(int set) {
+  if (status_of(set, manifest_name, manifest_name).st_mode == 0)
+    refuse("it has no SHA256SUMS");
+  const descriptor file(
+      ::openat(set, manifest_name,
+               O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
+  if (file.number() < 0) fail("open", manifest_name);
+  return read_all(file.number(), limits::file_bytes, manifest_name);
+}
+
+// A hash, two blanks, a path: what sha256sum(1) prints of one file.
+constexpr std::size_t before_path = 66;
+
+std::string_view first_line(std::string_view text) {
+  return text.substr(0, std::min(text.find('\n'), text.size() - 1) + 1);
+}
+
+std::string_view path_in(std::string_view line) {
+  line.remove_prefix(std::min(before_path, line.size()));
+  return line.substr(0, line.find('\n'));
+}
+
+// What sha256sum(1) would print of all names, asked for one of each file.
+std::string sums_of(int set, const file_names& files) {
+  std::vector<std::string> words{"sha256sum"};
+  for (const auto& [path, first] : files)
+    if (path == first) words.push_back(path);
+  // Without a file it would read standard input.
+  if (words.size() == 1) refuse("it has no files");
+  std::string printed;
+  if (const int status = run_program(words, set, &printed); status != 0)
+    throw failure{status::failed,
+                  "sha256sum ended with status " + std::to_string(status)};
+  std::map<std::string_view, std::string_view> sums;
+  for (std::string_view rest = printed; !rest.empty();
+       rest.remove_prefix(first_line(rest).size()))
+    sums.emplace(path_in(rest), rest.substr(0, before_path));
+  std::string text;
+  for (const auto& [path, first] : files)
+    text.append(sums[first]).append(path).append("\n");
+  return text;
+}
+
 }  // namespace
 
-contents examine(int directory, receiver& to) {
-  return walk(to).all_of(directory);
+file_names files_in(int set, int copy, const std::string& where) {
+  return walk(copy, where).through(set);
+}
+
+void check_manifest(int set, const file_names& files) {
+  const std::string text = manifest_of(set), printed = sums_of(set, files);
+  std::string_view wanted = text, found = printed;
+  while (!found.empty() && wanted.starts_with(first_line(found))) {
+    wanted.remove_prefix(first_line(found).size());
+    found.remove_prefix(first_line(found).size());
+  }
+  if (wanted.empty() && found.empty()) return;
+  const auto listed = path_in(wanted), path = path_in(found);
+  if (found.empty() || (!wanted.empty() && listed < path))
+    refuse("SHA256SUMS lists what is missing, \"" +
+           escaped(listed.substr(0, 100)) + "\"");
+  refuse(escaped(path) + (listed == path ? " is not as SHA256SUMS has it"
+                                         : " is not in SHA256SUMS"));
+}
+
+verdict condition_of(const std::string& set) {
+  const std::string path = paths::download_root + set;
+  const descriptor opened(
+      ::open(path.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  if (opened.number() < 0 && errno == ENOENT) return {condition::lost, {}};
+  if (opened.number() < 0 && errno == ENOTDIR)
+    return {condition::damaged, "it is not a directory"};
+  if (opened.number() < 0) fail("open", path);
+  if (status_of(opened.number(), manifest_name, path).st_mode == 0)
+    return {condition::unlisted, {}};
+  try {
+    check_manifest(opened.number(), files_in(opened.number()));
+    return {condition::whole, {}};
+  } catch (const refusal& told) {
+    return {condition::damaged, told.line};
+  }
 }

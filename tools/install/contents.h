@@ -1,14 +1,13 @@
 // SPDX-License-Identifier: BSD-2-Clause
 //
-// What is in the directory of an update, entry by entry, with all checks that
-// need nothing of the device. The update is hostile until it has passed.
+// What is in the directory of a set, entry by entry, and what its manifest says
+// of it. An update is hostile until it has passed.
 #pragma once
 
 #include <cstddef>
 #include <cstdint>
-#include <set>
+#include <map>
 #include <string>
-#include <string_view>
 
 // More than any update needs: a tree with all its variants has 2,000 entries,
 // three levels and less than 4 MB.
@@ -16,39 +15,34 @@ namespace limits {
 
 inline constexpr std::size_t entries = 8192;
 inline constexpr std::size_t depth = 8;  // of directories in one another
-inline constexpr std::size_t file_bytes = 4u << 20;
+inline constexpr std::uint64_t file_bytes = 4u << 20;
 inline constexpr std::uint64_t bytes = 32u << 20;
 
 }  // namespace limits
 
-// Is told of everything that has passed its check, in the order in which it can
-// be made anew: exactly the bytes that were checked. Paths are relative to the
-// update. This one does nothing.
-class receiver {
- public:
-  virtual ~receiver() = default;
-  virtual void enter(const std::string& /*path*/) {}
-  virtual void leave(const std::string& /*path*/) {}
-  virtual void file(const std::string& /*path*/, std::string_view /*content*/) {
-  }
-  // Another name of a file that was received before.
-  virtual void name(const std::string& /*path*/, const std::string& /*of*/) {}
-  virtual void link(const std::string& /*path*/, const std::string& /*text*/) {}
-  virtual void end() {}
-};
+inline constexpr char manifest_name[] = "SHA256SUMS";
 
-struct contents {
-  std::string release;          // the first word of "+VERSION"
-  std::string schema;           // in the name of the ICU data file
-  std::set<std::string> zones;  // such as Europe/Paris; links are zones, too
-  std::size_t entries = 0;
-  std::uint64_t bytes = 0;
-  friend bool operator==(const contents&, const contents&) = default;
-};
+// Walks through a set, and throws `refusal` at the first thing that a sound one
+// cannot have; the bytes of files are not looked at. Nothing but directories
+// and regular files is ever opened, no link is followed, and all is bounded by
+// the limits. If something else takes the place of a file in between, it is
+// opened without waiting, and refused.
+//
+// Everything is made anew in `copy`, if there is one: an empty directory that
+// nobody else can enter. Directories get the mode 755, files 644. `where` is
+// what lines call it. Returns the paths of all files except "SHA256SUMS" and
+// its signatures, sorted by their bytes, each with the first name of the file.
+using file_names = std::map<std::string, std::string>;
+file_names files_in(int set, int copy = -1, const std::string& where = {});
 
-// Walks through an update, `directory`, and throws `failure` at the first thing
-// that a sound one cannot have. Nothing but directories and regular files is
-// ever opened, no link is followed, and what is read and remembered is bounded
-// by the limits. If a FIFO takes the place of a file in between, it is opened
-// without waiting, and refused.
-contents examine(int directory, receiver& to);
+// Throws `refusal` unless "SHA256SUMS" in a set has exactly the bytes that
+// sha256sum(1) prints of these files, which it reads.
+void check_manifest(int set, const file_names& files);
+
+// Whether a set on the device is whole. `why` is for a damaged one.
+enum class condition { whole, damaged, unlisted, lost };
+struct verdict {
+  condition is;
+  std::string why;
+};
+verdict condition_of(const std::string& set);

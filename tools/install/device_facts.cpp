@@ -2,6 +2,7 @@
 #include "tools/install/device_facts.h"
 
 #include <fcntl.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <cerrno>
@@ -11,13 +12,11 @@
 #include <string_view>
 
 #include "dataset/icu.h"
-#include "dataset/icu_file_name.h"
 #include "dataset/zoneinfo.h"
 #include "support/paths.h"
 #include "support/version_grammar.h"
 #include "tools/install/failure.h"
 #include "tools/install/files.h"
-#include "tools/install/path_text.h"
 
 namespace {
 
@@ -31,9 +30,8 @@ std::string first_step_below(std::string_view root, std::string_view path) {
   return std::string(path.substr(0, path.find('/')));
 }
 
-std::string existing(const std::string& set) {
-  const std::string path = paths::download_root + set;
-  return status_of(AT_FDCWD, path, path).st_mode != 0 ? set : std::string();
+std::string set_in(const char* link) {
+  return first_step_below(paths::download_root, text_of(link));
 }
 
 // The path without any link in it; empty if there is nothing at its end.
@@ -58,41 +56,54 @@ std::optional<mln_version> version_in(const std::string& text) {
   }
 }
 
-std::string set_in(const std::string& link_text) {
-  return first_step_below(paths::download_root, link_text);
+bool is_file(const std::string& path) {
+  struct stat status {};
+  return ::stat(path.c_str(), &status) == 0 && S_ISREG(status.st_mode);
 }
 
-std::string announced_set() {
-  return existing(set_in(text_of(paths::latest_update_link)));
+bool is_installed(const std::string& set) {
+  const std::string path = paths::download_root + set;
+  return !set.empty() && status_of(AT_FDCWD, path, path).st_mode != 0;
 }
 
-std::string set_in_use() {
-  return existing(set_in(text_of(paths::zoneinfo_link)));
-}
+std::string announced_set() { return set_in(paths::latest_update_link); }
+
+std::string set_in_use() { return set_in(paths::zoneinfo_link); }
+
+std::string icu_set_in_use() { return set_in(paths::icu_link); }
 
 std::string system_version() { return mln_zoneinfo().version() + ".1.0"; }
 
 std::string system_schema() { return mln_icu().schema; }
 
 bool fits_system(const std::string& set) {
-  const std::string path = paths::download_root + set + "/icutz";
-  const std::unique_ptr<DIR, close_listing> entries(::opendir(path.c_str()));
   const std::string schema = system_schema();
-  while (entries) {
-    const dirent* const entry = ::readdir(entries.get());
-    if (entry == nullptr) break;
-    if (!schema.empty() && icu_schema_in(entry->d_name) == schema) return true;
+  try {
+    return is_installed(set) && !schema.empty() &&
+           mln_icu(paths::download_root + set).schema == schema;
+  } catch (int) {
+    return false;
   }
-  return false;
+}
+
+bool a_boot_could_take(const std::string& set) {
+  const auto version = version_in(set);
+  const std::string in_use = set_in_use();
+  const auto than = version_in(in_use.empty() ? system_version() : in_use);
+  return version && (!than || *version > *than) && fits_system(set);
 }
 
 std::string zone_of_the_user() {
   const std::string text = text_of(paths::localtime_link);
-  for (const std::string_view tree :
+  for (const std::string tree :
        {paths::zoneinfo_link, paths::former_zoneinfo}) {
-    if (text.size() > tree.size() && text.starts_with(tree) &&
-        text[tree.size()] == '/')
-      return joined("", text.substr(tree.size()));
+    if (!text.starts_with(tree + "/")) continue;
+    const std::string zone = text.substr(tree.size() + 1);
+    // Only a look at the way could tell where ".." leads.
+    if (zone.find("..") != zone.npos) break;
+    if (is_file(paths::localtime_link) ||
+        is_file(paths::zoneinfo_link + ("/" + zone)))
+      return zone;
   }
   return {};
 }
@@ -103,7 +114,7 @@ std::set<std::string> needed_sets() {
   for (const char* link :
        {paths::zoneinfo_link, paths::icu_link, paths::latest_update_link,
         paths::legacy_icu_link, paths::localtime_link}) {
-    needed.insert(set_in(text_of(link)));
+    needed.insert(set_in(link));
     needed.insert(first_step_below(root, resolved(link)));
   }
   needed.erase("");

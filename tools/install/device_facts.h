@@ -1,8 +1,7 @@
 // SPDX-License-Identifier: BSD-2-Clause
 //
 // What a device says of itself, as far as an installer has to know it. Reads
-// only. Quiet, unlike the boot: what a boot complains about is not an
-// installer's.
+// only, by the boot's own classes where it has one.
 #pragma once
 
 #include <optional>
@@ -14,25 +13,31 @@
 // The version in a text; none in a malformed one, which is older than any.
 std::optional<mln_version> version_in(const std::string& text);
 
-// The name of the set in "/var/db/timezone/tz/" that a link's text leads to, or
-// into; empty if it leads elsewhere.
-std::string set_in(const std::string& link_text);
-
-// The set that each of these links names, if that set is there; otherwise
-// empty.
+// The name of the set in "/var/db/timezone/tz/" that the text of each of these
+// links leads to, or into; empty if it leads elsewhere.
 std::string announced_set();
 std::string set_in_use();
+std::string icu_set_in_use();
 
 // The version text of the system partition's data, such as 2024a.1.0.
 std::string system_version();
 // The ICU schema of the system; empty where there is none.
 std::string system_schema();
 
-// Whether a set has ICU data of the system's schema.
+// Whether there is such a set, of any kind.
+bool is_installed(const std::string& set);
+
+// Whether a set is there and has ICU data of the system's schema.
 bool fits_system(const std::string& set);
 
+// Whether a set that fits is newer than the data in use.
+bool a_boot_could_take(const std::string& set);
+
+// Whether a regular file is at a path, perhaps by way of links.
+bool is_file(const std::string& path);
+
 // The zone that "localtime" names, such as Europe/Paris, here or where it was
-// on older systems; empty for any other link.
+// on older systems, if the device can read it now; otherwise empty.
 std::string zone_of_the_user();
 
 // Names in "/var/db/timezone/tz/" that must stay: one of the links leads into

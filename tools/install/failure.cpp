@@ -6,9 +6,10 @@
 
 #include "tools/escaped.h"
 
-void refuse(const std::string& what) { throw failure{status::failed, what}; }
+void refuse(const std::string& what) { throw refusal{{status::failed, what}}; }
 
 void fail(const char* what, std::string_view name) {
   const char* const reason = std::strerror(errno);
-  refuse(std::string("cannot ") + what + " " + escaped(name) + ": " + reason);
+  throw failure{status::failed, std::string("cannot ") + what + " " +
+                                    escaped(name) + ": " + reason};
 }

@@ -10,9 +10,9 @@
 namespace status {
 
 inline constexpr int done = 0;
-inline constexpr int failed = 1;   // the update is refused, or a call failed
+inline constexpr int failed = 1;   // refused, not whole, or a call failed
 inline constexpr int bad_use = 2;  // of the command line
-inline constexpr int busy = 3;     // another one is at work
+inline constexpr int busy = 3;     // another marlin-install is running
 inline constexpr int not_newer =
     4;  // the device has this update or a newer one
 
@@ -23,9 +23,13 @@ struct failure {
   std::string line;  // safe to show, without the program's name
 };
 
-// Throws `failure` with status::failed. `what` must be safe to show.
+// What was looked at is not as it has to be; no call has failed.
+struct refusal : failure {};
+
+// Throws `refusal` with status::failed. `what` must be safe to show.
 [[noreturn]] void refuse(const std::string& what);
 
-// The same for a call that has just failed: "cannot WHAT: " and the text of
-// errno. `name`, if any, is the path that the call was about, shown escaped.
+// Throws `failure` for a call that has just failed: "cannot WHAT: " and the
+// text of errno. `name`, if any, is the path that the call was about, shown
+// escaped.
 [[noreturn]] void fail(const char* what, std::string_view name);

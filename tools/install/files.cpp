@@ -2,6 +2,8 @@
 #include "tools/install/files.h"
 
 #include <fcntl.h>
+#include <linux/fs.h>
+#include <sys/syscall.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -10,6 +12,7 @@
 #include <cstdio>
 #include <string_view>
 
+#include "tools/escaped.h"
 #include "tools/install/failure.h"
 
 struct stat status_of(int directory, const std::string& name,
@@ -25,7 +28,7 @@ descriptor open_directory(int parent, const std::string& name,
                           const std::string& path) {
   descriptor opened(::openat(parent, name.c_str(),
                              O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
-  if (opened.number() < 0) fail("open the directory", path);
+  if (opened.number() < 0) fail("open", path);
   return opened;
 }
 
@@ -72,6 +75,21 @@ std::string link_text(int directory, const std::string& name,
   return {};
 }
 
+std::string read_all(int file, std::size_t most, const std::string& path) {
+  std::string text;
+  char buffer[1 << 14];
+  for (;;) {
+    const ssize_t count = ::read(file, buffer, sizeof buffer);
+    if (count < 0 && errno == EINTR) continue;
+    if (count < 0) fail("read", path);
+    if (count == 0) return text;
+    text.append(buffer, static_cast<std::size_t>(count));
+    if (text.size() > most)
+      refuse(escaped(path) + " is larger than " + std::to_string(most >> 20) +
+             " MiB");
+  }
+}
+
 void sync(int file, const std::string& path) {
   if (::fsync(file) != 0) fail("sync", path);
 }
@@ -80,4 +98,12 @@ void rename_entry(int directory, const std::string& from, const std::string& to,
                   const std::string& path) {
   if (::renameat(directory, from.c_str(), directory, to.c_str()) != 0)
     fail("rename", path);
+}
+
+void exchange_entries(int directory, const std::string& one,
+                      const std::string& other, const std::string& path) {
+  // Not every C library has a function for it.
+  if (::syscall(SYS_renameat2, directory, one.c_str(), directory, other.c_str(),
+                RENAME_EXCHANGE) != 0)
+    fail("exchange", path);
 }

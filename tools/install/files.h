@@ -7,6 +7,7 @@
 #include <dirent.h>
 #include <sys/stat.h>
 
+#include <cstddef>
 #include <memory>
 #include <string>
 #include <vector>
@@ -39,9 +40,14 @@ const char* next_name(DIR* entries, const std::string& path);
 std::string link_text(int directory, const std::string& name,
                       const std::string& path);
 
+// read(2) to the end. Refuses more bytes than `most`.
+std::string read_all(int file, std::size_t most, const std::string& path);
+
 // fsync(2).
 void sync(int file, const std::string& path);
 
-// rename(2).
+// rename(2), or the exchange of two entries.
 void rename_entry(int directory, const std::string& from, const std::string& to,
                   const std::string& path);
+void exchange_entries(int directory, const std::string& one,
+                      const std::string& other, const std::string& path);

@@ -7,15 +7,17 @@
 #include <cstdio>
 #include <cstdlib>
 #include <memory>
+#include <set>
 
+#include "support/paths.h"
 #include "tools/escaped.h"
 #include "tools/install/checks.h"
 #include "tools/install/contents.h"
-#include "tools/install/copy.h"
+#include "tools/install/device_facts.h"
 #include "tools/install/downloads.h"
 #include "tools/install/failure.h"
 #include "tools/install/files.h"
-#include "tools/install/progress.h"
+#include "tools/install/program.h"
 
 namespace {
 
@@ -40,110 +42,182 @@ update open_update(std::string path) {
   return {open_directory(AT_FDCWD, path, path), name_of(path)};
 }
 
-// Runs a part of a job, and puts before and after its line what it is about.
-template <typename Part>
-auto about(const std::string& before, const char* after, Part part) {
+const char* word_for(condition is) {
+  switch (is) {
+    case condition::whole:
+      return "whole";
+    case condition::damaged:
+      return "damaged";
+    case condition::unlisted:
+      return "without a manifest";
+    case condition::lost:
+      break;
+  }
+  return "lost";
+}
+
+// What is checked is the copy: nobody else can change that.
+descriptor checked_copy(downloads& place, const update& given,
+                        const std::string& verifier) {
+  descriptor copy = place.make_incoming();
+  const std::string path = place.incoming_path();
+  const auto files = files_in(given.directory.number(), copy.number(), path);
+  check_manifest(copy.number(), files);
+  check_contents(given.name, path, files);
+  if (verifier.empty()) return copy;
+  if (const int ended = run_program({verifier, path}); ended != 0)
+    refuse(escaped(verifier) + " refuses it, with status " +
+           std::to_string(ended));
+  return copy;
+}
+
+// Puts before and after a line what it is about.
+[[noreturn]] void rethrow(failure& told, const std::string& name,
+                          const char* after) {
+  told.line = escaped(name) + ": " + told.line + after;
+  throw;
+}
+
+// What the device names already needs no announcement.
+enum class placed { announced, named_before, only_checked };
+
+placed put(downloads& place, const update& given, const options& wanted) {
+  const bool is_named = check_version(given.name, wanted.force);
+  const descriptor copy = checked_copy(place, given, wanted.verifier);
+  if (wanted.what == job::check) {
+    if (!place.take_back()) refuse("the copy cannot be deleted");
+    return placed::only_checked;
+  }
+  place.put_in_place(copy, given.name);
+  if (is_named) return placed::named_before;
+  place.announce(given.name);
+  return placed::announced;
+}
+
+int install(const options& wanted) {
+  const update given = open_update(wanted.directory);
+  const char* const name = given.name.c_str();
+  downloads place;
+  placed done{};
   try {
-    return part();
+    done = put(place, given, wanted);
   } catch (failure& told) {
-    told.line = before + told.line + after;
+    rethrow(told, name,
+            place.take_back()
+                ? "; nothing was changed"
+                : "; something is left in /var/db/timezone/tz/, which the next "
+                  "run deletes");
+  } catch (...) {
+    place.take_back();
     throw;
   }
-}
-
-contents check(const update& given, bool force) {
-  return about(escaped(given.name) + ": ", "; nothing was changed", [&] {
-    check_version(given.name, force);
-    receiver nobody;
-    const contents found = examine(given.directory.number(), nobody);
-    check_contents(given.name, found);
-    return found;
-  });
-}
-
-class told_copy final : public receiver {
- public:
-  told_copy(int top, const std::string& path, std::size_t entries)
-      : copy_(top, path), progress_(entries) {}
-  void enter(const std::string& path) override { copy_.enter(path); }
-  void leave(const std::string& path) override { copy_.leave(path); }
-  void file(const std::string& path, std::string_view content) override {
-    copy_.file(path, content);
-    progress_.step();
+  if (done == placed::only_checked)
+    return std::printf("%s can be installed\n", name), status::done;
+  try {
+    if (done == placed::announced) place.sync_announcement();
+  } catch (failure& told) {
+    rethrow(told, name,
+            "; it is announced, but a loss of power may undo that: run this "
+            "again");
   }
-  void name(const std::string& path, const std::string& of) override {
-    copy_.name(path, of);
-    progress_.step();
-  }
-  void link(const std::string& path, const std::string& text) override {
-    copy_.link(path, text);
-    progress_.step();
-  }
-  void end() override { copy_.end(); }
-
- private:
-  copy copy_;
-  progress progress_;
-};
-
-// Checks again what it copies: the update may have changed since it was
-// checked.
-void copy_into(downloads& to, const update& given, const contents& checked) {
-  const descriptor incoming = to.make_incoming();
-  told_copy copier(incoming.number(), to.incoming_path(), checked.entries);
-  const contents copied = examine(given.directory.number(), copier);
-  check_contents(given.name, copied);
-  if (copied != checked) refuse("it was changed meanwhile");
-}
-
-void install(const update& given, bool force) {
-  downloads place;
-  const contents found = check(given, force);
-  about(escaped(given.name) + ": ", "; nothing was changed", [&] {
-    try {
-      copy_into(place, given, found);
-      place.put_in_place(given.name);
-      place.announce(given.name);
-    } catch (...) {
-      place.take_back();
-      throw;
-    }
-  });
-  about(escaped(given.name) + ": ",
-        "; it is announced, but a loss of power may undo that: run this again",
-        [&] { place.sync_announcement(); });
   place.tidy();
-  std::printf("%s is announced; the next boot decides\n", given.name.c_str());
+  std::printf(done == placed::announced
+                  ? "%s is announced; the next boot decides\n"
+                  : "%s is whole again, in its place\n",
+              name);
+  return status::done;
 }
 
-void tell_of_removal(const std::string& name, const removed& gone) {
-  std::printf("removed %s: %" PRIu64 " files, %" PRIu64 " kB\n",
-              escaped(name).c_str(), gone.files, gone.bytes / 1000);
+// A text of the device, escaped, and once more as JSON has it.
+std::string quoted(const std::string& text) {
+  std::string shown = "\"";
+  for (const char letter : escaped(text)) {
+    if (letter == '\\' || letter == '"') shown += '\\';
+    shown += letter;
+  }
+  return shown + '"';
+}
+
+// All sets, and those that a link names and that are not there.
+int audit(bool json) {
+  std::set<std::string> sets = needed_sets();
+  const std::set<std::string> needed = sets;
+  const descriptor place =
+      open_directory(AT_FDCWD, paths::download_root, paths::download_root);
+  const listing entries = open_listing(place.number(), paths::download_root);
+  while (const char* const name =
+             next_name(entries.get(), paths::download_root)) {
+    if (version_in(name)) sets.insert(name);
+  }
+  bool all_whole = true;
+  const char* before = "";
+  if (json) std::printf("{\"sets\": [");
+  for (const auto& set : sets) {
+    const verdict found = condition_of(set);
+    const char* const is = word_for(found.is);
+    all_whole = all_whole && found.is == condition::whole;
+    const bool stays = needed.contains(set);
+    if (json)
+      std::printf("%s\n  {\"name\": %s, \"condition\": \"%s\", \"needed\": %s}",
+                  before, quoted(set).c_str(), is, stays ? "true" : "false");
+    else
+      std::printf("%s: %s%s%s%s\n", escaped(set).c_str(), is,
+                  found.why.empty() ? "" : ", ", found.why.c_str(),
+                  stays ? "; in use or announced" : "");
+    before = ",";
+  }
+  if (json) std::puts("\n]}");
+  return all_whole ? status::done : status::failed;
+}
+
+void tell_of_removal(const std::string& name, const removed* gone) {
+  if (gone == nullptr)
+    std::printf(
+        "kept %s: it is newer than what is in use; --force --prune "
+        "removes it\n",
+        name.c_str());
+  else
+    std::printf("removed %s: %" PRIu64 " files, %" PRIu64 " kB\n", name.c_str(),
+                gone->files, gone->bytes / 1000);
+}
+
+void settle(downloads place) {
+  const std::string set = announced_set();
+  if (!is_installed(set) || set != set_in_use() || set != icu_set_in_use()) {
+    std::puts("nothing to settle");
+    return;
+  }
+  // The announcement goes last: if this is stopped, the next one goes on.
+  place.prune(false, tell_of_removal);
+  place.withdraw();
+  std::printf("%s is in use and no longer announced\n", set.c_str());
 }
 
 }  // namespace
 
-void run_job(const options& wanted) {
+int run_job(const options& wanted) {
   switch (wanted.what) {
     case job::install:
-      return install(open_update(wanted.directory), wanted.force);
-    case job::check: {
-      const update given = open_update(wanted.directory);
-      check(given, wanted.force);
-      std::printf("%s can be installed\n", given.name.c_str());
-      return;
-    }
+    case job::check:
+      return install(wanted);
+    case job::audit:
+      return audit(wanted.json);
+    case job::settle:
+      settle({});
+      break;
     case job::withdraw:
       std::puts(downloads().withdraw() ? "nothing is announced any more"
                                        : "nothing was announced");
-      return;
+      break;
     case job::prune:
-      return downloads().prune(tell_of_removal);
+      downloads().prune(wanted.force, tell_of_removal);
+      break;
     case job::help:
       std::fputs(usage, stdout);
-      return;
+      break;
     case job::version:
       std::puts("marlin-install " MARLIN_VERSION);
-      return;
+      break;
   }
+  return status::done;
 }

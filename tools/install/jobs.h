@@ -3,6 +3,6 @@
 
 #include "tools/install/options.h"
 
-// Does what was asked for, and tells on standard output what it did; or throws
-// `failure`, with nothing half done.
-void run_job(const options& wanted);
+// Does what was asked for, and tells on standard output what it did: the exit
+// status. Or throws `failure`, with nothing half done.
+int run_job(const options& wanted);

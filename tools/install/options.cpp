@@ -1,28 +1,36 @@
 // SPDX-License-Identifier: BSD-2-Clause
 #include "tools/install/options.h"
 
-#include <getopt.h>
+#include <map>
+#include <string_view>
 
 #include "tools/escaped.h"
 #include "tools/install/failure.h"
 
 const char usage[] =
-    "usage: marlin-install [--force] DIR\n"
-    "       marlin-install [--force] --check DIR\n"
-    "       marlin-install --withdraw | --prune | --help | --version\n"
-    "\n"
-    "Installs the time-zone data in DIR, an unpacked update whose origin you "
-    "have\n"
-    "verified, and announces it to the next boot.\n"
-    "\n"
-    "  --check     only says whether it can be installed\n"
-    "  --force     also if it is not newer than what the device has\n"
-    "  --withdraw  removes the announcement; deletes no data\n"
-    "  --prune     deletes all sets that are neither in use nor announced\n"
-    "\n"
-    "Exit status: 0 done; 1 refused or failed; 2 bad use; 3 another one is at\n"
-    "work; 4 the device has this update or a newer one. See "
-    "marlin-install(8).\n";
+    R"(usage: marlin-install [--force] [--verify PROGRAM] [--check] DIR
+       marlin-install --audit [--json]
+       marlin-install --settle | --withdraw | [--force] --prune
+       marlin-install --help | --version
+
+Installs the time-zone data in DIR, an unpacked update with its manifest
+SHA256SUMS, and announces it to the next boot. No option can be abbreviated.
+
+  --verify PROGRAM  refuses the update unless PROGRAM, which gets the path of
+                    the checked copy, ends with status 0
+  --check           only says whether it can be installed
+  --force           also if it is not newer than what the device has; for
+                    --prune: also what is newer than the data in use
+  --audit           says of each set on the device whether it is whole
+  --json            for programs
+  --settle          if the announced set is in use: --withdraw and --prune
+  --withdraw        removes the announcement; deletes no data
+  --prune           deletes all sets that are neither in use nor announced
+
+Exit status: 0 done; 1 refused, failed, or a set is not whole; 2 bad use;
+3 another marlin-install is running; 4 the device has this update or a newer
+one. See marlin-install(8).
+)";
 
 namespace {
 
@@ -30,55 +38,51 @@ namespace {
   throw failure{status::bad_use, why + "; see --help"};
 }
 
-const option known[] = {{"check", no_argument, nullptr, 'c'},
-                        {"withdraw", no_argument, nullptr, 'w'},
-                        {"prune", no_argument, nullptr, 'p'},
-                        {"help", no_argument, nullptr, 'h'},
-                        {"version", no_argument, nullptr, 'v'},
-                        {"force", no_argument, nullptr, 'f'},
-                        {nullptr, 0, nullptr, 0}};
-
-job job_of(int letter) {
-  switch (letter) {
-    case 'c':
-      return job::check;
-    case 'w':
-      return job::withdraw;
-    case 'p':
-      return job::prune;
-    case 'h':
-      return job::help;
-    default:
-      return job::version;
-  }
-}
+const std::map<std::string_view, job> jobs{
+    {"--check", job::check},    {"--audit", job::audit},
+    {"--settle", job::settle},  {"--withdraw", job::withdraw},
+    {"--prune", job::prune},    {"--help", job::help},
+    {"--version", job::version}};
 
 }  // namespace
 
+// Not by getopt_long(3): it takes any beginning of an option for the option,
+// and "--p" would delete data.
 options options_in(int argc, char** argv) {
   options wanted;
-  opterr = 0;
-  for (;;) {
-    const int at = optind;
-    // "+": what follows DIR is no option.
-    const int letter = ::getopt_long(argc, argv, "+", known, nullptr);
-    if (letter == -1) break;
-    if (letter == '?') misused(escaped(argv[at]) + " is not understood");
-    if (letter == 'f') {
+  int at = 1;
+  for (; at < argc && *argv[at] == '-'; ++at) {
+    const std::string_view word = argv[at];
+    const auto found = jobs.find(word);
+    if (word == "--") {
+      ++at;
+      break;
+    } else if (word == "--force") {
       wanted.force = true;
-    } else if (wanted.what == job::install) {
-      wanted.what = job_of(letter);
-    } else {
+    } else if (word == "--json") {
+      wanted.json = true;
+    } else if (word == "--verify") {
+      if (++at == argc || *argv[at] == '\0') misused("give --verify a program");
+      wanted.verifier = argv[at];
+    } else if (found == jobs.end()) {
+      misused(escaped(word) + " is not understood");
+    } else if (wanted.what != job::install) {
       misused("one of the options at a time");
+    } else {
+      wanted.what = found->second;
     }
   }
   const bool takes_directory =
       wanted.what == job::install || wanted.what == job::check;
-  if (argc - optind != (takes_directory ? 1 : 0))
+  if (argc - at != (takes_directory ? 1 : 0))
     misused(takes_directory ? "give the directory of one update"
                             : "this option takes no directory");
-  if (wanted.force && !takes_directory)
-    misused("--force is for installing and --check");
-  if (takes_directory) wanted.directory = argv[optind];
+  if (wanted.force && !takes_directory && wanted.what != job::prune)
+    misused("--force is for installing, --check and --prune");
+  if (!wanted.verifier.empty() && !takes_directory)
+    misused("--verify is for installing and --check");
+  if (wanted.json && wanted.what != job::audit)
+    misused("--json is for --audit");
+  if (takes_directory) wanted.directory = argv[at];
   return wanted;
 }

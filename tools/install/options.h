@@ -3,11 +3,22 @@
 
 #include <string>
 
-enum class job { install, check, withdraw, prune, help, version };
+enum class job {
+  install,
+  check,
+  audit,
+  settle,
+  withdraw,
+  prune,
+  help,
+  version
+};
 
 struct options {
   job what = job::install;
   bool force = false;
+  bool json = false;
+  std::string verifier{};   // for the first two; empty: none
   std::string directory{};  // of the update, for the first two
 };
 
