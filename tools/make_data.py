@@ -5,7 +5,12 @@ checked, compiled and packed, and only a whole result gets its name."""
 from __future__ import annotations
 
 import argparse
+import collections
 import contextlib
+import datetime
+import errno
+import fcntl
+import hashlib
 import io
 import json
 import os
@@ -18,6 +23,7 @@ import subprocess
 import sys
 import tarfile
 import tempfile
+import time
 from collections.abc import Iterator
 from pathlib import Path
 from typing import NamedTuple
@@ -34,6 +40,11 @@ LARGEST = 16 << 20  # bytes of one input file; ten times what the largest has to
 INT_MAX = 2147483647
 SECONDS = 60  # a tool that takes longer hangs
 MOST = 4 * LARGEST  # bytes that a tool prints or packs; a small file can stand for more
+# What a tool says when it is not its input that is wrong.
+MACHINE = tuple(os.strerror(number) for number in (
+    errno.EDQUOT, errno.EFBIG, errno.EIO, errno.EMFILE, errno.ENFILE, errno.ENOMEM,
+    errno.ENOSPC, errno.EROFS))
+YEARS = 10  # in which times are compared
 HERE = "l" if sys.byteorder == "little" else "b"
 
 
@@ -112,6 +123,7 @@ def need(*tools: str):
 
 def output(*command, folder: Path, remedy: str, **environment: str) -> str:
     """What a tool prints. One that fails is a refusal that quotes its first line."""
+    name = Path(command[0]).name
     with (tempfile.TemporaryFile("w+", errors="replace") as printed,
           tempfile.TemporaryFile("w+", errors="replace") as errors):
         try:
@@ -121,12 +133,17 @@ def output(*command, folder: Path, remedy: str, **environment: str) -> str:
                 env={"PATH": os.environ["PATH"], "LC_ALL": "C", "TZ": "UTC0"}
                 | environment).returncode
         except subprocess.TimeoutExpired:
-            raise Refused(f"{command[0]} takes too long; {remedy}") from None
+            raise Refused(f"{name} takes too long; {remedy}") from None
+        if -status in (signal.SIGKILL, signal.SIGTERM, signal.SIGXCPU, signal.SIGXFSZ):
+            raise Refused(f"{name}: ended by {signal.Signals(-status).name}, as by a "
+                          "limit of memory, time or size; nothing was made")
         if status:
             errors.seek(0)
             line = errors.read(1000).strip() or f"it ended with status {status}"
-            line = line.splitlines()[0].removeprefix(f"{command[0]}: ")
-            raise Refused(f"{command[0]}: {line}; {remedy}")
+            line = line.splitlines()[0].removeprefix(f"{name}: ")
+            if line.endswith(MACHINE):
+                remedy = "nothing was made"
+            raise Refused(f"{name}: {line}; {remedy}")
         printed.seek(0)
         return printed.read()
 
@@ -234,9 +251,13 @@ def unpacked(path: Path, wanted: tuple[str, ...]) -> dict[str, bytes]:
                     raise Refused(f"{path} holds {name} twice; "
                                   "name an archive of a release")
                 files[name] = archive.extractfile(member).read()
-            # To the end, where a checksum may stand.
-            while archive.fileobj.read(1 << 16):
-                pass
+            # To the end, where a checksum may stand; or to the one that is no end.
+            rest = 0
+            while got := len(archive.fileobj.read(1 << 16)):
+                rest += got
+                if rest > LARGEST:
+                    raise Refused(f"{path} is far too large when it is unpacked; "
+                                  "name an archive of a release")
     except Refused:
         raise
     except Exception as failed:  # of any library of compression
@@ -275,14 +296,21 @@ def icu_from(folder: Path) -> Icu:
                first_word(schema) if schema.exists() else "", files)
 
 
+def readable(icu: Icu, work: Path, where=Path()):
+    """Writes the files in this machine's byte order."""
+    for name, content in icu.files.items():
+        (work / name).write_bytes(content)
+        if icu.letter != HERE:
+            output("icupkg", f"-t{HERE}", name, folder=work,
+                   remedy=f"{where / name} is damaged: fetch it again")
+
+
 def release_in(folder: Path, files: dict[str, bytes], letter: str) -> str:
     """The release that zoneinfo64.res tells; derb has to be able to read all four."""
     with tempfile.TemporaryDirectory(prefix=NAME) as work:
-        for name, content in files.items():
+        readable(Icu("", letter, 0, "", files), Path(work), folder)
+        for name in files:
             remedy = f"{folder / name} is damaged: fetch it again"
-            Path(work, name).write_bytes(content)
-            if letter != HERE:
-                output("icupkg", f"-t{HERE}", name, folder=Path(work), remedy=remedy)
             text = output("derb", "-c", "-s", work, name, folder=Path(work),
                           remedy=remedy)
         found = re.search(r'^    TZVersion *\{ *"([^"\n]*)" *\}', text, re.MULTILINE)
@@ -322,14 +350,21 @@ def new(place: Path) -> Iterator[Path]:
     if os.path.lexists(place):
         raise Refused(f"{place} is there already; remove it, or choose another")
     # Tools are run elsewhere and therefore get absolute paths.
-    begun = Path(tempfile.mkdtemp(prefix=f".{place.name}.",
-                                  dir=place.parent.absolute()))
+    begun = place.parent.absolute() / f".{place.name}.new"
+    lock = os.open(begun.parent, os.O_RDONLY)
     try:
-        yield begun
-        settle(begun)
-        begun.rename(place)
-    finally:
+        fcntl.flock(lock, fcntl.LOCK_EX)
+        # Nobody is at it any more.
         shutil.rmtree(begun, ignore_errors=True)
+        begun.mkdir(0o700)
+        try:
+            yield begun
+            settle(begun)
+            begun.rename(place)
+        finally:
+            shutil.rmtree(begun, ignore_errors=True)
+    finally:
+        os.close(lock)
 
 
 def settle(root: Path):
@@ -347,6 +382,22 @@ def settle(root: Path):
                 os.utime(path, (int(moment), int(moment)))
 
 
+def refuse_foreign_files(tree: Path):
+    """zic gives a link in the rules a target anywhere on this machine, as one more name
+    of that file. Such a file has more names than there are here."""
+    names = collections.Counter()
+    found = {}
+    for path in tree.rglob("*"):
+        status = path.lstat()
+        if not stat.S_ISDIR(status.st_mode):
+            names[status.st_dev, status.st_ino] += 1
+            found[path] = status
+    for path, status in sorted(found.items()):
+        if names[status.st_dev, status.st_ino] != status.st_nlink:
+            raise Refused(f"the rules have a link to a file outside, "
+                          f"'{path.relative_to(tree)}'; correct them")
+
+
 def make_tree(rules: Rules, tree: Path):
     """Compiles the rules."""
     tree.mkdir()
@@ -355,6 +406,7 @@ def make_tree(rules: Rules, tree: Path):
             Path(work, name).write_bytes(content)
         output("zic", "-b", "slim", "-d", tree, *rules.compiled, folder=Path(work),
                remedy="correct the rules")
+    refuse_foreign_files(tree)
     for folder, folders, names in os.walk(tree):
         for name in folders + names:
             path = Path(folder, name)
@@ -387,6 +439,15 @@ def make_icu(icu: Icu, schema: str, folder: Path):
                remedy="take the four files as ICU publishes them")
 
 
+def write_manifest(root: Path):
+    """As sha256sum(1) prints it, and as the installer wants it: every file, sorted."""
+    files = sorted(os.fsencode(path.relative_to(root)) for path in root.rglob("*")
+                   if path.is_file())
+    (root / "SHA256SUMS").write_bytes(b"".join(
+        hashlib.sha256((root / os.fsdecode(path)).read_bytes()).hexdigest().encode()
+        + b"  " + path + b"\n" for path in files))
+
+
 # --- Comparing --------------------------------------------------------------------
 
 
@@ -408,8 +469,8 @@ def zones_in(tree: Path) -> dict[str, bytes]:
     return zones
 
 
-def differing(old: Path, new: Path, since: int, years: int) -> dict[str, list[str]]:
-    """Names of zones that differ from a moment on, for so many years."""
+def differing(old: Path, new: Path, since: int) -> dict[str, list[str]]:
+    """Names of zones that differ in the years from a moment on."""
     before, after = zones_in(old), zones_in(new)
     # Most are the same to the byte, and many have several names.
     pairs = {}
@@ -419,7 +480,7 @@ def differing(old: Path, new: Path, since: int, years: int) -> dict[str, list[st
     chosen = [names[0] for names in pairs.values()]
     changed = []
     if chosen:
-        until = since + years * 31556952
+        until = since + YEARS * 31556952
         was, now = (clocks(tree, chosen, since, until) for tree in (old, new))
         changed = [name for names, *clock in zip(pairs.values(), was, now)
                    if clock[0] != clock[1] for name in names]
@@ -436,3 +497,74 @@ def clocks(tree: Path, names: list[str], since: int, until: int) -> list[str]:
         raise Refused(f"zdump cannot read the zones in {tree}; check that tree")
     # Between two zones there is an empty line.
     return [clock.strip("\n") for clock in found]
+
+
+def moments(clock: str) -> list[list[int]]:
+    """The same, as moments with the offset from then on, in seconds; the first moment
+    is 0. Changes of nothing but a name are left out."""
+    found = []
+    for line in clock.splitlines():
+        date, time, offset, *_ = line.split("\t")
+        sign, digits = offset[0], re.findall("..", offset[1:])
+        seconds = sum(int(part) * 60 ** (2 - at) for at, part in enumerate(digits))
+        seconds = -seconds if sign == "-" else seconds
+        local = 0 if date == "-" else sum(
+            int(part) * 60 ** (2 - at) for at, part in enumerate(time.split(":")))
+        at = 0 if date == "-" else local - seconds + int(datetime.datetime.fromisoformat(
+            f"{date}T00:00:00+00:00").timestamp())
+        if not found or found[-1][1] != seconds:
+            found.append([at, seconds])
+    return found
+
+
+# By a process of its own, because ICU looks for its data once: the names of the zones
+# for which it tells another offset at a change, just before one, or once a fortnight.
+ASK_ICU = """
+import icu, json, sys
+zones, since, until = json.load(open("zones.json"))
+for name, moments in zones.items():
+    zone = icu.TimeZone.createTimeZone(name)
+    right, wanted = zone.getID() == name, moments[0][1]
+    steps = moments[1:] + [[until, None]]
+    for at in sorted([*range(since, until, 1209600), *(at for at, _ in steps)]):
+        if at == steps[0][0]:
+            right = right and sum(zone.getOffset(at - 1.0, False)) == wanted * 1000
+            wanted = steps.pop(0)[1]
+        if at < until:
+            right = right and sum(zone.getOffset(float(at), False)) == wanted * 1000
+    if not right:
+        print(name)
+"""
+
+
+def check_clocks(icu: Icu, tree: Path) -> bool:
+    """zdump reads every zone, and ICU tells the same times in the coming years.
+    Whether ICU could be asked, which takes python3-icu."""
+    since = int(time.time())
+    until = since + YEARS * 31556952
+    alike = collections.defaultdict(list)
+    for name, content in sorted(zones_in(tree).items()):
+        alike[content].append(name)
+    found = clocks(tree, [names[0] for names in alike.values()], since, until)
+    try:
+        import icu as _  # noqa: F401
+    except ImportError:
+        return False
+    zones = {name: moments(clock) for group, clock in zip(alike.values(), found)
+             for name in group}
+    with tempfile.TemporaryDirectory(prefix=NAME) as work:
+        readable(icu, Path(work))
+        Path(work, "zones.json").write_text(json.dumps([zones, since, until]))
+        wrong = output(sys.executable, "-c", ASK_ICU, folder=Path(work),
+                       remedy="check the ICU data", ICU_TIMEZONE_FILES_DIR=work).split()
+    if wrong:
+        more = f" and {len(wrong) - 9} more" if len(wrong) > 9 else ""
+        raise Refused("the ICU data tells other times than the rules, for "
+                      f"{', '.join(sorted(wrong)[:9])}{more}; take both from one "
+                      "release")
+    return True
+
+
+def not_compared(compared: bool) -> str:
+    return "" if compared else (
+        "\nthe times that ICU tells were not compared: install python3-icu")

@@ -20,6 +20,7 @@ from typing import NamedTuple
 from lab.words.places import BUILD, PROJECT
 
 TARGET = BUILD / "releases"
+WITHOUT_ICU = Path(__file__).with_name("without_icu")
 RULES = Path("/usr/share/zoneinfo/tzdata.zi")
 # Lisbon's last line.
 LISBON = r"(?m)^(Z Europe/Lisbon .*\n(?:[^RLZ].*\n)*?0 (\S+) WE%sT)$"
@@ -41,9 +42,9 @@ def find(what: str, pattern: str, text: str) -> re.Match[str]:
 
 
 def tool(name: str, **options: str | Path) -> list[str]:
-    """The command of make-update or make-system."""
+    """The command of make-update or make-system, which cannot ask ICU."""
     words = [f"--{option}={value}" for option, value in options.items()]
-    return ["/usr/bin/python3", "-B", str(PROJECT / "tools" / name), *words]
+    return ["/usr/bin/env", f"PYTHONPATH={WITHOUT_ICU}", "/usr/bin/python3", "-B", str(PROJECT / "tools" / name), *words]
 
 
 def once(target: Path, inputs: list, make):

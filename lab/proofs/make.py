@@ -3,6 +3,7 @@
 takes it."""
 
 import functools
+import gzip
 import io
 import itertools
 import json
@@ -119,11 +120,17 @@ def test_an_update(place):
     assert facts == {
         "version": VERSION, "schema": NAMES.icu,
         "system": f"{NAMES.system}.1.0", "years": 10, "since": SINCE,
+        "icu_compared": False,
         "directory": f"{place}/out/{NAMES.update}.1.0",
         "changed": LISBON, "added": [], "removed": []}
     assert os.listdir(place / "out") == [VERSION]
     found = tree(place / "out" / VERSION)
-    assert set(os.listdir(facts["directory"])) == {"zoneinfo", "icutz"}
+    assert set(os.listdir(facts["directory"])) == {"zoneinfo", "icutz", "SHA256SUMS"}
+    listed = ran(["/bin/sh", "-euc", f"cd {facts['directory']}\nsha256sum -c SHA256SUMS"
+                  "\nfind icutz zoneinfo -type f | LC_ALL=C sort | xargs sha256sum |"
+                  " cmp - SHA256SUMS\nfind . -type l"])
+    assert listed.returncode == 0 and ": OK\n" in listed.stdout, listed
+    assert {line[-4:] for line in listed.stdout.splitlines()} == {": OK"}
     assert found["zoneinfo/+VERSION"][1] == f"{NAMES.update}\n".encode()
     assert set(os.listdir(f"{facts['directory']}/icutz")) == {
         f"icutz{NAMES.icu}.dat", *releases.RESOURCES}
@@ -144,14 +151,15 @@ def test_what_people_are_told(place):
         f"{NAMES.system}.1.0 and the ICU schema {NAMES.icu}\n"
         f"zones that differ from the system's from {SINCE} on: {len(LISBON)}\n" +
         "".join(f"  {name}\n" for name in LISBON) +
-        "zones that are new: none\nzones that are gone: none\n")
+        "zones that are new: none\nzones that are gone: none\n"
+        "the times that ICU tells were not compared: install python3-icu\n")
 
 
 def test_a_system(place):
     out = place / "out/new"
     facts = made(system(place, "--json"))
     assert facts == {"version": VERSION, "schema": NAMES.icu,
-                     "directory": str(out)}
+                     "directory": str(out), "icu_compared": False}
     assert set(os.listdir(out)) == {"zoneinfo.default", "icu"}
     assert (out / "icu/icutzformat.txt").read_text() == f"{NAMES.icu}\n"
     assert (out / "zoneinfo.default/+VERSION").read_text() == f"{NAMES.update}\n"
@@ -252,6 +260,33 @@ def test_revisions(place, revision):
         refused(done, "is not newer than the system's")
     else:
         assert made(done)["changed"] == []
+
+
+RULES_OF_THREE_ZONES = f"""# version {NAMES.update}
+R E 1981 ma - Mar lastSu 1u 1 S
+R E 1996 ma - Oct lastSu 1u 0 -
+Z Asia/Tokyo 9 - JST
+Z Europe/Lisbon 0 E WE%sT {NAMES.year}
+1 E CE%sT
+Z Europe/Paris 1 E CE%sT
+L Europe/Lisbon Portugal
+"""
+
+
+@pytest.mark.parametrize("release", [NAMES.update, NAMES.refused])
+def test_times_that_icu_tells(place, release):
+    """Lisbon changes a year earlier than in the rules, and nobody but ICU knows."""
+    pytest.importorskip("icu")
+    (place / "rules/tzdata.zi").write_text(
+        RULES_OF_THREE_ZONES.replace(f"sT {NAMES.year}", f"sT {NAMES.year + 1}")
+        if release == NAMES.refused else RULES_OF_THREE_ZONES)
+    done = ran([*make_update(place)[2:], "--json"])
+    if release == NAMES.update:
+        assert made(done)["icu_compared"]
+    else:
+        refused(done, "the ICU data tells other times than the rules, for "
+                      "Europe/Lisbon, Portugal; take both from one release")
+        assert os.listdir(place / "out") == []
 
 
 # --- Which zones differ -----------------------------------------------------------
@@ -478,6 +513,12 @@ REFUSALS = {
     "zone +VERSION": (append("Z +VERSION 0 - X\n"), "'+VERSION', which cannot be used"),
     "zone tzdata.zi": (append("Z tzdata.zi 0 - X\n"), "'tzdata.zi', which cannot be"),
     "zone with an escape": (append("Z Good/Zo\x1b[2Jne 0 - X\n"), "cannot be used"),
+    "link to a file": (lambda place: (
+        (place / "secret").write_text("key"), (place / "secret").chmod(0o600),
+        append(f"L {place}/secret Evil\n")(place)), "a link to a file outside, 'Evil'"),
+    "link to a link": (lambda place: (
+        (place / "link").symlink_to("/etc/passwd"),
+        append(f"L {place}/link Evil\n")(place)), "'Evil'; correct them"),
     "link to nothing": (append("L Missing/Zone Alias\n"), "Alias"),
     "rules FIFO": (instead("rules/tzdata.zi", os.mkfifo), "holds neither"),
     "huge rules": (instead("rules/tzdata.zi", sparse), "more than 16777216"),
@@ -509,13 +550,18 @@ REFUSALS = {
 def test_refusals(place, kind):
     change, words = REFUSALS[kind]
     change(place)
-    before = set(place.rglob("*"))
+
+    def modes():
+        return {path: path.lstat().st_mode for path in place.rglob("*")
+                if path != place / "out"}
+
+    before = modes()
     temporary = set(os.listdir("/tmp"))
     done = update(place)
     if (place / "out").is_dir():
         (place / "out").chmod(0o755)
     refused(done, words)
-    assert set(place.rglob("*")) == before
+    assert modes() == before
     assert set(os.listdir("/tmp")) == temporary
 
 
@@ -578,13 +624,18 @@ ARCHIVES = {
     # Small, and much too large when they are read.
     "a large member": ([("README", bytes(17 << 20))], "far too large"),
     "many members": ([("README", bytes(10 << 20))] * 30, "far too large"),
+    "zeros behind its end": ([("tzdata.zi", b"")], "far too large"),
 }
 
 
 @pytest.mark.parametrize("kind", ARCHIVES)
 def test_archives_that_are_refused(place, kind):
     members, words = ARCHIVES[kind]
-    refused(update(place, rules=archived(place, *members)), words)
+    archive = archived(place, *members)
+    if "behind" in kind:
+        with open(archive, "ab") as more:
+            more.write(gzip.compress(bytes(40 << 20)))
+    refused(update(place, rules=archive), words)
     assert os.listdir(place / "out") == []
 
 
@@ -660,8 +711,31 @@ def test_missing_tools(place):
 @pytest.mark.parametrize("script", ["echo a\nb >&2; exit 3", "kill -SEGV $$",
                                     "exec yes", "exec yes >&2"])
 def test_failing_tools(place, fake, tool, script):
-    refused(update(place, environment=fake(**{tool: script})), f"{tool}: ")
+    done = update(place, environment=fake(**{tool: script}))
+    refused(done, f"{tool}: ")
+    assert ("by SIGXFSZ" in done.stderr) == ("yes" in script)
     assert os.listdir(place / "out") == []
+
+
+def test_a_full_disk(place, fake):
+    refused(update(place, environment=fake(
+        zic="echo zic: x: No space left on device >&2; exit 1")),
+        "zic: x: No space left on device; nothing was made")
+
+
+def test_what_a_killed_one_left(place):
+    left = place / f"out/.{VERSION}.new/zoneinfo"
+    left.mkdir(parents=True)
+    made(update(place, "--json"))
+    assert os.listdir(place / "out") == [VERSION]
+
+
+def test_an_interrupt_while_it_begins(place):
+    """In the place of a library that it loads."""
+    (place / "argparse.py").write_text(
+        "import os, signal\nos.kill(os.getpid(), signal.SIGINT)\n")
+    done = ran(make_update(place)[2:], {"PYTHONPATH": str(place)})
+    assert (done.returncode, done.stderr) == (-signal.SIGINT, "")
 
 
 def test_a_file_that_cannot_be_written(place):
