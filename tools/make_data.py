@@ -11,6 +11,7 @@ import datetime
 import errno
 import fcntl
 import hashlib
+import importlib
 import io
 import json
 import os
@@ -502,18 +503,19 @@ def clocks(tree: Path, names: list[str], since: int, until: int) -> list[str]:
 def moments(clock: str) -> list[list[int]]:
     """The same, as moments with the offset from then on, in seconds; the first moment
     is 0. Changes of nothing but a name are left out."""
+    def seconds(parts: list[str]) -> int:
+        return sum(int(part) * 60 ** (2 - at) for at, part in enumerate(parts))
+
     found = []
     for line in clock.splitlines():
-        date, time, offset, *_ = line.split("\t")
-        sign, digits = offset[0], re.findall("..", offset[1:])
-        seconds = sum(int(part) * 60 ** (2 - at) for at, part in enumerate(digits))
-        seconds = -seconds if sign == "-" else seconds
-        local = 0 if date == "-" else sum(
-            int(part) * 60 ** (2 - at) for at, part in enumerate(time.split(":")))
-        at = 0 if date == "-" else local - seconds + int(datetime.datetime.fromisoformat(
-            f"{date}T00:00:00+00:00").timestamp())
-        if not found or found[-1][1] != seconds:
-            found.append([at, seconds])
+        date, hour, text, *_ = line.split("\t")
+        offset = seconds(re.findall("..", text[1:])) * (-1 if text[0] == "-" else 1)
+        moment = 0
+        if date != "-":
+            midnight = datetime.datetime.fromisoformat(f"{date}T00:00:00+00:00")
+            moment = int(midnight.timestamp()) + seconds(hour.split(":")) - offset
+        if not found or found[-1][1] != offset:
+            found.append([moment, offset])
     return found
 
 
@@ -547,7 +549,7 @@ def check_clocks(icu: Icu, tree: Path) -> bool:
         alike[content].append(name)
     found = clocks(tree, [names[0] for names in alike.values()], since, until)
     try:
-        import icu as _  # noqa: F401
+        importlib.import_module("icu")
     except ImportError:
         return False
     zones = {name: moments(clock) for group, clock in zip(alike.values(), found)

@@ -6,7 +6,7 @@ then it installs, and the next boot takes the update."""
 import pytest
 
 from lab.arm64_device.install_cuts import (SEAL, TEMPLATE, give_to_account,
-                                          installing_device)
+                                           installing_device)
 from lab.arm64_device.machine import NO_BLOCK, NO_FILLER, NO_INODE
 from lab.carriers import image
 from lab.oracles.installer import HIDDEN, announced, hidden

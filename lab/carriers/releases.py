@@ -44,7 +44,8 @@ def find(what: str, pattern: str, text: str) -> re.Match[str]:
 def tool(name: str, **options: str | Path) -> list[str]:
     """The command of make-update or make-system, which cannot ask ICU."""
     words = [f"--{option}={value}" for option, value in options.items()]
-    return ["/usr/bin/env", f"PYTHONPATH={WITHOUT_ICU}", "/usr/bin/python3", "-B", str(PROJECT / "tools" / name), *words]
+    return ["/usr/bin/env", f"PYTHONPATH={WITHOUT_ICU}", "/usr/bin/python3", "-B",
+            str(PROJECT / "tools" / name), *words]
 
 
 def once(target: Path, inputs: list, make):
