@@ -16,7 +16,6 @@ using testing::Each;
 using testing::Ge;
 using testing::HasSubstr;
 using testing::Le;
-using testing::Not;
 
 std::string all_bytes() {
   std::string bytes;
@@ -64,19 +63,6 @@ TEST(Json, HasNullForWhatThereIsNot) {
 
 TEST(Rows, HoldNoByteThatATerminalObeys) {
   EXPECT_THAT(in_rows(hostile(), {}), Each(plain_byte));
-}
-
-TEST(Rows, FitTheWidth) {
-  const std::string text = in_rows(hostile(), {60, false});
-  std::size_t start = 0;
-  for (std::size_t end = 0; (end = text.find('\n', start)) != std::string::npos;
-       start = end + 1)
-    EXPECT_LE(end - start, 60u);
-}
-
-TEST(Rows, AreColouredOnlyWhenThatIsWanted) {
-  EXPECT_THAT(in_rows({}, {80, true}), HasSubstr("\033[1m"));
-  EXPECT_THAT(in_rows({}, {80, false}), Not(HasSubstr("\033")));
 }
 
 TEST(Rows, TellAMissingLinkFromOneThatReadsSo) {

@@ -22,34 +22,32 @@ json object_of(const entry& here) {
   return object;
 }
 
-json version_of(const dataset_facts& set) {
-  return set.has_version() ? text_or_null(set.version_text) : json();
-}
-
-std::string name_of(dataset_facts::state ends) {
-  static constexpr std::array names = {
-      "readable", "elsewhere", "number_too_large", "walk_failed", "no_memory"};
-  return names.at(static_cast<std::size_t>(ends));
-}
-
-json object_of(const dataset_facts& set) {
-  json unreadable = json::array();
-  for (const auto& [path, error] : set.unreadable)
-    unreadable.push_back({{"path", escaped(path)}, {"error", error}});
-  json object{{"path", text_or_null(set.path)},
-              {"version", version_of(set)},
-              {"schema", text_or_null(set.schema)},
-              {"state", name_of(set.ends)},
-              {"unreadable", unreadable}};
-  if (!set.path.empty()) {
-    object["fits_system"] = set.fits_system;
-    object["has_several_schemas"] = set.has_several_schemas;
-  }
-  return object;
+// Of what object_of() makes of each.
+template <typename Item, typename Make>
+json list_of(const std::vector<Item>& items, Make object_of) {
+  json list = json::array();
+  for (const auto& item : items) list.push_back(object_of(item));
+  return list;
 }
 
 json object_or_null(const std::optional<dataset_facts>& set) {
-  return set ? object_of(*set) : json();
+  static constexpr std::array states = {
+      "readable", "elsewhere", "number_too_large", "walk_failed", "no_memory"};
+  if (!set) return {};
+  json object{
+      {"path", text_or_null(set->path)},
+      {"version",
+       set->has_version() ? text_or_null(set->version_text) : json()},
+      {"schema", text_or_null(set->schema)},
+      {"state", states.at(static_cast<std::size_t>(set->ends))},
+      {"unreadable", list_of(set->unreadable, [](const flaw& found) {
+         return json{{"path", escaped(found.path)}, {"error", found.error}};
+       })}};
+  if (!set->path.empty()) {
+    object["fits_system"] = set->fits_system;
+    object["has_several_schemas"] = set->has_several_schemas;
+  }
+  return object;
 }
 
 json object_of(const link_facts& links) {
@@ -70,51 +68,45 @@ json object_of(const link_facts& links) {
           {"old_icu", object_of(links.old_icu)}};
 }
 
-json object_of(const rehearsal& boot) {
-  json lines = json::array();
-  for (const auto& said : boot.lines) lines.push_back(escaped(said.text));
-  json object{{"ends", boot.ends_normally ? "normally" : "abnormally"}};
-  if (!boot.ends_normally) object["thrown"] = escaped(boot.thrown);
-  object["lines"] = lines;
-  return object;
-}
-
 }  // namespace
 
 std::string in_json(const report& told) {
-  json object{{"format", 1}};
-  object["status"] = static_cast<int>(told.why.is);
-  json reasons = json::array();
-  for (const auto& found : told.why.reasons)
-    reasons.push_back({{"subject", found.name},
-                       {"code", found.reason},
-                       {"text", found.text}});
-  object["reasons"] = reasons;
-  object["now"] = object_of(told.device.links);
-  object["system"] = object_of(told.device.system);
-  object["current"] = object_or_null(told.device.current);
-  object["announced"] = object_or_null(told.device.update);
-  json downloads = json::array();
-  for (const auto& found : told.device.downloads)
-    downloads.push_back(
-        {{"name", escaped(found.name)}, {"needed_by", found.needed_by}});
-  object["downloads"] = downloads;
-  object["downloads_error"] =
-      told.device.downloads_error == 0
-          ? json()
-          : json(std::strerror(told.device.downloads_error));
-  object["has_more_downloads"] = told.device.has_more_downloads;
-
-  json boot = object_of(told.boot);
-  json steps = json::array();
-  for (const auto& done : told.why.steps)
-    steps.push_back({{"step", done.name},
-                     {"does", done.does},
-                     {"reason", done.reason},
-                     {"text", done.text}});
-  boot["steps"] = steps;
+  const device_facts& device = told.device;
+  json boot{{"ends", told.boot.ends_normally ? "normally" : "abnormally"}};
+  if (!told.boot.ends_normally) boot["thrown"] = escaped(told.boot.thrown);
+  boot["lines"] = list_of(told.boot.lines, [](const line& said) {
+    return json(escaped(said.text));
+  });
+  boot["steps"] = list_of(told.why.steps, [](const step& done) {
+    return json{{"step", done.name},
+                {"does", done.does},
+                {"reason", done.reason},
+                {"text", done.text}};
+  });
   boot["after"] = object_of(told.after);
-  object["next_boot"] = boot;
-  object["cannot_know"] = told.cannot_know;
+  const json object{
+      {"format", 1},
+      {"status", static_cast<int>(told.why.is)},
+      {"reasons", list_of(told.why.reasons,
+                          [](const step& found) {
+                            return json{{"subject", found.name},
+                                        {"code", found.reason},
+                                        {"text", found.text}};
+                          })},
+      {"now", object_of(device.links)},
+      {"system", object_or_null(device.system)},
+      {"current", object_or_null(device.current)},
+      {"announced", object_or_null(device.update)},
+      {"downloads", list_of(device.downloads,
+                            [](const download& found) {
+                              return json{{"name", escaped(found.name)},
+                                          {"needed_by", found.needed_by}};
+                            })},
+      {"downloads_error", device.downloads_error == 0
+                              ? json()
+                              : json(std::strerror(device.downloads_error))},
+      {"has_more_downloads", device.has_more_downloads},
+      {"next_boot", boot},
+      {"cannot_know", told.cannot_know}};
   return object.dump(2) + "\n";
 }

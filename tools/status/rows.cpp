@@ -1,5 +1,6 @@
 // SPDX-License-Identifier: BSD-2-Clause
 #include <cstring>
+#include <utility>
 
 #include "support/paths.h"
 #include "tools/escaped.h"
@@ -34,14 +35,10 @@ std::string plain(const entry& here) {
 
 // What is between quotes is a text of the device, and only that.
 std::string quoted(const std::string& text) {
-  std::string shown = "\"";
-  for (const char letter : escaped(text)) {
-    if (letter == '"')
-      shown += "\\x22";
-    else
-      shown += letter;
-  }
-  return shown + "\"";
+  std::string shown = escaped(text);
+  for (std::size_t at = 0; (at = shown.find('"', at)) != std::string::npos;)
+    shown.replace(at, 1, "\\x22");
+  return '"' + shown + '"';
 }
 
 std::string version_and_schema(const dataset_facts& set) {
@@ -76,6 +73,9 @@ class rows {
                                   ? look_.width - label_width
                                   : label_width;
     text_ += bold(label) + wrapped(text, width) + "\n";
+  }
+  void add_all(const char* label, const std::vector<std::string>& texts) {
+    for (const auto& text : texts) add(std::exchange(label, ""), text);
   }
   std::string text() const { return text_; }
 
@@ -165,22 +165,14 @@ void add_downloads(rows& shown, const report& told) {
 }
 
 void add_boot(rows& shown, const report& told) {
-  const char* label = "next boot";
-  for (const auto& done : told.why.steps) {
-    if (done.does == "nothing") continue;
-    shown.add(label, done.sentence());
-    label = "";
-  }
-  label = "it prints";
-  for (const auto& said : told.boot.lines) {
-    shown.add(label, escaped(said.text));
-    label = "";
-  }
-  label = "unknown";
-  for (const auto& text : told.cannot_know) {
-    shown.add(label, text);
-    label = "";
-  }
+  std::vector<std::string> steps;
+  for (const auto& done : told.why.steps)
+    if (done.does != "nothing") steps.push_back(done.sentence());
+  std::vector<std::string> lines;
+  for (const auto& said : told.boot.lines) lines.push_back(escaped(said.text));
+  shown.add_all("next boot", steps);
+  shown.add_all("it prints", lines);
+  shown.add_all("unknown", told.cannot_know);
 }
 
 }  // namespace
