@@ -5,6 +5,7 @@ import pytest
 
 from lab.arm64_device import parts
 from lab.arm64_device.machine import Machine
+from lab.carriers.qemu import Unavailable
 
 
 @pytest.fixture(scope="module")
@@ -12,6 +13,6 @@ def machine(request):
     """Makes a device in a directory of its own."""
     try:
         parts.prepare()
-    except parts.Unavailable as reason:
+    except Unavailable as reason:
         pytest.skip(f"no device can be made here: {reason}")
     return Machine

@@ -5,19 +5,17 @@ The system partition is read-only and holds the program; "/var" is a disk of its
 The console is a file, in which every line begins with the kernel's time.
 """
 
-import contextlib
 import functools
 import os
 import re
 import shutil
 import subprocess
 import tempfile
-import time
 from collections.abc import Callable
 from pathlib import Path
 
 from lab.arm64_device.parts import COMPANIONS, PROGRAM, WORK, part
-from lab.carriers import image
+from lab.carriers import image, qemu
 from lab.carriers.boot import Booted, ending_of
 from lab.words import lines
 from lab.words.device import Device, Node, decoded
@@ -116,7 +114,7 @@ class Console:
     """What a boot printed: lines with the kernel's time in seconds."""
 
     def __init__(self, path: Path):
-        self.text = path.read_text(errors="replace") if path.exists() else ""
+        self.text = qemu.text_of(path)
         # Whole ones only: the power may have been cut within a line.
         matches = re.findall(r"^\[ *(\d+\.\d+)\] ?(.*)\n", self.text, re.MULTILINE)
         self.lines = [(float(at), text) for at, text in matches]
@@ -190,15 +188,13 @@ class Machine:
 
     def command(self, script="", options="", disk="", serial="mon:stdio") -> list[str]:
         self.memory.write_bytes(first_memory(script))
-        return ["qemu-system-aarch64", "-M", "virt", "-cpu", "cortex-a57", "-m", "256",
-                "-nodefaults", "-no-reboot", "-display", "none", "-serial", serial,
-                "-kernel", str(part("vmlinuz-*")), "-initrd", str(self.memory),
-                "-append",
-                f"console=ttyAMA0 loglevel=5 printk.devkmsg=on panic=-1 {options}",
-                "-blockdev", f"{plain('system', self.system)},read-only=on",
-                "-blockdev", disk or plain("var", self.var),
-                "-device", "virtio-blk-device,drive=var",
-                "-device", "virtio-blk-device,drive=system"]
+        return qemu.command(
+            qemu.ARM64, part("vmlinuz-*"), 256,
+            f"loglevel=5 printk.devkmsg=on {options}", "-initrd", str(self.memory),
+            "-blockdev", f"{plain('system', self.system)},read-only=on",
+            "-blockdev", disk or plain("var", self.var),
+            "-device", "virtio-blk-device,drive=var",
+            "-device", "virtio-blk-device,drive=system", serial=serial)
 
     def start(self, script="", options="", disk="", more=()) -> subprocess.Popen:
         """`script` is what the device does when it is up, in its shell's language;
@@ -217,18 +213,13 @@ class Machine:
             then()
         script = relink(before, self.device.contents()) + script
         emulator = self.start(script, **how)
-        with contextlib.suppress(subprocess.TimeoutExpired):
-            emulator.wait(seconds)
-        emulator.kill()
-        console = Console(self.console)
-        if emulator.wait() != 0 or "shut down" not in console.said:
-            raise console.failure("the device did not shut down")
-        return console
+        self.wait_for(emulator, "shut down", seconds)
+        if qemu.end(emulator, 10):
+            raise Console(self.console).failure("the device did not shut down")
+        return Console(self.console)
 
     def wait_for(self, emulator: subprocess.Popen, text: str, seconds=120):
-        """Waits until the console shows the text."""
-        end = time.monotonic() + seconds
-        while text not in Console(self.console).said:
-            if time.monotonic() > end or emulator.poll() is not None:
-                raise Console(self.console).failure(f"the console never said: {text}")
-            time.sleep(0.05)
+        """Until the console says so."""
+        if not qemu.wait(emulator, self.console, f"device: {text}\n", seconds):
+            emulator.kill()
+            raise Console(self.console).failure(f"the console never said: {text}")

@@ -85,25 +85,6 @@ def scene(machine, request):
     return Scene(machine("scenes/" + request.node.name))
 
 
-# --- An ordinary life; every other state is in test_chosen.py -------------------------
-
-
-def test_never_updated(scene):
-    scene.on(sound_device())
-    for _ in range(2):
-        scene.boot(reader="S23CP")
-
-
-def test_update(scene):
-    """Announced, activated, and the next boots."""
-    device = scene.on(updated())
-    scene.boot(reader="S23CP", then=lambda: device.announce(UPDATE))
-    activate(device)
-    scene.boot(reader="U24AP")
-    for _ in range(2):
-        scene.boot(REFUSED, reader="U24AP")
-
-
 # --- What only a real disk does -------------------------------------------------------
 
 

@@ -13,7 +13,7 @@ import time
 from dataclasses import dataclass
 from pathlib import Path
 
-from lab.carriers import image
+from lab.carriers import image, qemu
 from lab.debian_systems.parts import CHOSEN, make_image, room
 
 SECONDS = 600  # a boot that takes longer hangs
@@ -80,18 +80,16 @@ class System:
         image.debugfs(self.root, f"rm {path}", f"write {file} {path}", write=True)
 
     def command(self, options: str, more: tuple[str, ...]) -> list[str]:
-        parameters = (f"console={CHOSEN.console} root=/dev/nvme0n1 loglevel=4 "
-                      "systemd.unit=lab.target panic=-1 no_timer_check "
-                      f"{'' if ' ro ' in f' {options} ' else 'rw '}{options}")
         disks = [self.root, self.told] + [self.third] * self.third.exists()
-        return [*CHOSEN.qemu, "-accel", "tcg", "-m", "1024", "-nodefaults",
-                "-no-reboot", "-display", "none",
-                "-serial", f"file:{self.directory}/console",
-                "-kernel", str(CHOSEN.kernel), "-append", parameters,
-                "-device", "nvme,id=nvme,serial=lab",
-                *(word for number, disk in enumerate(disks, 1) for word in (
-                    "-drive", f"if=none,id=disk{number},format=raw,file={disk}",
-                    "-device", f"nvme-ns,drive=disk{number},nsid={number}")), *more]
+        return qemu.command(
+            CHOSEN.processor, qemu.part(CHOSEN.place, "vmlinuz-*"), 1024,
+            "root=/dev/nvme0n1 loglevel=4 systemd.unit=lab.target no_timer_check "
+            f"{'' if ' ro ' in f' {options} ' else 'rw '}{options}",
+            "-device", "nvme,id=nvme,serial=lab",
+            *(word for number, disk in enumerate(disks, 1) for word in (
+                "-drive", f"if=none,id=disk{number},format=raw,file={disk}",
+                "-device", f"nvme-ns,drive=disk{number},nsid={number}")), *more,
+            serial=f"file:{self.directory}/console")
 
     def boot(self, then="", options="", more: tuple[str, ...] = (),
              seconds=SECONDS) -> Seen:
@@ -106,34 +104,18 @@ class System:
         console = self.directory / "console"
         console.unlink(missing_ok=True)
         started = time.monotonic()
-        status = self.emulate(self.command(options, more), console, seconds)
+        emulator = subprocess.Popen(self.command(options, more),
+                                    stdin=subprocess.DEVNULL)
+        qemu.wait(emulator, console, "lab: all is told", seconds)
+        status = qemu.end(emulator, 10)
         took = time.monotonic() - started
-        printed = text_of(console)
+        printed = qemu.text_of(console)
         try:
             seen = Seen(took, *look(self.told), printed)
         except (KeyError, tarfile.TarError) as reason:
-            raise RuntimeError(f"the system told nothing ({status}; {reason}):\n"
+            raise RuntimeError(f"the system told nothing (status {status}; {reason}):\n"
                                + printed[-6000:]) from reason
         return seen
-
-    @staticmethod
-    def emulate(command: list[str], console: Path, seconds: float) -> str:
-        """Runs until the system is off, or has told all and does not end."""
-        emulator = subprocess.Popen(command, stdin=subprocess.DEVNULL)
-        end = time.monotonic() + seconds
-        while emulator.poll() is None and time.monotonic() < end:
-            if "lab: all is told" in text_of(console):
-                end = min(end, time.monotonic() + 10)
-            time.sleep(0.2)
-        if emulator.poll() is not None:
-            return f"the emulator ended with status {emulator.returncode}"
-        emulator.kill()
-        emulator.wait()
-        return f"nothing after {seconds} s"
-
-
-def text_of(file: Path) -> str:
-    return file.read_text(errors="replace") if file.exists() else ""
 
 
 def look(told: Path):
@@ -142,10 +124,9 @@ def look(told: Path):
     with tarfile.open(told) as archive:
         for entry in archive:
             path = "/" + entry.name
-            if path.startswith("/run/lab/seen/"):
+            if path.startswith("/run/lab/seen/") and entry.isfile():
                 files[path.removeprefix("/run/lab/seen/")] = archive.extractfile(
                     entry).read()
-                continue
             if path.startswith("/var/db"):
                 owners[path] = (entry.mode, entry.uid, entry.gid)
                 if entry.issym():

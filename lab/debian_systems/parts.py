@@ -3,20 +3,17 @@
 as it ships, and the demonstration's real data. The first two are fetched once, into the
 folder "build"; each system has a disk of its own."""
 
-import fcntl
 import os
 import shutil
-import subprocess
 from pathlib import Path
 from typing import NamedTuple
 
-from lab.arm64_device.parts import Unavailable, fetch, on_path
-from lab.carriers import real_data
+from lab.carriers import qemu, real_data
 from lab.carriers.building import package
 from lab.carriers.image import run
 from lab.debian_systems.foreign import run_with_qemu
 from lab.words.command import say
-from lab.words.places import BUILD, PROJECT
+from lab.words.places import BUILD
 
 WORK = BUILD / "systems"
 GUEST = Path(__file__).parent / "guest"
@@ -28,15 +25,13 @@ LEFT_OUT = [word for place in ("doc", "info", "locale", "man", "lintian")
                          f"--dpkgopt=path-include=/usr/share/{place}/marlin*")]
 
 
-class Processor(NamedTuple):
-    """A Debian architecture, the preset that builds for it, and the machine; and the
-    release of Debian."""
+class Kind(NamedTuple):
+    """A processor, the preset and the compiler that build for it, and the release of
+    Debian."""
     name: str
-    architecture: str
+    processor: qemu.Processor
     preset: str
     compiler: str
-    qemu: tuple[str, ...]
-    console: str
     packages: tuple[str, ...] = ()  # that this takes beside those of "systems"
     suite: str = "bookworm"
 
@@ -44,17 +39,10 @@ class Processor(NamedTuple):
     def place(self) -> Path:
         return WORK / self.name
 
-    @property
-    def kernel(self) -> Path:
-        [kernel] = (self.place / "packages").rglob("vmlinuz-*")
-        return kernel
 
-
-AMD64 = Processor("amd64", "amd64", "release", "gcc", (
-    "qemu-system-x86_64", "-M", "q35"), "ttyS0")
-ARM64 = Processor("arm64", "arm64", "arm64-release", "aarch64-linux-gnu-gcc", (
-    "qemu-system-aarch64", "-M", "virt", "-cpu", "cortex-a57"), "ttyAMA0",
-    ("arm64", "device", "systems-arm64"))
+AMD64 = Kind("amd64", qemu.AMD64, "release", "gcc")
+ARM64 = Kind("arm64", qemu.ARM64, "arm64-release", "aarch64-linux-gnu-gcc",
+             ("arm64", "device", "systems-arm64"))
 # All with the kernel of Debian 12.
 ALL = {each.name: each for each in (
     AMD64, ARM64, AMD64._replace(name="debian-11", suite="bullseye"),
@@ -64,30 +52,14 @@ CHOSEN = ALL[os.environ.get("MARLIN_SYSTEMS", AMD64.name)]
 
 
 def prepare():
-    """Builds and fetches what is missing; or raises Unavailable."""
-    if subprocess.call([PROJECT / "scripts/packages", "build", "demo", "systems",
-                        *CHOSEN.packages]):
-        raise Unavailable("packages are missing")
-    on_path(CHOSEN.qemu[0])
-    place = CHOSEN.place
-    place.mkdir(parents=True, exist_ok=True)
-    with open(place / "lock", "w", encoding="ascii") as lock:
-        fcntl.flock(lock, fcntl.LOCK_EX)
-        try:
-            if not (place / "packages").is_dir():
-                say("Fetching a kernel")
-                fetch(place / "packages", CHOSEN.architecture, "busybox-static")
-            if not (place / "sysvinit").is_dir():
-                say("Fetching SysV init")
-                fetch(place / "sysvinit", CHOSEN.architecture, *SYSVINIT,
-                      kernel=False)
-            if not (place / "root.tar").exists():
-                say("Making a Debian system, in two minutes or three")
-                make_root()
-        except RuntimeError as reason:
-            why = str(reason).strip().splitlines()[-1]
-            raise Unavailable("no Debian system can be made here, which takes a mirror "
-                              f"of Debian: {why}") from reason
+    """Builds and fetches what is missing; or raises qemu.Unavailable."""
+    place, architecture = CHOSEN.place, CHOSEN.processor.architecture
+    with qemu.preparing(CHOSEN.processor, place, "build", "demo", "systems",
+                        *CHOSEN.packages):
+        qemu.fetch(place / "sysvinit", architecture, *SYSVINIT)
+        if not (place / "root.tar").exists():
+            say("Making a Debian system, in two minutes or three")
+            make_root()
         real_data.prepare()
         package(CHOSEN.preset, CHOSEN.place)
         # In marlin's place it has to have its name.
@@ -99,7 +71,8 @@ def make_root():
     made = CHOSEN.place / "root.new.tar"
     make = run_with_qemu if CHOSEN is ARM64 and os.geteuid() == 0 else run
     make("mmdebstrap", "--quiet", "--variant=essential",
-         f"--architectures={CHOSEN.architecture}", f"--include={ROOT_PACKAGES}",
+         f"--architectures={CHOSEN.processor.architecture}",
+         f"--include={ROOT_PACKAGES}",
          "--aptopt=Acquire::Languages \"none\"", *LEFT_OUT, CHOSEN.suite, made)
     made.rename(CHOSEN.place / "root.tar")
 

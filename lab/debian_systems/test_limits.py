@@ -35,29 +35,3 @@ def test_no_directory():
     assert seen.units[UNIT]["ActiveState"] == "inactive"
     assert seen.at("sysinit.target", "ActiveEnter")
     assert seen.text("reader") == "12:00 UTC\n"
-
-
-# More than once: what ext4 reserves while it writes is free again after a sync.
-FILL = """[Unit]
-DefaultDependencies=no
-RequiresMountsFor=/var
-After=systemd-tmpfiles-setup.service
-Before=marlin.service
-[Service]
-Type=oneshot
-ExecStart=/bin/sh -c 'for i in 1 2 3; do cat /dev/zero >>/var/filler; sync; done'
-"""
-
-
-def test_full_var():
-    """Links fit into their inodes; only the record finds no room."""
-    system = System("full-var", f"""
-        {install_update_here()} {linked(device(announced=True))}
-        echo '/dev/nvme0n3 /var ext4 defaults 0 0' >etc/fstab
-        cat >etc/systemd/system/fill.service <<'END'\n{FILL}END
-        mkdir -p etc/systemd/system/sysinit.target.wants
-        ln -s ../fill.service etc/systemd/system/sysinit.target.wants/fill.service
-        """, apart="var", megabytes=40)
-    seen = system.boot("df /var; rm /var/filler")
-    insist(seen, (), device(active=True, announced=True), reader="14:00 CEST",
-           record="")

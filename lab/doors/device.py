@@ -51,8 +51,10 @@ def main() -> int:
     os.environ["MARLIN_SYSTEMS"] = options.on
     # After the options are understood: these take pytest.
     import pytest
-    from lab.arm64_device import boot_cost, install_cuts, parts, power_cuts, show
-    from lab.debian_systems import cost, parts as systems
+    from lab.arm64_device import install_cuts, parts, power_cuts, show
+    from lab.bench import boot_cost, unit_cost
+    from lab.carriers.qemu import Unavailable
+    from lab.debian_systems import parts as systems
     run = ["-c", "lab/pytest.ini", f"--rootdir={PROJECT}", "-n", "2", "--dist"]
     try:
         if options.systems is not None:
@@ -61,7 +63,7 @@ def main() -> int:
                 ["-m", "not rest"] if options.quick else []),
                 *(options.systems or ["lab/debian_systems"])])
         if options.unit_cost:
-            cost.measure()
+            unit_cost.measure()
             return 0
         parts.prepare()
         if options.tests is not None:
@@ -77,7 +79,7 @@ def main() -> int:
             boot_cost.measure()
         else:
             show.show()
-    except parts.Unavailable as reason:
+    except Unavailable as reason:
         print(f"SKIPPED: {reason}", file=sys.stderr)
         return 77
     except RuntimeError as reason:

@@ -11,9 +11,9 @@ import re
 import statistics
 
 from lab.arm64_device.machine import Console, Machine
+from lab.carriers.qemu import COUNTED
 from lab.words.device import sound_device
 
-COUNTED = ("-icount", "shift=0,sleep=off")
 NEVER_IDLE = "nohlt"  # without work count on, instead of jumping to the next timer
 RUNS = 5
 

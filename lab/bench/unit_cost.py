@@ -8,7 +8,7 @@ the same under every load of this machine."""
 import re
 import statistics
 
-from lab.arm64_device.boot_cost import COUNTED
+from lab.carriers.qemu import COUNTED
 from lab.debian_systems.machine import System
 from lab.debian_systems.parts import CHOSEN, prepare
 from lab.debian_systems.scene import device, linked
