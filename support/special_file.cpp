@@ -9,8 +9,8 @@ bool is_special_file(const std::string& path) {
   const int error_so_far = errno;
   struct stat status {};
   const bool is_special = ::stat(path.c_str(), &status) == 0 &&
-                          (S_ISFIFO(status.st_mode) ||
-                           S_ISCHR(status.st_mode) || S_ISBLK(status.st_mode));
+                          !S_ISREG(status.st_mode) &&
+                          !S_ISDIR(status.st_mode) && !S_ISSOCK(status.st_mode);
   errno = error_so_far;
   return is_special;
 }

@@ -129,6 +129,8 @@ TEST_F(FirstWord, LeavesTheErrorOfOpeningTheFileOrOfAnEarlierCall) {
   EXPECT_EQ(left_by_reading(), EACCES);
   make_socket(path);
   EXPECT_EQ(left_by_reading(), ENXIO);
+  make_directory(path);
+  EXPECT_EQ(left_by_reading(), EISDIR);
   make_fifo(path);
   EXPECT_EQ(left_by_reading(), EXDEV);
 }
