@@ -10,7 +10,7 @@ import pytest
 
 from lab.debian_systems import (machine, parts, test_chosen, test_limits, test_ordinary,
                                 test_other_inits, test_package_on_a_system, test_probe,
-                                test_slow, test_var)
+                                test_slow, test_starts, test_var)
 
 pytestmark = pytest.mark.rest
 
@@ -64,6 +64,9 @@ FAULTS = {
     "no bound of memory": Fault(
         test_limits.test_a_terabyte_for_a_word, without("LimitAS"),
         (ENDED,)),
+    "an initrd": Fault(
+        lambda: test_starts.test_a_start("an initrd with the unit"),
+        without("ConditionPathExists"), ("what the links say is {}",)),
     "a system call": Fault(
         test_chosen.test_every_device,
         "sed -i 's/ rmdir$//' usr/lib/systemd/system/marlin.service\n",
