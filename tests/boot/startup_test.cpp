@@ -557,6 +557,11 @@ TEST_F(StartupPass, GoesOnWhenNobodyReadsItsLogOrItCannotBeWrittenWhole) {
     EXPECT_EQ(file_at(record), recorded);
     EXPECT_EQ(link_at(local_time), default_localtime);
   }
+  // Nothing is printed: it is the record that cannot be written.
+  point_links_at_system();
+  const outcome quiet = run({MARLIN_PROGRAM}, forbid_files_to_grow);
+  EXPECT_EQ(quiet.exit_status, 0);
+  EXPECT_EQ(file_at(record), "");
 }
 
 TEST_F(StartupPass, NeedsNoDescriptorOfItsCaller) {
