@@ -25,8 +25,8 @@ def test_an_update_and_then_nothing(machine):
 
     console = here.boot(then=lambda: device.announce(UPDATE), script=ASK)
     assert console.told == [
-        "status 1", f"{UPDATE} is activated: newer than 2023c.1.0",
-        f"the change is recorded: 2023c.1.0_{UPDATE}"]
+        "status 1", f"update: {UPDATE} is activated: newer than 2023c.1.0",
+        f"record: the change is recorded: 2023c.1.0_{UPDATE}"]
     assert here.look()[ZONEINFO].text == "/usr/share/zoneinfo.default"
 
     console = here.boot(script=ASK)
