@@ -21,8 +21,9 @@ ODD = re.compile(r"""[\x00-\x1f"#*;<>?\\|]|\$\{|['&^`]""")
 MAY_SKIP = {
     **dict.fromkeys(["dev", "clang", "coverage"], (None, "")),
     "asan": (r"WholeListOfCalls\.", "a sanitizer makes calls of its own"),
-    "arm64-dev": (r"(Calls|DataProtection|WholeListOfCalls)\.",
-                  "qemu-user traces no system calls"),
+    **dict.fromkeys(["arm64-dev", "armhf-dev"], (
+        r"(Calls|DataProtection|WholeListOfCalls)\.",
+        "qemu-user traces no system calls")),
 }
 
 

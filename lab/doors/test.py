@@ -2,10 +2,10 @@
 """usage: scripts/test [PRESET] [-R REGEX]
 
 Builds the program and all tests with a preset (dev by default; clang, asan, coverage,
-arm64-dev), and runs them, or those whose names match REGEX, each on a private device
-of its own. Installs what that takes, as root: some 100 MB of Debian packages, 400 MB on
-the disk; otherwise says what is missing. Nothing else is touched outside of the folder
-"build", or the one that MARLIN_BUILD names, an absolute path.
+arm64-dev, armhf-dev), and runs them, or those whose names match REGEX, each on a
+private device of its own. Installs what that takes, as root: some 100 MB of Debian
+packages, 400 MB on the disk; otherwise says what is missing. Nothing else is touched
+outside of the folder "build", or the one that MARLIN_BUILD names, an absolute path.
 
 Exit status: 0 when all tests pass, 1 when one fails or something does not build, 2 for
 bad use, 77 when tests are skipped, as where there can be no private device.
@@ -20,7 +20,8 @@ from lab.carriers.building import MAY_SKIP, build, locked, need, run_tests
 from lab.words.command import Options, stop
 from lab.words.places import BUILD, PROJECT
 
-PURPOSES = {"clang": ["clang"], "arm64-dev": ["arm64", "arm64-test"]}
+PURPOSES = {"clang": ["clang"], "arm64-dev": ["arm64", "cross-test"],
+            "armhf-dev": ["armhf", "cross-test"]}
 
 
 def main():

@@ -44,7 +44,7 @@ std::string target_of(const std::string& path) {
   return fs::read_symlink(path, unreadable);
 }
 
-long nanoseconds(const timespec& time) {
+std::int64_t nanoseconds(const timespec& time) {
   return time.tv_sec * 1'000'000'000 + time.tv_nsec;
 }
 

@@ -10,6 +10,7 @@
 #include <gtest/gtest.h>
 #include <sys/types.h>
 
+#include <cstdint>
 #include <functional>
 #include <map>
 #include <optional>
@@ -77,8 +78,8 @@ void point_localtime_at(const std::string& target);
 struct entry {
   mode_t mode;
   ino_t inode;
-  long modified;  // in nanoseconds
-  long changed;
+  std::int64_t modified;  // in nanoseconds
+  std::int64_t changed;
   std::string content;  // of a regular file, or the target of a link
   bool operator==(const entry&) const = default;
 };

@@ -74,7 +74,8 @@ TEST(VersionParse, LeavesTheErrnoOfTheStandardConversion) {
   EXPECT_EQ(errno, ERANGE);
   errno = EXDEV;
   EXPECT_THROW(mln_version("2147483648a"), std::out_of_range);
-  EXPECT_EQ(errno, EXDEV);
+  // The conversion beneath has the range of long.
+  EXPECT_EQ(errno, sizeof(long) > sizeof(int) ? EXDEV : ERANGE);
 }
 
 TEST(VersionParse, KeepsTheFieldsBeforeANumberThatDoesNotFit) {
