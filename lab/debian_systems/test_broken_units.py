@@ -45,10 +45,6 @@ def forged(init: str) -> Callable[[], None]:
 
 
 FAULTS = {
-    "a directory for devices": Fault(
-        test_var.test_a_read_only_root_without_tmp,
-        added("PrivateDevices=yes"),
-        (ENDED + "('exit-code', 'failed', '226')",)),
     "directories for temporary files": Fault(
         test_var.test_a_read_only_root_without_tmp, added("PrivateTmp=yes"),
         (ENDED + "('resources', 'failed', '0')",)),
