@@ -55,8 +55,10 @@ TEST_F(Mend, LeavesToMarlinWhatItResetsAnyway) {
   expect_left_alone();
   make_link(icutz, update("2024a.1.0") + "/icutz");
   expect_left_alone();
-  for (const char* target : {"/elsewhere", "/usr/share/zoneinfo.default/",
-                             "/var/db/timezone/tz", "tz/2024a.1.0/zoneinfo"}) {
+  for (const char* target :
+       {"/elsewhere", "/usr/share/zoneinfo.default/", "/var/db/timezone/tz",
+        "tz/2024a.1.0/zoneinfo", "/var/db/timezone/tz/2024a.1.0",
+        "/var/db/timezone/tz//zoneinfo"}) {
     point_zoneinfo_at(target);
     expect_left_alone();
   }

@@ -34,17 +34,21 @@ class link_read {
   bool missing_;
 };
 
-// As marlin understands it, the data set is what is before the last "/".
-bool same_update(std::string_view tree, std::string_view icu_data) {
-  const std::string_view set = tree.substr(0, tree.rfind('/'));
-  return icu_data.starts_with(set) && icu_data.substr(set.size()) == "/icutz";
+// As marlin understands it, the data set is what is before the last "/", if a
+// name stands between the two. Empty if the link names no update.
+std::string_view update_of(std::string_view tree) {
+  const std::size_t last = tree.rfind('/');
+  const bool named = tree.starts_with(paths::download_root) &&
+                     last > paths::length(paths::download_root);
+  return named ? tree.substr(0, last) : std::string_view();
 }
 
 bool mixed(const link_read& tree, const link_read& icu_data) {
   if (icu_data.unclear()) return false;
   if (tree.text() == paths::system_zoneinfo) return !icu_data.missing();
-  return tree.text().starts_with(paths::download_root) &&
-         !same_update(tree.text(), icu_data.text());
+  const std::string_view set = update_of(tree.text());
+  return !set.empty() && !(icu_data.text().starts_with(set) &&
+                           icu_data.text().substr(set.size()) == "/icutz");
 }
 
 bool mixed(const link_read& tree) {
