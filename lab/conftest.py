@@ -18,6 +18,7 @@ from lab.words import chosen_devices  # noqa: E402
 from lab.words.places import BUILD  # noqa: E402
 
 TALLY = {}
+PAIR = ", then "  # in the title of two kinds of events that met
 # Of tests that scripts/prove cannot run.
 DOORS = {"lab/arm64_device/": "device --tests",
          "lab/debian_systems/": "device --systems", "lab/proofs/readers": "readers",
@@ -37,6 +38,7 @@ def pytest_addoption(parser):
     parser.addoption("--states", type=int, metavar="N", help="so many random devices")
     parser.addoption("--seed", default="1", help="other random devices")
     parser.addoption("--state", metavar="SEED/N", help="one of the random devices")
+    parser.addoption("--story", help="events, with \";\" between them")
     parser.addoption("--preset", action="append", metavar="NAME",
                      help="the package of this preset; may be repeated")
 
@@ -105,6 +107,9 @@ def never_seen() -> list[str]:
         wanted += [f"of them: {outcome}" for outcome in properties.OUTCOMES]
     if TALLY.get("refusals of memory", 0) >= len(chosen_devices.CHOSEN):
         wanted.append("refusals of memory to a walk")
+    if TALLY.get("events", 0) >= 50_000:
+        from lab.proofs.life import EVENTS
+        wanted += [one + PAIR + other for one in EVENTS for other in EVENTS]
     return [title for title in wanted if not TALLY.get(title)]
 
 
@@ -120,4 +125,4 @@ def pytest_terminal_summary(terminalreporter):
         terminalreporter.line(f"FAILED: never seen: {title}")
     terminalreporter.line("figures: " + "; ".join(
         f"{title.removeprefix('test_').replace('_', ' ')}: {number}"
-        for title, number in TALLY.items()))
+        for title, number in TALLY.items() if PAIR not in title))

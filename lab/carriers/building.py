@@ -140,7 +140,7 @@ def build_program():
 def trials(name: str, *arguments: str) -> list[str]:
     """The command that runs tests in workers, each on a private device of its own."""
     workers = min(os.cpu_count() or 1, 8)
-    asks = re.search(r"lab/proofs/(status|component)\.py", " ".join(arguments))
+    asks = re.search(r"lab/proofs/(status|life|component)\.py", " ".join(arguments))
     return [*(unprivileged() if asks else []), *pytest(
         "-q", "--tx", f"{workers}*popen//python=lab/carriers/worker", "--dist", "load",
         "--maxfail", "10", f"--junit-xml={BUILD}/prove/{name}.xml", *arguments)]

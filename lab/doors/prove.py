@@ -1,6 +1,6 @@
 # SPDX-License-Identifier: BSD-2-Clause
 """usage: scripts/prove [--quick] [PROOF...]
-       scripts/prove TEST | --state SEED/N
+       scripts/prove TEST | --state SEED/N | --story 'EVENT; EVENT'
 
 Shows that nothing breaks the program; docs/proofs.md says what each proof claims. The
 last lines give a figure for each. All of them take an hour on two processors; --quick
@@ -9,6 +9,7 @@ takes samples, in a quarter of an hour.
   faults     every system call that fails, storage that fails, memory refused
   kills      every instant at which the program can be killed, and pairs of them
   states     many thousand devices composed at random
+  life       what happens to a device, one thing after the other
   load       too much of everything
   log        a log that is lost, or fails in the middle
   status     what marlin-status says, against what then happens
@@ -20,8 +21,8 @@ takes samples, in a quarter of an hour.
   coverage   lines and branches that the tests run through
   mutants    the program broken on purpose: the tests have to notice
 
-TEST is one test as a failing trial names it, --state one random device; either runs
-alone, with its output. MARLIN names another program than build/release/marlin.
+TEST is one test as a failing trial names it, --state one random device, --story one
+life; each runs alone, with its output. MARLIN names another program than build/release/marlin.
 
 Exit status: 0 when everything holds, 1 when something does not, 2 for bad use, 77
 when there is no private device here.
@@ -38,8 +39,8 @@ from lab.words.places import BUILD, PROJECT
 
 PYTHON = ["/usr/bin/python3", "-B", "-m"]
 TRIALS = {  # lab/proofs/NAME.py, each
-    "faults": ["faults"], "kills": ["kills", "windows"],
-    "states": ["states"], "load": ["load"], "log": ["log"], "status": ["status"],
+    "faults": ["faults"], "kills": ["kills", "windows"], "states": ["states"],
+    "life": ["life"], "load": ["load"], "log": ["log"], "status": ["status"],
     "install": ["install_faults", "install_kills", "install_races"], "make": ["make"]}
 OTHERS = {  # the whole, and with --quick
     "component": ([], []),
@@ -71,11 +72,14 @@ def main() -> int:
     options = Options(__doc__)
     options.add_argument("--quick", action="store_true")
     options.add_argument("--state")
+    options.add_argument("--story")
     options.add_argument("proofs", nargs="*")
     chosen = options.parse_args()
     alone = [name for name in chosen.proofs if "::" in name]
     if chosen.state:
         alone = ["lab/proofs/states.py", "--state", chosen.state]
+    if chosen.story:
+        alone = ["lab/proofs/life.py", "--story", chosen.story]
     for name in chosen.proofs:
         if not alone and name not in TRIALS and name not in OTHERS:
             options.error(f"'{name}' is not a proof")

@@ -26,9 +26,10 @@ def manifest(files: dict[str, str]) -> str:
                    for path, content in sorted(files.items()))
 
 
-def put_update(device: Device, place: str, release: str, text="", more=None):
+def put_update(device: Device, place: str, release: str, text="", more=None,
+               schema="44l"):
     """Three zones and a table in two directories, more files, and the manifest."""
-    files = {"icutz/icutz44l.dat": f"ICU {release}{text}",
+    files = {f"icutz/icutz{schema}.dat": f"ICU {release}{text}",
              "zoneinfo/+VERSION": f"{release}\n",
              "zoneinfo/America/Los_Angeles": f"TZif {text}, west",
              "zoneinfo/Europe/Paris": f"TZif {text}, east",

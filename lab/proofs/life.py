@@ -1,0 +1,589 @@
+# SPDX-License-Identifier: BSD-2-Clause
+"""A device that lives on: boots, installations, the user's hand and other hands, one
+after the other, and what must hold after each of these events and at the end.
+
+An event is a line of text, "install 2024b damaged" or "boot kill symlink 2", and a life
+is a list of them: it can be printed, shrunk, kept and lived again, with
+scripts/prove --story 'EVENT; EVENT'. Every event can happen at any time, therefore
+Hypothesis draws plain lists and no state machine is needed to say what may follow.
+
+Each boot is a trial, against the model and the properties, after marlin-status was
+asked to foretell it.
+"""
+
+import contextlib
+import copy
+import errno
+import fcntl
+import os
+import struct
+import subprocess
+from itertools import pairwise
+
+import pytest
+from hypothesis import given, seed, settings
+from hypothesis import strategies as st
+
+from lab.carriers import boot, namespace
+from lab.carriers.boot import Booted
+from lab.oracles import model, properties
+from lab.oracles.conditions import Condition
+from lab.oracles.installer import (BUSY, DONE, FAILED, NOT_NEWER, PROGRAM, announced,
+                                   below, hidden, put_update)
+from lab.oracles.trial import entry_differences, trial
+from lab.proofs import status
+from lab.words.device import Device
+from lab.words.paths import (DOWNLOADS, FORMER_ZONEINFO, ICUTZ, LEGACY_ICUTZ, LOCALTIME,
+                             OLD_ICU, RECORD, SYSTEM_ICU, SYSTEM_ZONEINFO, TZ_LATEST,
+                             ZONEINFO, update_path)
+from lab.words.seen import Entries, as_device
+
+MEND = os.path.join(os.path.dirname(PROGRAM), "marlin-mend")
+INCOMING = "/var/db/incoming/"
+RELEASES = "2022b", "2023c", "2024a", "2024b", "2025a"
+NEWEST = "2031a"  # is installed at the end of each life
+SCHEMAS = "44l", "45l"
+SIGNS = ("Europe/Paris", 1), ("America/Los_Angeles", -1)  # of offsets
+ZONES = "Europe/Paris", "America/Los_Angeles", "Mars/Base"
+PLACES = {"zoneinfo": ZONEINFO, "icutz": ICUTZ, "localtime": LOCALTIME,
+          "tz_latest": TZ_LATEST, "record": RECORD, "legacy": LEGACY_ICUTZ,
+          "tz": DOWNLOADS.rstrip("/")}
+
+# --- What can happen -----------------------------------------------------------------
+
+CALLS = "symlink", "unlink", "rename", "mkdir", "openat", "fsync", "write"
+TURNS = 1, 2, 3, 4, 6
+TROUBLES = [f"kill {call} {turn}" for call in CALLS for turn in TURNS] + [
+    f"fail {call} {turn}" for call in CALLS for turn in TURNS] + [
+    f"full {turn}" for turn in TURNS]
+
+
+def all_of(form: str, *choices) -> list[str]:
+    """Every text of a form, in which {} stands for one of the choices each."""
+    texts = [form]
+    for words in choices:
+        texts = [text.replace("{}", word, 1) for text in texts for word in words]
+    return texts
+
+
+EVENTS = {  # by kind, each drawn as often as the others
+    "wait": ["wait"],
+    "boot": ["boot"],
+    "mended boot": ["boot mend"],
+    "killed boot": all_of("boot kill {} {}", ["symlink", "unlink"], "123456"),
+    "failing boot": all_of("boot fail {} {}", ["symlink", "unlink", "access"],
+                           "12345"),
+    "boot, disk full": all_of("boot full {}", "123"),
+    "boot, log lost": ["boot deaf"],
+    "install": all_of("install {}", RELEASES),
+    "odd install": all_of("install {} {}", RELEASES, [
+        "damaged", "incomplete", "misnamed", "schema", "forced", "refused", "verified",
+        "locked", "twice"]),
+    "troubled install": all_of("install {} {}", RELEASES, TROUBLES),
+    "withdraw": ["tool --withdraw"],
+    "prune": ["tool --prune"],
+    "settle": ["tool --settle"],
+    "audit": ["tool --audit"],
+    "troubled tool": all_of("tool {} {}", ["--withdraw", "--prune", "--settle"],
+                            TROUBLES),
+    "zone": all_of("zone {}", ZONES),
+    "system": all_of("system {} {}", RELEASES, SCHEMAS),
+    "older system": ["legacy icutz", "legacy icu", "legacy localtime"],
+    "loss": all_of("lose {}", [*PLACES, *RELEASES]),
+    # Not the record: a boot writes it wherever a link leads.
+    "bend": all_of("bend {} {}", [name for name in PLACES if name != "record"],
+                   [*RELEASES, "nowhere"]),
+    "file": all_of("file {}", [*PLACES, *RELEASES]),
+    "directory": all_of("directory {}", ["tz_latest", "localtime", "zoneinfo",
+                                         "icutz"]),
+    "mode": all_of("mode {} {}", ["tz", *RELEASES], ["000", "500", "755"]),
+    "damage": all_of("damage {}", RELEASES),
+}
+KINDS = {text: kind for kind, texts in EVENTS.items() for text in texts}
+
+# --- What it looks like --------------------------------------------------------------
+
+
+def update_name(release: str) -> str:
+    return f"{release}.1.0"
+
+
+def offset(release: str) -> int:
+    """Of Paris from Greenwich, in seconds: other in every release's update."""
+    return 3600 * (1 + (*RELEASES, NEWEST).index(release))
+
+
+def zone(offset: int) -> str:
+    """A zone file with one type of local time, so many seconds from Greenwich."""
+    return (b"TZif" + bytes(16) + struct.pack(">6I", 0, 0, 0, 0, 1, 4)
+            + struct.pack(">iBB", offset, 0, 0) + b"LMT\0").decode("latin-1")
+
+
+OFFSETS = {zone(sign * (offset(release) + system)): sign * (offset(release) + system)
+           for release in (*RELEASES, NEWEST) for sign in (1, -1)
+           for system in (0, 1800)}
+
+
+def link(entries: Entries, path: str) -> str:
+    here = entries.get(path)
+    return here.text if here and here.kind == "link" else ""
+
+
+def needed(entries: Entries) -> set[str]:
+    """The names of sets that a link leads into, by its text."""
+    targets = [link(entries, path) for path in (ZONEINFO, ICUTZ, LOCALTIME, TZ_LATEST,
+                                                LEGACY_ICUTZ)]
+    return {target.removeprefix(DOWNLOADS).split("/")[0] for target in targets
+            if target.startswith(DOWNLOADS)}
+
+
+def mixed(entries: Entries) -> bool:
+    """Whether the two links are of different data."""
+    tree = properties.data_set_of(link(entries, ZONEINFO))
+    icu = entries.get(ICUTZ)
+    if not icu and properties.Sight(entries).leads_somewhere(LEGACY_ICUTZ):
+        icu = entries[LEGACY_ICUTZ]
+    if tree is None or icu and icu.kind != "link":
+        return False
+    return icu is not None if tree == "" else not icu or icu.text != f"{tree}/icutz"
+
+
+def is_a_directory(entries: Entries, path: str) -> bool:
+    return path in entries and entries[path].kind == "dir"
+
+
+HOPELESS = {  # what an installation and a boot cannot mend: somebody has to remove it
+    "no directory of downloads": lambda entries: not is_a_directory(
+        entries, DOWNLOADS.rstrip("/")) or entries[DOWNLOADS.rstrip("/")].mode != 0o755,
+    "the announcement is a directory": lambda entries: is_a_directory(
+        entries, TZ_LATEST),
+    "zoneinfo is a directory": lambda entries: is_a_directory(entries, ZONEINFO),
+    "icutz is a directory": lambda entries: is_a_directory(entries, ICUTZ),
+    "what is in use cannot be entered": lambda entries: any(
+        entries[DOWNLOADS + name].mode & 0o500 != 0o500
+        for name in needed(entries) & set(names_of(entries))),
+}
+
+
+class Troubled(Condition):
+    """Calls of one kind in a boot, told by their turn, fail; or all from then on."""
+
+    def __init__(self, calls: list, kind: str, turn: int, error: int, later=""):
+        numbers = [number for number, (name, _) in enumerate(calls, start=1)
+                   if name == kind]
+        self.number = (numbers[turn - 1:] or [0])[0]  # 0: not so many are made
+        self.kind, self.when, self.error = kind, f"{turn}{later}", error
+        self.name = f"{kind} {self.when} fails with {errno.errorcode[error]}"
+
+    def options(self, outcome):
+        return boot.failing(family(self.kind), self.error, self.when)
+
+    def fault(self, number, name, path):
+        fails = number == self.number or (
+            self.when.endswith("+") and number > self.number > 0 and name == self.kind)
+        return self.error if fails else None
+
+
+class Life:
+    """One device; the names of the events are methods, and give what must not be."""
+
+    def __init__(self, count=lambda title: None):
+        self.count, self.story = count, []
+        device = Device()
+        device.directory(DOWNLOADS.rstrip("/"))
+        device.point_links_at(None)
+        device.choose_zone("Europe/Paris")
+        device.directory(INCOMING.rstrip("/"))
+        namespace.build(device)
+        self.system(None, "2023c", "44l")
+
+    def live(self, events: list[str]):
+        for text in events:
+            if text != "wait":
+                self.happen(text)
+        self.happen("end")
+
+    def happen(self, text: str):
+        self.story.append(text)
+        before = namespace.look()
+        verb, *words = text.split()
+        try:
+            found = "\n  ".join(getattr(self, verb)(before, *words))
+        except pytest.fail.Exception as failed:
+            found = failed.msg
+        if found:
+            pytest.fail(f"{text}\n  {found}\nAlone: scripts/prove --story "
+                        f"'{'; '.join(self.story)}'", pytrace=False)
+
+    # --- Boots ---
+
+    def boot(self, before: Entries, trouble="", *words: str) -> list[str]:
+        if trouble == "mend":
+            found = self.mend(before)
+            before = namespace.look()
+            return found + self.undisturbed(before, mended=True)
+        device = as_device(before)
+        if trouble == "deaf":
+            outcome = model.boot(device)
+            null = os.open("/dev/null", os.O_RDWR)
+            ending = boot.ending_of(boot.spawn([boot.PROGRAM],
+                                               {0: null, 1: null, 2: None}))
+            os.close(null)
+            found = entry_differences(device, namespace.look())
+            if ending != outcome.ending:
+                found.append(f"ended with {ending}, not {outcome.ending}")
+        elif trouble:
+            found = self.disturbed(device, trouble, *words)
+        else:
+            return self.undisturbed(before)
+        return found + properties.data_changes(before, namespace.look())
+
+    def disturbed(self, device, trouble, kind="symlink", turn="1"):
+        calls = model.boot(copy.deepcopy(device)).calls
+        if trouble == "full":
+            trial(device, Troubled(calls, "symlink", int(kind), errno.ENOSPC, "+"),
+                  again=True)
+            return []
+        if trouble == "fail":
+            trial(device, Troubled(calls, kind, int(turn), errno.EIO), again=True)
+            return []
+        numbers = [number for number, (name, _) in enumerate(calls, start=1)
+                   if name == kind]
+        if len(numbers) < int(turn):
+            return self.undisturbed(namespace.look())
+        outcome = model.boot(device, killed_before=numbers[int(turn) - 1])
+        told = boot.traced(*boot.killing(f"?{family(kind)}", turn))
+        found = entry_differences(device, namespace.look())
+        if told.ending != outcome.ending:
+            found.append(f"ended with {told.ending}")
+        return found
+
+    def mend(self, before: Entries) -> list[str]:
+        """The mend removes "zoneinfo" where the links are of two sets, only that."""
+        told, after = boot.run(MEND), namespace.look()
+        removes = mixed(before)
+        device = as_device(before)
+        if removes:
+            device.drop(ZONEINFO)
+        found = entry_differences(device, after)
+        if told.ending != DONE or told.log.count("\n") != removes:
+            found.append(f"the mend: {told}, where it removes a link: {removes}")
+        return found
+
+    def undisturbed(self, before: Entries, mended=False) -> list[str]:
+        answer = status.ask("--json")
+        _, seen = trial(as_device(before), again=True)
+        if answer.status == 77:
+            found = [f"cannot be told: {answer.errors}"]
+        else:
+            said = answer.said
+            found = (status.link_differences(said["now"], before)
+                     + status.boot_differences(said["next_boot"], seen)
+                     + status.status_differences(said, seen)
+                     + status.reason_differences(said))
+        found += properties.shortcomings(properties.Judged(seen))
+        found += properties.data_changes(before, seen.after)
+        if seen.ending == DONE:
+            if mixed(seen.after) and (mended or not mixed(before)):
+                found.append("the links are of two sets")
+            found += self.clock(seen.after)
+        return found
+
+    def clock(self, entries: Entries) -> list[str]:
+        """date(1) tells the time of the set in use, where that has the user's zone."""
+        tree = link(entries, ZONEINFO)
+        name = link(entries, LOCALTIME).removeprefix(ZONEINFO)
+        here = entries.get(tree + name)
+        if not (here and here.text in OFFSETS and os.access(LOCALTIME, os.R_OK)):
+            return []
+        self.count("clocks read")
+        told = subprocess.run(["/usr/bin/date", "+%:::z"], capture_output=True,
+                              text=True, env={"TZ": f":{LOCALTIME}"}).stdout.strip()
+        hours, minutes = divmod(abs(OFFSETS[here.text]) // 60, 60)
+        wanted = (f"{'-' if OFFSETS[here.text] < 0 else '+'}{hours:02}"
+                  + (f":{minutes:02}" if minutes else ""))
+        return [f"date tells {told}, not {wanted}"] if told != wanted else []
+
+    # --- The installer ---
+
+    def tool(self, before: Entries, *words: str) -> list[str]:
+        options, trouble = words[:1], words[1:]
+        told, after = self.run_tool(options, trouble), namespace.look()
+        found = self.of_the_tool(before, after, told, words, trouble)
+        in_use = (link(before, ZONEINFO) == f"{announced(before)}/zoneinfo"
+                  and link(before, ICUTZ) == f"{announced(before)}/icutz")
+        goes = options == ("--withdraw",) or options == ("--settle",) and in_use
+        if announced(after) not in [announced(before), *[None] * goes]:
+            found.append(f"announced is {announced(after)}")
+        if told.ending == DONE and goes and announced(after):
+            found.append("it is still announced")
+        prunes = options == ("--prune",) or options == ("--settle",) and in_use
+        for name in set(names_of(before)) - set(names_of(after)):
+            if not prunes or name in needed(before):
+                found.append(f"{name} was deleted")
+        return found
+
+    def run_tool(self, words, trouble: tuple[str, ...]) -> Booted:
+        if not trouble:
+            return boot.run(PROGRAM, *words)
+        kind, *arguments = trouble
+        if kind == "full":
+            options = [word for call in ("write", "mkdir", "symlink") for word in
+                       boot.failing(family(call), errno.ENOSPC, f"{arguments[0]}+")]
+        elif kind == "fail":
+            options = boot.failing(family(arguments[0]), errno.EIO, arguments[1])
+        else:
+            options = boot.killing(f"?{family(arguments[0])}", int(arguments[1]))
+        return boot.traced(*options, command=[PROGRAM, *words])
+
+    def of_the_tool(self, before, after, told, words, trouble) -> list[str]:
+        """What no run of the installer may do."""
+        found = [f"{path} was changed" for path in (ZONEINFO, ICUTZ, LOCALTIME, RECORD,
+                                                    LEGACY_ICUTZ, OLD_ICU)
+                 if (before.get(path) and before[path].identity) !=
+                 (after.get(path) and after[path].identity)]
+        for name in needed(before) & set(names_of(before)):
+            if below(after, DOWNLOADS + name) != below(before, DOWNLOADS + name):
+                found.append(f"{name}, which is needed, is not as it was")
+        if told.ending == "killed":
+            return found
+        if told.ending not in (DONE, FAILED, BUSY, NOT_NEWER):
+            found.append(f"it ends with {told.ending}")
+        # What makes a write fail loses the line; an audit tells it in its table.
+        quiet = {"write", "full", "--audit"} & {*trouble, *words}
+        lines = [0, 1] if quiet else [int(told.ending != DONE)]
+        if told.log.count("\n") not in lines:
+            found.append(f"{told.ending}: {told.log!r}")
+        if told.ending == DONE and "--audit" not in words and hidden_of(after):
+            found.append(f"left behind: {hidden_of(after)}")
+        return found
+
+    def install(self, before: Entries, release: str, kind="", *more: str) -> list[str]:
+        name = update_name(release)
+        trouble = (kind, *more) if more else ()
+        source = self.source(release, kind)
+        words = {"forced": ["--force"], "verified": ["--verify", "/bin/true"],
+                 "refused": ["--verify", "/bin/false"]}.get(kind, []) + [source]
+        whole = below(namespace.look(), source)
+        if kind == "locked":
+            told = self.while_locked(words)
+        elif kind == "twice":
+            told = self.twice(words)
+        else:
+            told = self.run_tool(words, trouble)
+        namespace.empty(source)
+        os.rmdir(source)
+        after = namespace.look()
+        found = [line for line in self.of_the_tool(before, after, told, words, trouble)
+                 if not line.startswith(f"{name}, which is needed")
+                 or below(after, update_path(name)) != whole]
+        is_announced = announced(after) == update_path(name)
+        # What is in use, and was lost or damaged, is only put back.
+        put_back = name in needed(before) and announced(after) == announced(before)
+        if told.ending == DONE:
+            if not (is_announced or put_back) or (
+                    below(after, update_path(name)) != whole):
+                found.append(f"{name} is not announced, or not whole")
+            if kind in ("damaged", "incomplete", "misnamed", "refused", "locked"):
+                found.append(f"an update that is {kind} was installed")
+        elif announced(after) != announced(before) and not (
+                trouble and is_announced
+                and below(after, update_path(name)) == whole):
+            found.append(f"announced is {announced(after)}")
+        for other in set(names_of(before)) - set(names_of(after)):
+            found.append(f"{other} was deleted")
+        self.count(f"installations that end with {told.ending}")
+        return found
+
+    def source(self, release: str, kind: str) -> str:
+        """An unpacked update, as something else has left it."""
+        name = update_name(release)
+        source = INCOMING + (name.upper() if kind == "misnamed" else name)
+        device = Device()
+        files = {f"zoneinfo/{name}": zone(sign * offset(release))
+                 for name, sign in SIGNS}
+        put_update(device, source, release, more=files,
+                   schema="45l" if kind == "schema" else "44l")
+        namespace.build_below(source, device.find(source))
+        paris = f"{source}/zoneinfo/Europe/Paris"
+        if kind == "damaged":
+            with open(paris, "r+b") as file:
+                file.write(b"XXXX")
+        elif kind == "incomplete":
+            os.unlink(paris)
+        return source
+
+    def while_locked(self, words) -> Booted:
+        try:
+            tz = os.open(DOWNLOADS, os.O_RDONLY)
+        except OSError:
+            return boot.run(PROGRAM, *words)
+        fcntl.flock(tz, fcntl.LOCK_EX)
+        told = boot.run(PROGRAM, *words)
+        os.close(tz)
+        return told
+
+    def twice(self, words) -> Booted:
+        """Both at once; the answer is that of the one that did it, if any did."""
+        running = [subprocess.Popen([PROGRAM, *words], stdout=subprocess.DEVNULL,
+                                    stderr=subprocess.PIPE, text=True)
+                   for _ in range(2)]
+        ended = [Booted(f"exit {each.wait()}", each.communicate()[1])
+                 for each in running]
+        return min(ended)  # by status, of which 0 is the first
+
+    # --- Hands ---
+
+    def zone(self, before, name: str):
+        replace(LOCALTIME)
+        os.symlink(f"{ZONEINFO}/{name}", LOCALTIME)
+        return []
+
+    def system(self, before, release: str, schema: str):
+        """The system partition of another release."""
+        device = Device()
+        device.file(f"{SYSTEM_ZONEINFO}/+VERSION", f"{release}\n")
+        for name, sign in SIGNS:
+            device.file(f"{SYSTEM_ZONEINFO}/{name}",
+                        zone(sign * (offset(release) + 1800)))
+        device.file(f"{SYSTEM_ICU}/icutzformat.txt", f"{schema}\n")
+        namespace.empty("/usr/share")
+        namespace.build_below("/usr/share", device.find("/usr/share"), exists=True)
+        return []
+
+    def legacy(self, before, what: str):
+        if what == "icutz":
+            replace(LEGACY_ICUTZ)
+            os.symlink(update_path(update_name("2024a")) + "/icutz", LEGACY_ICUTZ)
+        elif what == "icu":
+            os.makedirs(OLD_ICU, exist_ok=True)
+        else:
+            replace(LOCALTIME)
+            os.symlink(f"{FORMER_ZONEINFO}/Europe/Paris", LOCALTIME)
+        return []
+
+    def lose(self, before, what: str):
+        replace(place(what))
+        return []
+
+    def bend(self, before, what: str, to: str):
+        target = update_path(update_name(to)) if to in RELEASES else to
+        replace(place(what))
+        os.symlink(target, place(what))
+        return []
+
+    def file(self, before, what: str):
+        with contextlib.suppress(OSError):
+            replace(place(what))
+            with open(place(what), "x"):
+                pass
+        return []
+
+    def directory(self, before, what: str):
+        with contextlib.suppress(OSError):
+            replace(place(what))
+            os.mkdir(place(what), 0o755)
+        return []
+
+    def mode(self, before, what: str, mode: str):
+        with contextlib.suppress(OSError):
+            if not os.path.islink(place(what)):
+                os.chmod(place(what), int(mode, 8))
+        return []
+
+    def damage(self, before, release: str):
+        with contextlib.suppress(OSError):
+            os.truncate(f"{place(release)}/zoneinfo/Europe/Paris", 30)
+        return []
+
+    # --- The end ---
+
+    def end(self, before: Entries) -> list[str]:
+        """Whatever happened: one sound installation and one boot put the newest update
+        in use, and the next changes nothing. Where that cannot be, it is told."""
+        schema = before[f"{SYSTEM_ICU}/icutzformat.txt"].text.strip()
+        hopeless = [why for why, holds in HOPELESS.items() if holds(before)]
+        for why in hopeless:
+            self.count(f"lives that end hopelessly: {why}")
+        found = self.install(before, NEWEST, "schema" if schema == "45l" else "")
+        after = namespace.look()
+        path = update_path(update_name(NEWEST))
+        if not found and announced(after) != path:
+            return [] if hopeless else ["the newest update cannot be installed"]
+        found += self.undisturbed(after)
+        if hopeless:
+            return found
+        booted = namespace.look()
+        if link(booted, ZONEINFO) != f"{path}/zoneinfo":
+            found.append("the newest update is not in use")
+        found += self.undisturbed(booted)
+        if namespace.look() != booted:
+            found.append("one more boot changes something")
+        return found
+
+
+def family(call: str) -> str:
+    """What a machine may call it; of these it has one."""
+    return {"access": "access,?faccessat,?faccessat2", "fsync": "fsync,?syncfs",
+            "rename": "rename,?renameat,?renameat2", "openat": "openat",
+            "write": "write"}.get(call, f"{call},?{call}at")
+
+
+def place(what: str) -> str:
+    return PLACES.get(what) or update_path(update_name(what))
+
+
+def names_of(entries: Entries) -> list[str]:
+    tz = entries.get(DOWNLOADS.rstrip("/"))
+    return [name for name in tz.names if not name.startswith(".")] if tz else []
+
+
+def hidden_of(entries: Entries) -> list[str]:
+    return hidden(entries) if DOWNLOADS.rstrip("/") in entries else []
+
+
+def replace(path: str):
+    """Nothing stands there any more, if it can be removed."""
+    with contextlib.suppress(OSError):
+        if os.path.isdir(path) and not os.path.islink(path):
+            os.chmod(path, 0o700)
+            namespace.empty(path)
+            os.rmdir(path)
+        else:
+            os.unlink(path)
+
+
+# --- The lives -----------------------------------------------------------------------
+
+
+STORIES = {  # that were faults
+    "a lost set comes back": "install 2024b; boot; lose 2024b; install 2024b; boot",
+    "a zone that exists nowhere": "zone Mars/Base; install 2024b; boot",
+    "an update that waits": "install 2024a; boot; install 2025a; tool --settle; boot",
+}
+
+
+def lives(option):
+    if option("story"):
+        return [option("story")]
+    return [*STORIES.values(), *range(2 if option("quick") else 100)]
+
+
+@pytest.mark.cases("number", lives)
+def test_a_life(number, count):
+    if isinstance(number, str):
+        return Life(count).live([text.strip() for text in number.split(";")])
+
+    @seed(number)
+    @settings(max_examples=25, database=None)
+    @given(st.lists(st.one_of([st.sampled_from(texts) for texts in EVENTS.values()]),
+                    min_size=40, max_size=40))
+    def live(events):
+        for text in events:
+            count("events")
+            count(f"of them {KINDS[text]}")
+        for one, other in pairwise(events):
+            count(f"{KINDS[one]}, then {KINDS[other]}")
+        Life(count).live(events)
+
+    live()
