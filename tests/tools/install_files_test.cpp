@@ -42,8 +42,9 @@ TEST_F(Removal, FollowsNoLink) {
 
 TEST_F(Removal, TakesDirectoriesThatAreClosed) {
   make_file(place + "/a/b/file");
-  set_mode(place + "/a/b", 0555);
+  set_mode(place + "/a/b", 0000);
   set_mode(place + "/a", 0500);
+  set_mode(place, 0000);
   remove();
   EXPECT_EQ(file_at(place), nothing);
 }
