@@ -188,7 +188,7 @@ class Life:
     """One device; the names of the events are methods, and give what must not be."""
 
     def __init__(self, count=lambda title: None):
-        self.count, self.story = count, []
+        self.count, self.story, self.last_line = count, [], ""
         device = Device()
         device.directory(DOWNLOADS.rstrip("/"))
         device.point_links_at(None)
@@ -374,6 +374,7 @@ class Life:
         namespace.empty(source)
         os.rmdir(source)
         after = namespace.look()
+        self.last_line = told.log
         found = [line for line in self.of_the_tool(before, after, told, words, trouble)
                  if not line.startswith(f"{name}, which is needed")
                  or below(after, update_path(name)) != whole]
@@ -509,7 +510,8 @@ class Life:
         after = namespace.look()
         path = update_path(update_name(NEWEST))
         if not found and announced(after) != path:
-            return [] if hopeless else ["the newest update cannot be installed"]
+            return [] if hopeless else ["the newest update cannot be installed: "
+                                        + self.last_line]
         found += self.undisturbed(after)
         if hopeless:
             return found
