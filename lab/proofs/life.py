@@ -310,7 +310,8 @@ class Life:
         options, trouble = words[:1], words[1:]
         told, after = self.run_tool(options, trouble), namespace.look()
         found = self.of_the_tool(before, after, told, words, trouble)
-        in_use = (link(before, ZONEINFO) == f"{announced(before)}/zoneinfo"
+        in_use = (announced(before) in before
+                  and link(before, ZONEINFO) == f"{announced(before)}/zoneinfo"
                   and link(before, ICUTZ) == f"{announced(before)}/icutz")
         goes = options == ("--withdraw",) or options == ("--settle",) and in_use
         if announced(after) not in [announced(before), *[None] * goes]:
@@ -354,7 +355,8 @@ class Life:
         lines = [0, 1] if quiet else [int(told.ending != DONE)]
         if told.log.count("\n") not in lines:
             found.append(f"{told.ending}: {told.log!r}")
-        if told.ending == DONE and "--audit" not in words and hidden_of(after):
+        cleans_up = told.ending == DONE and not trouble and "--audit" not in words
+        if cleans_up and hidden_of(after) and after[PLACES["tz"]].mode == 0o755:
             found.append(f"left behind: {hidden_of(after)}")
         return found
 
