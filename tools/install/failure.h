@@ -10,9 +10,9 @@
 namespace status {
 
 inline constexpr int done = 0;
-inline constexpr int failed = 1;   // refused, not whole, or a call failed
-inline constexpr int bad_use = 2;  // of the command line
-inline constexpr int busy = 3;     // another marlin-install is running
+inline constexpr int failed = 1;     // refused, not whole, or a call failed
+inline constexpr int bad_use = 2;    // of the command line
+inline constexpr int busy = 3;       // another marlin-install is running
 inline constexpr int not_newer = 4;  // than what the device has
 
 }  // namespace status
