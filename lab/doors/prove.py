@@ -22,7 +22,8 @@ takes samples, in a quarter of an hour.
   mutants    the program broken on purpose: the tests have to notice
 
 TEST is one test as a failing trial names it, --state one random device, --story one
-life; each runs alone, with its output. MARLIN names another program than build/release/marlin.
+life; each runs alone, with its output. MARLIN names another program than
+build/release/marlin.
 
 Exit status: 0 when everything holds, 1 when something does not, 2 for bad use, 77
 when there is no private device here.
