@@ -287,6 +287,16 @@ TEST_F(StartupPass, RecordsTheSystemVersionFirstAfterAReset) {
   }
 }
 
+TEST_F(StartupPass, TakesANulForAByteOfARelease) {
+  const std::string release("2023c\0x", 7);
+  install_system(release, "44l");
+  point_links_at_system();
+  install_and_announce("2024a.1.0", "44l");
+  EXPECT_EQ(boot().exit_status, 0);
+  expect_links_at_update("2024a.1.0");
+  EXPECT_EQ(file_at(record), release + ".1.0_2024a.1.0");
+}
+
 TEST_F(StartupPass, TakesTheSystemsSchemaForTheUpdateAlsoAfterAReset) {
   install_and_use("2024a.1.0", "44l");
   install_system("2023c", "45l");
