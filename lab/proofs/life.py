@@ -560,7 +560,7 @@ def replace(path: str):
 # --- The lives -----------------------------------------------------------------------
 
 
-STORIES = {  # that were faults
+STORIES = {  # two that were faults, and what an updater does at any time
     "a lost set comes back": "install 2024b; boot; lose 2024b; install 2024b; boot",
     "a zone that exists nowhere": "zone Mars/Base; install 2024b; boot",
     "an update that waits": "install 2024a; boot; install 2025a; tool --settle; boot",
