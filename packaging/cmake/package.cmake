@@ -23,7 +23,8 @@ set(CPACK_DEBIAN_PACKAGE_DESCRIPTION
     "Runs once at every boot, before anything reads the local time. Keeps the links
 below /var/db/timezone pointing at the newest time-zone data that fits the
 system: that of the system partition, or an update downloaded since. Falls
-back to the system partition when anything is wrong.")
+back to the system partition when an update is missing, cannot be read, is too
+old or was made for another system.")
 if(NOT MARLIN_STATIC)
   set(CPACK_DEBIAN_PACKAGE_SHLIBDEPS ON)
 endif()
