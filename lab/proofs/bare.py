@@ -54,7 +54,9 @@ shift 2 && exec bwrap --cap-add ALL --dev-bind root / --dev /dev --bind /proc /p
   --dev-bind /sys /sys --tmpfs /run --ro-bind /etc/resolv.conf /etc/resolv.conf \
   --bind "$PWD/../packages" /var/cache/apt/archives --chdir /marlin -- "$@"
 """
-ENVIRONMENT = {"PATH": "/usr/sbin:/usr/bin:/sbin:/bin", "HOME": "/root"}
+# Without a buffer, so that the last line of a log is the last that was said.
+ENVIRONMENT = {"PATH": "/usr/sbin:/usr/bin:/sbin:/bin", "HOME": "/root",
+               "PYTHONUNBUFFERED": "1"}
 
 
 def root(release: str) -> Path:
