@@ -19,8 +19,10 @@ import sys
 
 PROJECT = os.path.realpath(f"{__file__}/../../..")
 SETTINGS = "/proc/sys"
-ISOLATION = ("--unshare-ipc --unshare-pid --unshare-net --unshare-uts "
-             "--cap-drop ALL --die-with-parent --tmpfs /").split()
+OPTIONS = """--unshare-ipc --unshare-pid --unshare-net --unshare-uts --cap-drop ALL
+    --die-with-parent --tmpfs / --ro-bind /usr /usr --ro-bind /etc /etc --dev /dev
+    --proc /proc --tmpfs /tmp --dir /run --tmpfs /var/db --tmpfs /usr/share
+    --setenv HOME /tmp --setenv MARLIN_PRIVATE_DEVICE 1""".split()
 
 
 def stop(status: int, text: str):
@@ -28,20 +30,25 @@ def stop(status: int, text: str):
     sys.exit(status)
 
 
-def machine() -> list[str]:
-    """The machine's tools, read-only."""
-    options = "--ro-bind /usr /usr --ro-bind /etc /etc --dev /dev --proc /proc".split()
+def device(*more: str) -> list[str]:
+    """What to put before a command that is to run on a private device; `more` are
+    options of bubblewrap's."""
+    options = []
     for place in "/bin /sbin /lib /lib32 /lib64".split():
         if os.path.islink(place):
             options += ["--symlink", os.readlink(place), place]
         elif os.path.isdir(place):
             options += ["--ro-bind", place, place]
-    return options
+    for place in (PROJECT, os.environ.get("MARLIN_BUILD", "")):
+        if os.path.isdir(place):
+            place = os.path.realpath(place)
+            options += ["--ro-bind", place, place]
+    return ["bwrap", *OPTIONS, *options, *more, "--chdir", PROJECT, "--"]
 
 
 def why_not(bwrap: list[str]) -> str:
-    """Why these options lead to no private device, in bubblewrap's own words; empty if
-    they do."""
+    """Why this leads to no private device, in bubblewrap's own words; empty if it
+    does."""
     told = os.memfd_create("told")
     try:
         probe = os.posix_spawnp(bwrap[0], [*bwrap, "true"], os.environ, file_actions=[
@@ -100,19 +107,11 @@ def main(words: list[str]):
     # Python ignores them, and the command would inherit that.
     signal.signal(signal.SIGPIPE, signal.SIG_DFL)
     signal.signal(signal.SIGXFSZ, signal.SIG_DFL)
-    bwrap = ["bwrap", *ISOLATION, *machine()]
+    bwrap = device(*binds)
     if reason := why_not(bwrap):
         stop(77, reason)
-    if words is None:
-        return
-    bwrap += "--tmpfs /tmp --dir /run --tmpfs /var/db --tmpfs /usr/share".split()
-    for place in (PROJECT, os.environ.get("MARLIN_BUILD", "")):
-        if os.path.isdir(place):
-            place = os.path.realpath(place)
-            bwrap += ["--ro-bind", place, place]
-    os.execvp("bwrap", [
-        *bwrap, *binds, "--setenv", "HOME", "/tmp", "--setenv", "MARLIN_PRIVATE_DEVICE",
-        "1", "--chdir", PROJECT, "--", *words])
+    if words is not None:
+        os.execvp("bwrap", [*bwrap, *words])
 
 
 if __name__ == "__main__":

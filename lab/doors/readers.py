@@ -20,7 +20,7 @@ from pathlib import Path
 
 from lab.carriers import boot, real_data, releases
 from lab.carriers.building import build_program, locked, need, pytest
-from lab.carriers.private_device import ISOLATION, machine
+from lab.carriers.private_device import device
 from lab.readers import GLIBC, HOME, MUSL, UNPACKED
 from lab.words.command import Options, say, stop
 from lab.words.places import BUILD, PROJECT
@@ -74,15 +74,12 @@ def make():
 def inside(*command: str) -> list[str]:
     """A private device with an "/etc" of its own, in which the zone can be set. Nobody
     is root there, as PostgreSQL's server insists."""
-    places = [str(place) for place in (PROJECT, BUILD, Path(boot.PROGRAM).parent)]
+    places = [str(place) for place in (BUILD, Path(boot.PROGRAM).parent)]
     places += [f"/etc/{name}" for name in ETC if os.path.exists(f"/etc/{name}")]
-    return ["bwrap", "--unshare-user", "--uid", "1000", "--gid", "1000", *ISOLATION,
-            *machine(), "--tmpfs", "/etc", "--tmpfs", "/tmp", "--dir",
-            "/run", "--tmpfs", "/var/db", "--tmpfs", "/usr/share",
-            *(word for place in places for word in ("--ro-bind", place, place)),
-            "--ro-bind", str(HOME / "passwd"), "/etc/passwd",
-            "--setenv", "HOME", "/tmp", "--setenv", "MARLIN_PRIVATE_DEVICE", "1",
-            "--setenv", "MARLIN", boot.PROGRAM, "--chdir", str(PROJECT), "--", *command]
+    return [*device("--unshare-user", "--uid", "1000", "--gid", "1000", "--tmpfs", "/etc",
+                    *(word for place in places for word in ("--ro-bind", place, place)),
+                    "--ro-bind", str(HOME / "passwd"), "/etc/passwd",
+                    "--setenv", "MARLIN", boot.PROGRAM), *command]
 
 
 def main() -> int:
