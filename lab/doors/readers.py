@@ -76,7 +76,7 @@ def inside(*command: str) -> list[str]:
     is root there, as PostgreSQL's server insists."""
     places = [str(place) for place in (BUILD, Path(boot.PROGRAM).parent)]
     places += [f"/etc/{name}" for name in ETC if os.path.exists(f"/etc/{name}")]
-    return [*device("--unshare-user", "--uid", "1000", "--gid", "1000", "--tmpfs", "/etc",
+    return [*device(*"--unshare-user --uid 1000 --gid 1000 --tmpfs /etc".split(),
                     *(word for place in places for word in ("--ro-bind", place, place)),
                     "--ro-bind", str(HOME / "passwd"), "/etc/passwd",
                     "--setenv", "MARLIN", boot.PROGRAM), *command]

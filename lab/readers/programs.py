@@ -10,7 +10,7 @@ from typing import NamedTuple
 
 from lab.carriers import real_data, releases
 from lab.readers import GLIBC, MUSL, UNPACKED
-from lab.words.paths import FORMER_ZONEINFO, ICUTZ, LOCALTIME, SYSTEM_ICU, ZONEINFO
+from lab.words.paths import FORMER_ZONEINFO, ICUTZ, SYSTEM_ICU, ZONEINFO
 
 ZONE = "Europe/Lisbon"
 
