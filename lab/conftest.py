@@ -21,8 +21,9 @@ TALLY = {}
 PAIR = ", then "  # in the title of two kinds of events that met
 # Of tests that scripts/prove cannot run.
 DOORS = {"lab/arm64_device/": "device --tests",
-         "lab/debian_systems/": "device --systems", "lab/proofs/readers": "readers",
-         "lab/proofs/recipe": "readers", "lab/proofs/image": "readers --image"}
+         "lab/proofs/cuts": "device --tests", "lab/debian_systems/": "device --systems",
+         "lab/proofs/readers": "readers", "lab/proofs/recipe": "readers",
+         "lab/proofs/image": "readers --image"}
 os.environ["PYTEST_CACHE"] = str(BUILD / "prove" / "pytest")  # for pytest.ini
 
 

@@ -5,25 +5,20 @@ then it installs, and the next boot takes the update."""
 
 import pytest
 
-from lab.arm64_device.install_cuts import (SEAL, TEMPLATE, give_to_account,
-                                           installing_device)
+from lab.arm64_device import installing
 from lab.arm64_device.machine import NO_BLOCK, NO_FILLER, NO_INODE
 from lab.carriers import image
 from lab.oracles.installer import HIDDEN, announced, hidden
 from lab.words.paths import ICUTZ, ZONEINFO, update_path
 
-UPDATE = "2024a.1.7"
-INSTALL = f"""
+UPDATE = "2024a.1.0"
+INSTALL = f"""{installing.AS_OWNER}
 install() {{
-  su owner -c "exec marlin-install /run/update/{UPDATE}" >/run/log 2>&1
+  as_owner marlin-install {installing.UPDATES}{UPDATE}
   status=$?
-  while read -r line; do say "told $line"; done </run/log
+  say "told $said"
   say "told status $status, hidden: $(ls -aR /var/db | grep -c '^{HIDDEN}')"
 }}
-mkdir /run/update
-cp -r {TEMPLATE} /run/update/{UPDATE}
-{SEAL}
-seal /run/update/{UPDATE}
 """
 TROUBLES = {
     "no block": ((), "No space left on device", NO_BLOCK),
@@ -36,8 +31,7 @@ TROUBLES = {
 def test_a_disk_that_takes_nothing(machine, trouble):
     options, reason, trouble_made = TROUBLES[trouble]
     here = machine(f"install/{trouble}".replace(" ", "-"))
-    here.build(installing_device(), *options)
-    give_to_account(here)
+    installing.build(here, ["2024a"], *options)
     console = here.boot(script=INSTALL + trouble_made + "install\n" +
                         f"mount -o remount,rw /var\n{NO_FILLER}install\n")
     line, failed, success, done = console.told

@@ -26,15 +26,11 @@ def main() -> int:
     mode.add_argument("--shell", action="store_true", help="a prompt on the device, "
                       'after the pass; "poweroff -f" ends it')
     mode.add_argument("--tests", nargs="*", metavar="TEST", help="every chosen device, "
-                      "sequences of boots on one disk, ten power cuts; or these tests")
+                      "sequences of boots on one disk, some power cuts; or these tests")
     mode.add_argument("--power-cuts", type=number, metavar="N", help="cuts the "
-                      "power at N random instants, and checks what is left")
+                      "power at N random instants of a life, and checks what is left")
     mode.add_argument("--boot-cost", action="store_true",
                       help="measures the part of a boot that the pass takes")
-    mode.add_argument("--install-cuts", type=number, metavar="N", help="the "
-                      "same while updates are installed")
-    parser.add_argument("--mend", action="store_true", help="of --power-cuts: each "
-                        "boot first removes links that are of two sets")
     mode.add_argument("--systems", nargs="*", metavar="TEST", help="Debian systems "
                       "with the package: the boot unit, other inits; or these tests")
     mode.add_argument("--unit-cost", action="store_true",
@@ -44,17 +40,18 @@ def main() -> int:
     parser.add_argument("--on", choices=("amd64", "arm64", "debian-11", "debian-13"),
                         default="amd64", help="of --systems and --unit-cost: another "
                         "system than Debian 12 on amd64; arm64 is half as fast")
-    parser.add_argument("--seed", type=int, help="of what chance decides in cuts")
+    parser.add_argument("--seed", type=int, help="of what chance decides in a life")
     options = parser.parse_args()
     if subprocess.call([PROJECT / "scripts/packages", "pytest"]):
         return 77
     os.environ["MARLIN_SYSTEMS"] = options.on
     # After the options are understood: these take pytest.
     import pytest
-    from lab.arm64_device import install_cuts, parts, power_cuts, show
+    from lab.arm64_device import parts, show
     from lab.bench import boot_cost, unit_cost
     from lab.carriers.qemu import Unavailable
     from lab.debian_systems import parts as systems
+    from lab.proofs import cuts
     run = ["-c", "lab/pytest.ini", f"--rootdir={PROJECT}", "-n", "2", "--dist"]
     try:
         if options.systems is not None:
@@ -68,13 +65,12 @@ def main() -> int:
         parts.prepare()
         if options.tests is not None:
             return pytest.main([*run, "loadfile",
-                                *(options.tests or ["lab/arm64_device"])])
+                                *(options.tests or ["lab/arm64_device",
+                                                    "lab/proofs/cuts.py"])])
         if options.shell:
             return show.shell()
         if options.power_cuts:
-            power_cuts.run(options.power_cuts, options.seed, options.mend)
-        elif options.install_cuts:
-            install_cuts.run(options.install_cuts, options.seed)
+            cuts.run(options.power_cuts, options.seed)
         elif options.boot_cost:
             boot_cost.measure()
         else:

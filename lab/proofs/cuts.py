@@ -1,0 +1,296 @@
+# SPDX-License-Identifier: BSD-2-Clause
+"""A life on an emulated device, whose power is cut at any moment.
+
+Events of a life come one after the other, on a real disk, while others sync it or
+nobody does; then the emulator is killed. What had not been flushed is kept or lost at
+random. What the disk then holds is judged after its journal has been replayed: it is
+sound; what is announced is what an installer last said, or was about to; every set
+that has a name is whole, and none that a link leads into is gone. Then the device
+boots again, by turns with the mend and without, as the model does with what was found;
+and that is the boot that ends with the next cut.
+"""
+
+import collections
+import contextlib
+import random
+import re
+import shutil
+import time
+
+from lab.arm64_device import installing, power_log
+from lab.arm64_device.installing import ACCOUNT, UPDATES
+from lab.arm64_device.machine import Console, Machine, plain, shown_links
+from lab.carriers import image
+from lab.oracles import model
+from lab.oracles.installer import HIDDEN, announced, below
+from lab.oracles.trial import log_differences
+from lab.proofs import life
+from lab.proofs.life import RELEASES, link, mixed, names_of, needed, update_name
+from lab.words.paths import (DOWNLOADS, FORMER_ZONEINFO, ICUTZ, LEGACY_ICUTZ, LOCALTIME,
+                             OLD_ICU, RECORD, SYSTEM_ZONEINFO, TIMEZONE, TZ_LATEST,
+                             ZONEINFO, update_path)
+from lab.words.seen import Entries, as_device
+
+# The events of a life that a shell on the device can make happen: how often each
+# comes, and how. Boots that have something to do are the rule, because they are short.
+IN_SHELL = {
+    r"boot": (80, "marlin 2>/dev/kmsg"),
+    r"boot mend": (40, "marlin-mend 2>/dev/kmsg; marlin 2>/dev/kmsg"),
+    r"bend tz_latest (\d.*)": (16, rf"[ ! -d {DOWNLOADS}\1.1.0 ] || "
+                                   rf"replace {DOWNLOADS}\1.1.0 {TZ_LATEST}"),
+    r"lose (zoneinfo|icutz)": (10, rf"rm -f {TIMEZONE}/\1"),
+    r"install (\S+)": (1, rf"as_owner marlin-install {UPDATES}\1.1.0"),
+    r"install (\S+) forced": (1, rf"as_owner marlin-install --force {UPDATES}\1.1.0"),
+    r"tool (--withdraw|--prune|--settle)": (3, r"as_owner marlin-install \1"),
+    r"zone (\w+/[LP].*)": (2, rf"replace {ZONEINFO}/\1 {LOCALTIME}"),
+    r"legacy icutz": (3, f"[ ! -e {ICUTZ} ] || "
+                         f'replace "$(readlink {ICUTZ})" {LEGACY_ICUTZ}'),
+    r"legacy icu": (3, f"mkdir -p {OLD_ICU}"),
+    r"legacy localtime": (3, f"replace {FORMER_ZONEINFO}/Europe/Paris {LOCALTIME}"),
+}
+EVENTS = {text: (often, found.expand(shell)) for texts in life.EVENTS.values()
+          for text in texts for form, (often, shell) in IN_SHELL.items()
+          if (found := re.fullmatch(form, text))}
+FIRST = [text for text in EVENTS if text.startswith("install")]
+LENGTH = 300  # more than a device lives through before the cut
+LONGEST = 4  # seconds until the cut
+
+# How the disk is mounted, and what else goes on: nothing that syncs, others who
+# sync now and then or all the time; or every change of a directory is on the
+# disk before the next, as the mount asks for, so that each state in the middle
+# of a boot can be found. The last is the rule, because it finds the most.
+OTHERS = (("rw", ""), ("rw", "(while :; do sync; usleep 30000; done) &\n"),
+          ("rw", "(while :; do sync; done) &\n"), *(3 * [("dirsync", "")]))
+
+LINKS = ZONEINFO, ICUTZ, LOCALTIME, TZ_LATEST, LEGACY_ICUTZ
+LEFT = f"{TIMEZONE}/{HIDDEN}* {DOWNLOADS}{HIDDEN}*"
+WORDS = f"""{installing.AS_OWNER}
+replace() {{
+  ln -sfn "$1" "$2.next" && chown -h {ACCOUNT} "$2.next" && mv -T "$2.next" "$2"
+}}
+happen() {{
+  said=
+  say "begins: $1"
+  eval "$2"
+  say "status $?, announced $(readlink {TZ_LATEST}), left" {LEFT}, said $said
+}}
+say "life begins"
+"""
+TOLD = re.compile(r"begins: (.*)|status (\d+), announced (\S*), left (.*), said ?(.*)")
+# What an installation may end with: done, or the reason why not.
+ENDINGS = [r"0 .*", r"1 .*: a set of this version is in use or announced; .*",
+           r"4 .*: it is not newer than .*"]
+
+
+def insist(found: list[str]):
+    """Raises if anything is not as it has to be."""
+    if found:
+        raise RuntimeError("; ".join(found))
+
+
+def described(entries: Entries) -> str:
+    """The state of the two links in words."""
+    names = {"": "missing", SYSTEM_ZONEINFO: "the system's"} | {
+        f"{update_path(update_name(release))}/{name}": "an update's"
+        for release in RELEASES for name in ("zoneinfo", "icutz")}
+    tree, icu = (names[link(entries, path)] for path in (ZONEINFO, ICUTZ))
+    return f"{tree}, icutz {icu}" + ", MIXED" * mixed(entries)
+
+
+def kind_of_record(entries: Entries) -> str:
+    """A record is written and never synced: the disk may know of the file but not
+    of its bytes yet; the next activation writes it anew."""
+    if RECORD not in entries:
+        return "none"
+    record, version = entries[RECORD].text, r"20\d\d[a-z]\.1\.0"
+    if not record.strip("\0"):
+        return "of NUL bytes" if record else "empty"
+    insist([f"the record holds {record!r}"] * (
+        not re.fullmatch(f"{version}_{version}", record)))
+    return "whole"
+
+
+def check_recovery(console: Console, found: Entries, mend: bool) -> Entries:
+    """The first pass of a boot that found this is to do what the model does; the device
+    after it."""
+    device = as_device(found)
+    if mend and mixed(found):
+        device.drop(ZONEINFO)
+    insist(log_differences(model.boot(device), console.booted()))
+    zone = device.walk(LOCALTIME, follow=True)[2].text
+    [name] = set(re.findall(r"[SU]2\d[A-Z][PL]", zone))
+    insist([f"after the boot not: {text}"
+            for text in shown_links(device) + [f"reader sees zone {name}"]
+            if text not in console.said])
+    after = dict(device.everything())
+    insist([f"with the mend: {described(after)}"] * (mend and mixed(after)))
+    return after
+
+
+def announced_by(event: str) -> set[str | None]:
+    """What an event can make the announcement."""
+    if named := re.search(r"20\d\d[a-z]", event):
+        return {update_path(update_name(named[0]))}
+    return {None} if event.endswith(("--withdraw", "--settle")) else set()
+
+
+class Victim:
+    """A device whose power is cut again and again. `found` is what the next boot
+    finds, `allowed` what may be announced then."""
+
+    def __init__(self, seed: int | None):
+        self.seed = random.randrange(10**6) if seed is None else seed
+        print(f"seed {self.seed}", flush=True)
+        self.random, self.machine = random.Random(self.seed), Machine("power-cuts")
+        installing.build(self.machine, RELEASES, "-N", "2048", "-J", "size=4")
+        self.start = self.found = self.machine.look()
+        self.mend, self.allowed = False, {None}
+        self.totals = collections.Counter()
+
+    @contextlib.contextmanager
+    def on_trial(self):
+        """Has a failure tell what was said last, and the seed. The state that the last
+        cut left is booted as well, and shut down."""
+        try:
+            yield
+            console = self.machine.boot(options="mend" * self.mend)
+            check_recovery(console, self.found, self.mend)
+            image.check(self.machine.var)
+        except RuntimeError as reason:
+            print(Console(self.machine.console).text[-6000:])
+            raise RuntimeError(f"with seed {self.seed}: {reason}") from reason
+
+    def cut(self) -> tuple[str, int]:
+        """Boots, lets life go on for a while, and kills the emulator, which logs what
+        the device asks of its disk and changes only a copy of it. What was happening,
+        and how many blocks were lost."""
+        machine, log = self.machine, self.machine.directory / "log"
+        scratch = shutil.copyfile(machine.var, machine.directory / "scratch.img")
+        log.write_bytes(b"")
+        mounted, syncs = self.random.choice(OTHERS)
+        events = [self.random.choice(FIRST), *self.random.choices(
+            [*EVENTS], [often for often, _ in EVENTS.values()], k=LENGTH)]
+        emulator = machine.start(
+            WORDS + syncs + "".join(f"happen '{event}' '{EVENTS[event][1]}'\n"
+                                    for event in events)
+            + "while :; do sleep 1; done\n",
+            options="var=" + mounted + " mend" * self.mend,
+            more=("-smp", "2"),  # processors: others sync in the middle of a pass
+            disk="driver=blklogwrites,node-name=var,"
+                 f"file.driver=file,file.filename={scratch},"
+                 f"log.driver=file,log.filename={log}")
+        try:
+            machine.wait_for(emulator, "life begins")
+            time.sleep(self.random.uniform(0, LONGEST))
+        finally:
+            emulator.kill()
+            emulator.wait()
+        lost = power_log.cut_power(machine.var, log.read_bytes(),
+                                   self.random.choice((0, 0.5, 1)), self.random)
+        console = Console(machine.console)
+        check_recovery(console, self.found, self.mend)
+        self.found = self.look_after_cut()
+        happening = self.follow(console)
+        self.judge()
+        return happening, lost
+
+    def look_after_cut(self) -> Entries:
+        """The disk as a boot would find it."""
+        found = shutil.copyfile(self.machine.var, self.machine.directory / "found.img")
+        image.replay_journal(found)
+        image.check(found)
+        return self.machine.look(found)
+
+    def follow(self, console: Console) -> str:
+        """Learns from what the device said which announcements there can be, and what
+        was happening."""
+        happening = "nothing"
+        for told in filter(None, map(TOLD.fullmatch, console.said)):
+            if told[1]:
+                happening = told[1]
+                self.allowed |= announced_by(happening)
+                continue
+            event, happening = happening, "nothing"
+            self.totals["done " + event.split()[0]] += 1
+            is_tools = event.startswith(("install", "tool"))
+            endings = ENDINGS if event.startswith("install") else ENDINGS[:1]
+            if not any(re.fullmatch(form, f"{told[2]} {told[5]}") for form in endings):
+                raise RuntimeError(f"{event}: {told[0]}")
+            if is_tools and told[4] != LEFT:
+                raise RuntimeError(f"{event}: left behind: {told[4]}")
+            # Only the installer syncs what it has done, and what others did before.
+            self.allowed = {told[3] or None} | (set() if is_tools else self.allowed)
+        return happening
+
+    def judge(self):
+        """What a cut left."""
+        found = self.found
+        if announced(found) not in self.allowed:
+            raise RuntimeError(f"announced is {announced(found)}, not one of "
+                               f"{self.allowed}")
+        self.allowed = {announced(found)}
+        sets = names_of(found)
+        insist([f"{name} is gone, and a link leads there"
+                for name in sorted(needed(found) - set(sets))])
+        insist([f"{name} is not as it was in the update" for name in sets
+                if below(found, DOWNLOADS + name) != below(found, UPDATES + name)
+                or found[DOWNLOADS + name].mode != 0o755])
+        insist([f"{path} is not a link" for path in LINKS
+                if path in found and found[path].kind != "link"])
+        insist([f"{path} is a stray file" for path in found
+                if path not in self.start and path not in LINKS
+                and not path.startswith((DOWNLOADS, f"{TIMEZONE}/{HIDDEN}", RECORD))
+                and path not in (OLD_ICU, TZ_LATEST + ".next", LOCALTIME + ".next",
+                                 LEGACY_ICUTZ + ".next")])
+
+    def stays_mixed(self, mend: bool) -> bool:
+        """Boots a copy of what the last cut left: whether the links are then still of
+        two sets."""
+        copy = shutil.copyfile(self.machine.var, self.machine.directory / "copy.img")
+        console = self.machine.boot(options="mend" * mend, disk=plain("var", copy))
+        return mixed(check_recovery(console, self.found, mend))
+
+
+def run(count: int, seed: int | None = None):
+    """Raises RuntimeError when a device is not as it has to be after a power cut."""
+    victim, started = Victim(seed), time.monotonic()
+    states, totals = collections.Counter(), victim.totals
+    try:
+        with victim.on_trial():
+            for number in range(1, count + 1):
+                happening, lost = victim.cut()
+                state = described(victim.found)
+                record = "record " + kind_of_record(victim.found)
+                states[state] += 1
+                totals.update(["cuts", record, "during " + happening.split()[0],
+                               *["with losses"] * (lost > 0)])
+                if mixed(victim.found):
+                    totals["stay"] += victim.stays_mixed(mend=False)
+                    totals["stay with the mend"] += victim.stays_mixed(mend=True)
+                victim.mend = not victim.mend
+                print(f"cut {number}/{count}, {time.monotonic() - started:.0f} s, "
+                      f"during {happening}: {lost} blocks lost; {state}; {record}",
+                      flush=True)
+    finally:
+        print_table(states, totals)
+
+
+def print_table(states: collections.Counter, totals: collections.Counter):
+    def listed(start: str) -> str:
+        return ", ".join(f"{number} {title.removeprefix(start)}"
+                         for title, number in totals.most_common()
+                         if title.startswith(start))
+
+    mixed_states = sum(number for state, number in states.items() if "MIXED" in state)
+    print(f"\n{totals['cuts']} power cuts, half of them on a device with the mend; "
+          f"{totals['with losses']} lost blocks that had been written.\n"
+          f"Events that came to their end: {listed('done ')}.\n"
+          f"Cut: {listed('during ')}.\nThe record afterwards: {listed('record ')}.\n"
+          f"{mixed_states} left links of two sets: {totals['stay']} of them stay so at "
+          f"the next boot, {totals['stay with the mend']} with the mend.")
+    for state, number in sorted(states.items()):
+        print(f"{number:5} times zoneinfo is {state}")
+
+
+def test_power_cuts():
+    run(18)
