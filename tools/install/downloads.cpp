@@ -30,7 +30,7 @@ std::string path_of(const std::string& name) {
 
 // Without the C library's other ways to ask, which a static program cannot go.
 std::string account(uid_t number) {
-  const std::unique_ptr<std::FILE, decltype(&std::fclose)> accounts(
+  const std::unique_ptr<std::FILE, int (*)(std::FILE*)> accounts(
       std::fopen("/etc/passwd", "re"), &std::fclose);
   while (const passwd* const each =
              accounts ? ::fgetpwent(accounts.get()) : nullptr) {
