@@ -50,6 +50,15 @@ void check_mode(const std::string& path, mode_t mode) {
            " has the set-user-ID, the set-group-ID or the sticky bit");
 }
 
+std::string content_of(int parent, const std::string& name,
+                       const std::string& path) {
+  const descriptor file(
+      ::openat(parent, name.c_str(),
+               O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
+  if (file.number() < 0) fail("open", path);
+  return read_all(file.number(), limits::file_bytes, path);
+}
+
 // Explicitly: neither a umask nor an access list decides about the modes of a
 // set.
 void set_mode(int file, mode_t mode, const std::string& path) {
@@ -115,61 +124,32 @@ class walk {
     if (!S_ISREG(status.st_mode))
       refuse(escaped(path) + " is " + kind_of(status.st_mode));
     check_mode(path, status.st_mode);
-    const std::pair identity(status.st_dev, status.st_ino);
-    const auto [first, is_new] = names_.emplace(identity, path);
+    const auto [first, is_new] =
+        names_.emplace(std::pair(status.st_dev, status.st_ino), path);
     if (!is_of_manifest(path)) files_.emplace(path, first->second);
     if (copy_ < 0) return;
     if (is_new)
-      file(parent, name, path, identity);
+      write(content_of(parent, name, path), path);
     else if (::linkat(copy_, first->second.c_str(), copy_, path.c_str(), 0) !=
              0)
       fail("make the file", shown(path));
   }
 
-  void file(int parent, const std::string& name, const std::string& path,
-            std::pair<dev_t, ino_t> identity) {
-    const descriptor from(
-        ::openat(parent, name.c_str(),
-                 O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
-    if (from.number() < 0) fail("open", path);
-    struct stat status {};
-    if (::fstat(from.number(), &status) != 0) fail("look at", path);
-    if (!S_ISREG(status.st_mode) ||
-        std::pair(status.st_dev, status.st_ino) != identity)
-      refuse(escaped(path) + " was replaced meanwhile");
+  void write(std::string_view content, const std::string& path) {
+    if ((bytes_ += content.size()) > limits::bytes)
+      refuse("it is larger than " + std::to_string(limits::bytes >> 20) +
+             " MiB");
     const descriptor to(::openat(
         copy_, path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, 0600));
     if (to.number() < 0) fail("make the file", shown(path));
-    transfer(from.number(), to.number(), path);
-    set_mode(to.number(), 0644, shown(path));
-  }
-
-  void transfer(int from, int to, const std::string& path) {
-    char buffer[1 << 16];
-    for (std::uint64_t length = 0;;) {
-      const ssize_t count = ::read(from, buffer, sizeof buffer);
-      if (count < 0 && errno == EINTR) continue;
-      if (count < 0) fail("read", path);
-      const auto size = static_cast<std::size_t>(count);
-      if ((length += size) > limits::file_bytes)
-        refuse(escaped(path) + " is larger than " +
-               std::to_string(limits::file_bytes >> 20) + " MiB");
-      if ((bytes_ += size) > limits::bytes)
-        refuse("it is larger than " + std::to_string(limits::bytes >> 20) +
-               " MiB");
-      write_all(to, {buffer, size}, path);
-      // What comes after the end of a file is not of the update.
-      if (size < sizeof buffer) return;
-    }
-  }
-
-  void write_all(int to, std::string_view content, const std::string& path) {
     while (!content.empty()) {
-      const ssize_t count = ::write(to, content.data(), content.size());
+      const ssize_t count =
+          ::write(to.number(), content.data(), content.size());
       if (count < 0 && errno == EINTR) continue;
       if (count < 0) fail("write", shown(path));
       content.remove_prefix(static_cast<std::size_t>(count));
     }
+    set_mode(to.number(), 0644, shown(path));
   }
 
   int copy_;
@@ -181,16 +161,6 @@ class walk {
   // file.
   std::map<std::pair<dev_t, ino_t>, std::string> names_{};
 };
-
-std::string manifest_of(int set) {
-  if (status_of(set, manifest_name, manifest_name).st_mode == 0)
-    refuse("it has no SHA256SUMS");
-  const descriptor file(
-      ::openat(set, manifest_name,
-               O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
-  if (file.number() < 0) fail("open", manifest_name);
-  return read_all(file.number(), limits::file_bytes, manifest_name);
-}
 
 // A hash, two blanks, a path: what sha256sum(1) prints of one file.
 constexpr std::size_t before_path = 66;
@@ -232,7 +202,10 @@ file_names files_in(int set, int copy, const std::string& where) {
 }
 
 void check_manifest(int set, const file_names& files) {
-  const std::string text = manifest_of(set), printed = sums_of(set, files);
+  if (status_of(set, manifest_name, manifest_name).st_mode == 0)
+    refuse("it has no SHA256SUMS");
+  const std::string text = content_of(set, manifest_name, manifest_name),
+                    printed = sums_of(set, files);
   std::string_view wanted = text, found = printed;
   while (!found.empty() && wanted.starts_with(first_line(found))) {
     wanted.remove_prefix(first_line(found).size());

@@ -25,8 +25,8 @@ inline constexpr char manifest_name[] = "SHA256SUMS";
 // Walks through a set, and throws `refusal` at the first thing that a sound one
 // cannot have; the bytes of files are not looked at. Nothing but directories
 // and regular files is ever opened, no link is followed, and all is bounded by
-// the limits. If something else takes the place of a file in between, it is
-// opened without waiting, and refused.
+// the limits. What takes the place of a file in between is opened without
+// waiting, and passes only with the bytes that the manifest has.
 //
 // Everything is made anew in `copy`, if there is one: an empty directory that
 // nobody else can enter. Directories get the mode 755, files 644. `where` is

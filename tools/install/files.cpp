@@ -77,16 +77,18 @@ std::string link_text(int directory, const std::string& name,
 
 std::string read_all(int file, std::size_t most, const std::string& path) {
   std::string text;
-  char buffer[1 << 14];
+  char buffer[1 << 16];
   for (;;) {
     const ssize_t count = ::read(file, buffer, sizeof buffer);
     if (count < 0 && errno == EINTR) continue;
     if (count < 0) fail("read", path);
-    if (count == 0) return text;
-    text.append(buffer, static_cast<std::size_t>(count));
+    const auto size = static_cast<std::size_t>(count);
+    text.append(buffer, size);
     if (text.size() > most)
       refuse(escaped(path) + " is larger than " + std::to_string(most >> 20) +
              " MiB");
+    // What comes after the end of a file is not of it.
+    if (size < sizeof buffer) return text;
   }
 }
 
