@@ -78,7 +78,8 @@ FAMILIES = {
     "truncate": "truncate ftruncate", "fsync": "fsync fdatasync sync syncfs",
     "mknod": "mknod mknodat", "chown": "chown lchown fchown fchownat",
     "statfs": "statfs fstatfs",
-    **{name: name for name in "chdir lseek fcntl flock ioctl utimensat umask".split()},
+    **{name: name for name in ("chdir lseek fcntl flock ioctl utimensat umask clone3 "
+                               "memfd_create wait4").split()},
 }
 NAMES = {call: name for name, calls in FAMILIES.items() for call in calls.split()}
 TRACED = ",".join("?" + call for call in NAMES)

@@ -47,10 +47,10 @@ ERRORS = {
 LASTING = {EACCES, EDQUOT, EIO, EMFILE, ENFILE, ENOMEM, ENOSPC, EPERM, EROFS}
 
 
-def failures(calls: list[Call]) -> Iterator[Fails]:
+def failures(calls: list[Call], errors=ERRORS) -> Iterator[Fails]:
     """Each call with each of its errors, once and, if that can be, for good."""
     for number, call in enumerate(calls, start=1):
-        for error in ERRORS.get(call.name, []):
+        for error in errors.get(call.name, []):
             yield Fails(number, call, error)
             if error in LASTING:
                 yield Fails(number, call, error, for_good=True)

@@ -7,8 +7,7 @@ announced, or stays; and the next run is undisturbed."""
 
 import re
 from errno import (EAGAIN, EDQUOT, EEXIST, EINTR, EIO, EMFILE, EMLINK, ENFILE,
-                   ENOLCK, ENOMEM, ENOSPC, ENOTDIR, ENOTEMPTY, EPERM, EROFS, EXDEV,
-                   errorcode)
+                   ENOLCK, ENOMEM, ENOSPC, ENOTDIR, ENOTEMPTY, EPERM, EROFS, EXDEV)
 
 import pytest
 
@@ -18,10 +17,10 @@ from lab.oracles.installer import (BUSY, DONE, FAILED, HIDDEN, NEW, NOT_NEWER, P
                                    SCENES, SOURCE, announced, below, calls, hidden,
                                    names, next_boot, runs_again, traced, violations)
 from lab.oracles.trial import fail
-from lab.proofs.faults import CHANGE, ERRORS, LASTING, OPEN
+from lab.proofs.faults import CHANGE, ERRORS, OPEN, failures
 from lab.words.paths import DOWNLOADS, update_path
 
-MORE = {
+EXPECTED = ERRORS | {
     "create": OPEN + [EDQUOT, EEXIST, ENOSPC, EROFS],
     "mkdir": CHANGE + [EEXIST, EMLINK],
     "link": CHANGE + [EEXIST, EMLINK, EXDEV],
@@ -33,53 +32,45 @@ MORE = {
     "clone3": [EAGAIN, ENOMEM],
     "wait4": [EINTR],
 }
-EXPECTED = {**ERRORS, **MORE}
-# No run that met such a failure may say that it is done.
 # One that means that a name is taken may lead to another name.
 TAKEN = {EEXIST, ENOTDIR, ENOTEMPTY}
+# No run in which one of these fails may say that it is done.
 TELLING = {"create", "mkdir", "link", "rename", "symlink", "chmod", "fsync", "write",
            "memfd_create", "clone3"}
 
 
-def disturbances(option):
-    quick = option("quick")
+def disturbances(_):
     for scene in SCENES:
         made = calls(scene)
         # After the last of these only what nobody needs is deleted, as far as that can
         # be done; so are leftovers before the first, which a withdrawal does not need.
-        synced = [number for number, call in enumerate(made) if call.name == "fsync"]
-        telling = range(synced[0] * (scene == "withdrawing"), synced[-1] + 1)
         start = boot.beginning(made)
-        for number, call in enumerate(made[start:], start):
-            errors = EXPECTED.get(call.name, [])
-            if quick and errors:
-                errors = [errors[number % len(errors)]]
-            for error in sorted(errors):
-                lasting = error in LASTING and not (quick and number % 4)
-                for when in [str(call.number)] + [f"{call.number}+"] * lasting:
-                    yield pytest.param(
-                        scene, call, error, when, number in telling,
-                        id=f"{scene}: {call.call} {when}, {call.name} "
-                           f"{call.path or ''} {errorcode[error]}")
+        made = made[start:]
+        synced = [number for number, call in enumerate(made, 1) if call.name == "fsync"]
+        telling = range(synced[0] * (scene == "withdrawing"), synced[-1] + 1)
+        for fails in failures(made, EXPECTED):
+            retried = (fails.error == EINTR or
+                       fails.call.name == "rename" and fails.error in TAKEN)
+            yield pytest.param(
+                scene, fails, fails.number in telling and not retried and
+                fails.call.name in TELLING, id=f"{scene}: {fails.name}")
 
 
-@pytest.mark.cases("scene, call, error, when, telling", disturbances)
-def test_a_call_that_fails(scene, call, error, when, telling, count):
+@pytest.mark.cases("scene, fails, telling", disturbances, quick=7)
+def test_a_call_that_fails(scene, fails, telling, count):
     make, words = SCENES[scene]
     namespace.build(make())
     before = namespace.look()
-    told = traced(words, *boot.failing(call.call, error, when))
+    told = traced(words, *fails.options(None))
     after = namespace.look()
     found = violations(words, before, after)
     lines = told.log.splitlines()
-    retried = error == EINTR or call.name == "rename" and error in TAKEN
-    telling = telling and call.name in TELLING and not retried
     if telling and told.ending == DONE:
         found.append("it says that it is done")
     if told.ending not in (DONE, FAILED, BUSY, NOT_NEWER):
         found.append(f"it ends with {told.ending}")
     # A line that tells it cannot be written either.
-    mute = call.name == "write" and when.endswith("+")
+    mute = "write" in fails.later
     if len(lines) != (told.ending != DONE and not mute):
         found.append(f"it ends with {told.ending} and prints {told.log!r}")
     if words[-1] == SOURCE:
@@ -92,7 +83,7 @@ def test_a_call_that_fails(scene, call, error, when, telling, count):
     if any("nothing was changed" in line for line in lines):
         if announced(after) != announced(before) or hidden(after):
             found.append("something was changed")
-    if scene == "a first update" and not when.endswith("+"):
+    if scene == "a first update" and not fails.later:
         # One failing call cannot keep it from deleting what it has made.
         found += [f"{name} is left" for name in hidden(after)]
         if (NEW in names(after)) != (announced(after) is not None):
