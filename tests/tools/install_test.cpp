@@ -451,6 +451,14 @@ TEST_F(Installer, RefusesWhatIsNotAsItsManifestHasIt) {
         file("SHA256SUMS", whole + std::string(66, 'x') + "\033[2J\n")},
        {"zoneinfo/Europe/Paris is not as SHA256SUMS has it",
         file("SHA256SUMS", whole.substr(0, whole.size() - 1))},
+       // One file under both names, and no hash of it.
+       {"SHA256SUMS lists what is missing, \"\"",
+        [&] {
+          make_file(manifest, whole.substr(0, whole.size() - 88) +
+                                  "zoneinfo/Europe/Paris\n");
+          wipe(paris);
+          ASSERT_EQ(::link(manifest.c_str(), paris.c_str()), 0);
+        }},
        {"SHA256SUMS is larger than 4 MiB",
         file("SHA256SUMS", std::string(5 << 20, 'x'))}},
       [] {});

@@ -8,6 +8,7 @@
 #include <cerrno>
 #include <map>
 #include <string_view>
+#include <tuple>
 #include <utility>
 #include <vector>
 
@@ -124,9 +125,10 @@ class walk {
     if (!S_ISREG(status.st_mode))
       refuse(escaped(path) + " is " + kind_of(status.st_mode));
     check_mode(path, status.st_mode);
+    const bool listed = !is_of_manifest(path);
     const auto [first, is_new] =
-        names_.emplace(std::pair(status.st_dev, status.st_ino), path);
-    if (!is_of_manifest(path)) files_.emplace(path, first->second);
+        names_.emplace(std::tuple(listed, status.st_dev, status.st_ino), path);
+    if (listed) files_.emplace(path, first->second);
     if (copy_ < 0) return;
     if (is_new)
       write(content_of(parent, name, path), path);
@@ -158,8 +160,8 @@ class walk {
   std::size_t entries_ = 0;
   std::uint64_t bytes_ = 0;
   // The first name of each file: rules compilers give zones that are alike one
-  // file.
-  std::map<std::pair<dev_t, ino_t>, std::string> names_{};
+  // file. Apart from them those that the manifest does not list.
+  std::map<std::tuple<bool, dev_t, ino_t>, std::string> names_{};
 };
 
 // A hash, two blanks, a path: what sha256sum(1) prints of one file.
