@@ -7,7 +7,6 @@ and the lines are those given here: nothing comes from the model.
 """
 
 import errno
-import os
 from types import SimpleNamespace
 
 import pytest
@@ -50,7 +49,6 @@ class Scene:
 
     def on(self, device: Device, *options: str) -> Device:
         self.machine.build(device, *options)
-        self.nodes = dict(device.everything())
         return device
 
     def boot(self, *printed, ending="exit 0", reader=None, then=None, **how):
@@ -64,14 +62,10 @@ class Scene:
         self.boots += 1
         print(f"--- boot {self.boots}\n{console.text.rstrip()}")
         seen = Seen(before, machine.look(), *console.booted())
-        nodes, self.nodes = self.nodes, dict(device.everything())
         outcome = SimpleNamespace(
             lines=[(text, None) if isinstance(text, str) else text for text in printed],
-            ending=ending, changed={
-                self.nodes.get(os.path.dirname(path))
-                for path in nodes.keys() | self.nodes.keys()
-                if nodes.get(path) is not self.nodes.get(path)})
-        found = differences(device, nodes, outcome, seen)
+            ending=ending)
+        found = differences(device, outcome, seen)
         if reader:
             found += [f"the device did not say: {text}" for text in shown
                       if text not in console.said]
@@ -150,7 +144,6 @@ def test_disk_with_a_lost_link(scene):
     read-only on the first error, until it is repaired."""
     device = scene.on(updated(active=True))
     device.put(ZONEINFO, Node("something else"))
-    scene.nodes = dict(device.everything())
     var = scene.machine.var
     image.debugfs(var, f'clri "{ZONEINFO.removeprefix("/var")}"', write=True)
     damaged = errno.EUCLEAN  # this kernel finds that before it finds "read only"

@@ -1,15 +1,13 @@
 # SPDX-License-Identifier: BSD-2-Clause
 """What has to hold of any boot: what, not how.
 
-The second of two oracles. It looks only at what a boot found, left and printed, and at
-which calls failed if they were traced: what may be in use, what may be activated, what
-the record says, which line follows which and ends with which error, that every reset,
-refusal and correction has its reason, and that nothing else is touched. It knows
-nothing of the model's boot, so that a mistake that the model and the program share is
-noticed.
+The second of two oracles. It looks only at what a boot found, left and printed: what
+may be in use, what may be activated, what the record says, which line follows which,
+that every reset, refusal and correction has its reason, and that nothing else is
+touched. It knows nothing of the model's boot, so that a mistake that the model and the
+program share is noticed.
 """
 
-import errno
 import os
 import re
 from typing import NamedTuple
@@ -19,7 +17,7 @@ from lab.words.paths import (DEFAULT_LOCALTIME, DEFAULT_ZONE, DOWNLOADS,
                              FORMER_ZONEINFO, ICUTZ, LEGACY_ICUTZ, LOCALTIME, OLD_ICU,
                              RECORD, SYSTEM_ICU, SYSTEM_ZONEINFO, TIMEZONE, TZ_LATEST,
                              ZONEINFO)
-from lab.words.seen import Call, Entries, Seen, as_device
+from lab.words.seen import Entries, Seen, as_device
 
 # --- What a boot prints ------------------------------------------------------
 
@@ -74,25 +72,6 @@ def letters(log, ending):
     # The runtime's own words on an exception that nobody caught may follow.
     only_the_runtime = ending == "abort" and not log.startswith(lines.NAME, end)
     return found if end == len(log) or only_the_runtime else found + "?"
-
-
-def foreign_error_texts(calls: list[Call], log: str) -> list[str]:
-    """Lines of a traced boot that do not end with the text of the last failure of a
-    call that a boot has to make. Any stat(2) beside is the program's own affair."""
-    found, text = [], None  # None: the start of a process or a walk leaves anything
-    printed = LINE.finditer(log)
-    for call in calls:
-        if call.name == "print" and (line := next(printed, None)):
-            if text not in (None, line[2]) and line[2] != os.strerror(errno.ERANGE):
-                found.append(f"{line[0]!r} has to end with {text!r}")
-            text = line[2]
-        elif call.name in ("fstat", "lstat", "fchdir", "getdents") or (
-                call.name in ("stat", "open")
-                and (call.path == "." or call.path.endswith("/icutz"))):
-            text = None
-        elif call.error and call.name != "stat":
-            text = os.strerror(getattr(errno, call.error))
-    return found
 
 
 # --- What a device says ------------------------------------------------------

@@ -62,9 +62,8 @@ def judge(name: str, device: Device, looks: tuple[Entries, Entries], ending_of):
                            for file in ("listed", "log", "status"))
     before = in_order(below(before, place), listed.split("\0")[:-1])
     assert entry_differences(device, before) == []  # learns the order as well
-    nodes = dict(device.everything())
     seen = Seen(before, below(after, place), ending_of(status), log)
     outcome = expected(device, Condition())
-    found = (differences(device, nodes, outcome, seen) +
+    found = (differences(device, outcome, seen) +
              properties.shortcomings(properties.Judged(seen)))
     fail(f"the boot of: {name}", found, before)

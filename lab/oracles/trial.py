@@ -16,7 +16,7 @@ from lab.oracles import model, properties
 from lab.oracles.conditions import Condition
 from lab.words import lines
 from lab.words.chosen_devices import ABNORMAL, CHOSEN
-from lab.words.device import Device, Node, described
+from lab.words.device import Device, described
 from lab.words.seen import Call, Entries, Seen, as_device
 
 
@@ -49,20 +49,17 @@ def trial(device: Device, condition: Condition | None = None,
     device is still there from the boot before."""
     if not again:
         namespace.build(device)
-    nodes = dict(device.everything())
     before = namespace.look()
     outcome = expected(device, condition or Condition())
     if condition is None:
         booted, calls = boot.boot(), []
     else:
         booted = boot.traced("-e", f"trace={boot.TRACED}", *condition.options(outcome))
-        all_calls = list(boot.calls())
-        calls = boot.pass_of(all_calls)
+        calls = boot.pass_of(list(boot.calls()))
     seen = Seen(before, namespace.look(), *booted, calls)
-    found = differences(device, nodes, outcome, seen)
+    found = differences(device, outcome, seen)
     if condition is not None:
         found += call_differences(outcome, calls)
-        found += properties.foreign_error_texts(all_calls, booted.log)
         tell = condition.name
     fail(tell, found, before)
     return outcome, seen
@@ -123,12 +120,9 @@ def expected(device: Device, condition: Condition) -> model.Outcome:
     return outcome
 
 
-def differences(device: Device, nodes: dict[str, Node], outcome: model.Outcome,
-                seen: Seen) -> list[str]:
-    """Where a boot was not as the model says; `nodes` are the description's as they
-    were before it."""
-    return (log_differences(outcome, seen) + entry_differences(device, seen.after) +
-            touched(device, nodes, outcome, seen))
+def differences(device: Device, outcome: model.Outcome, seen: Seen) -> list[str]:
+    """Where a boot was not as the model says."""
+    return log_differences(outcome, seen) + entry_differences(device, seen.after)
 
 
 def entry_differences(device: Device, entries: Entries) -> list[str]:
@@ -148,16 +142,6 @@ def entry_differences(device: Device, entries: Entries) -> list[str]:
             elif node.kind == "dir" and set(here.names) == set(node.entries):
                 node.entries = {name: node.entries[name] for name in here.names}
     return found
-
-
-def touched(device: Device, nodes: dict[str, Node], outcome: model.Outcome,
-            seen: Seen) -> list[str]:
-    """Entries that were changed or made anew, though no call of the model's boot has
-    to do with them."""
-    now, changed = dict(device.everything()), seen.changed()
-    return [f"{path} was changed or made anew" for path, node in nodes.items()
-            if now.get(path) is node and node not in outcome.changed
-            and path in seen.before and path in seen.after and path in changed]
 
 
 def log_differences(outcome: model.Outcome, seen: Seen | boot.Booted) -> list[str]:
