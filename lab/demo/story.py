@@ -18,7 +18,6 @@ import shutil
 import signal
 import subprocess
 import sys
-import time
 import zoneinfo
 from pathlib import Path
 
@@ -78,14 +77,9 @@ def tell(story: Story):
         call failed last; they need not have to do with the line in which they
         stand.""", screen.DIM)
 
-    seen = story.scene("A quiet boot", """Nothing has happened since. The links name
+    story.scene("A quiet boot", """Nothing has happened since. The links name
         data that fits, so marlin touches nothing: the links and their directory are
         the very ones that they were, to the nanosecond.""")
-    screen.changes(*(
-        {name: identity(entries, path) for name, path in
-         {"zoneinfo": ZONEINFO, "localtime": LOCALTIME, "directory": TIMEZONE}.items()}
-        for entries in (seen.before, seen.after)))
-
     device.choose_zone("Europe/Lisbon")
     story.install("update")
     story.scene("An update is activated", f"""The user has moved to Lisbon, and
@@ -137,7 +131,7 @@ class Story:
         self.names = real_data.names()
         self.year = self.names.year
         self.noon = datetime.datetime(self.year, 2, 1, 12, tzinfo=datetime.timezone.utc)
-        self.endings = []  # of scenes, in the words of the summary
+        self.scenes = 0
         self.facts = []  # as they were found
         self.told = {}  # by make-update and marlin-install, since the last boot
 
@@ -186,8 +180,9 @@ class Story:
                               stdout=subprocess.PIPE)
         return done.returncode, done.stdout.splitlines()
 
-    def scene(self, title: str, words: str) -> Seen:
-        screen.rule(f"{len(self.endings) + 1}  {title}")
+    def scene(self, title: str, words: str):
+        self.scenes += 1
+        screen.rule(f"{self.scenes}  {title}")
         screen.say(words)
         self.make_real()
         before = namespace.look()
@@ -208,9 +203,7 @@ class Story:
         screen.changes(was, found, {row for row in ROWS if ROWS[row] in touched})
         print()
         screen.printed(log)
-        screen.field("exit", f"status {status}")
-        self.endings.append(f"{title:<39}{data_in_use(seen.after):<19}{found['clock']}")
-
+        screen.field("exit", f"status {status}" + "; nothing was touched" * (not touched))
         self.note(f"{title}: exit {status}, foretold {expected}, "
                   + ("touched" if touched else "nothing touched"))
         for line in log:
@@ -218,7 +211,6 @@ class Story:
         for name, before in was.items():
             if before != found[name]:
                 self.note(f"  {name}: {before} -> {found[name]}")
-        return seen
 
     def note(self, fact: str):
         """Keeps what was found, in the same words for the data of every machine."""
@@ -250,11 +242,6 @@ class Story:
         return rows
 
     def summary(self):
-        screen.rule("In short")
-        heading = f"   {'boot':<39}{'data in use':<19}clock"
-        print("\n  " + screen.paint(screen.DIM, heading))
-        for number, ending in enumerate(self.endings, start=1):
-            print(f"  {number}  {ending}")
         if self.facts == FACTS:
             screen.say("All boots ended as lab/demo/facts says.", screen.GREEN)
         else:
@@ -274,24 +261,6 @@ def stands(entries: Entries, path: str) -> str:
         return "none"
     here = entries[path]
     return here.text if here.kind == "link" else f"(a plain {here.kind})"
-
-
-def data_in_use(entries: Entries) -> str:
-    """As "2025b.1.0, system" or "2025c.1.0, update"."""
-    tree = stands(entries, ZONEINFO)
-    if tree == SYSTEM_ZONEINFO:
-        return entries[f"{tree}/+VERSION"].text.strip() + ".1.0, system"
-    if tree.startswith(DOWNLOADS):
-        return tree.removeprefix(DOWNLOADS).partition("/")[0] + ", update"
-    return "none"
-
-
-def identity(entries: Entries, path: str) -> str:
-    if path not in entries:
-        return "none"
-    inode, _, changed = entries[path].identity
-    moment = time.strftime("%H:%M:%S", time.localtime(changed // 10**9))
-    return f"inode {inode}, changed {moment}.{changed % 10**9:09}"
 
 
 def main() -> int:
