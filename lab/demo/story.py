@@ -203,7 +203,9 @@ class Story:
         screen.changes(was, found, {row for row in ROWS if ROWS[row] in touched})
         print()
         screen.printed(log)
-        screen.field("exit", f"status {status}" + "; nothing was touched" * (not touched))
+        screen.field("exit", f"status {status}"
+                     + ("" if touched else "; nothing was touched"))
+
         self.note(f"{title}: exit {status}, foretold {expected}, "
                   + ("touched" if touched else "nothing touched"))
         for line in log:

@@ -1,12 +1,11 @@
 # SPDX-License-Identifier: BSD-2-Clause
-"""usage: lab.proofs.fuzz [--seconds N] [--keep] [TARGET...]
+"""usage: lab.proofs.fuzz [--seconds N] [TARGET...]
 
 Runs the fuzz targets in tests/fuzz, or some of them, with their engine: two at a time,
 each from its seeds and from what earlier runs added to them in build/fuzz/corpus. An
 input that breaks a property is left in build/fuzz/findings.
 
   --seconds N   how long each target runs (default 60)
-  --keep        add to the seeds what reaches more than they do
 
 Exit status: 0 without a finding, 1 with one, 2 for bad use.
 """
@@ -17,7 +16,7 @@ from concurrent.futures import ThreadPoolExecutor
 from pathlib import Path
 
 from lab.carriers.building import build, need, quietly, show_end
-from lab.words.command import Options, number, say, stop
+from lab.words.command import Options, number, say
 from lab.words.places import BUILD, PROJECT
 
 PLACE = BUILD / "fuzz"
@@ -26,76 +25,47 @@ TARGETS = ["version_text", "icu_file_name", "zoneinfo_link", "first_word", "tell
 
 # The format of seeds is told at the head of each file; tests/fuzz/replay.cpp reads it
 # too.
-def escaped(seed: bytes) -> str:
-    text = seed.decode("latin-1").replace("\\", r"\\").replace("\n", r"\n")
-    return '"' + re.sub("[^ -~]", lambda byte: f"\\x{ord(byte[0]):02x}", text) + '"'
-
-
 def unescaped(line: str) -> bytes:
     if not re.fullmatch(r'"([ -\[\]-~]|\\\\|\\n|\\x[0-9a-f]{2})*"', line):
         raise ValueError(f"not a seed: {line}")
     return line[1:-1].encode("ascii").decode("unicode_escape").encode("latin-1")
 
 
-def seeds_file(target: str) -> Path:
-    return PROJECT / "tests/fuzz" / f"{target}.seeds"
-
-
 def unpack_seeds(target: str) -> Path:
     """The directory that the engine reads: a file for each seed."""
-    directory = PLACE / "seeds" / target
+    directory, seeds = PLACE / "seeds" / target, f"tests/fuzz/{target}.seeds"
     shutil.rmtree(directory, ignore_errors=True)
     directory.mkdir(parents=True)
-    for index, line in enumerate(seeds_file(target).read_text("ascii").splitlines()):
+    for index, line in enumerate((PROJECT / seeds).read_text("ascii").splitlines()):
         if not line.startswith("#"):
             (directory / f"{index:04}").write_bytes(unescaped(line))
     return directory
-
-
-def run_engine(target: str, *arguments: str | Path) -> tuple[bool, str]:
-    """Whether the engine ends without a finding, and its output."""
-    log = PLACE / "log" / target
-    status = quietly(log, PLACE / f"tests/fuzz/fuzz_{target}", *arguments, check=False)
-    if status:
-        show_end(log)
-    return status == 0, log.read_text(errors="replace")
 
 
 def fuzz(target: str, seconds: int) -> tuple[bool, int]:
     """Whether there is no finding, and the number of runs."""
     corpus = PLACE / "corpus" / target
     corpus.mkdir(parents=True, exist_ok=True)
-    clean, output = run_engine(
-        target, f"-max_total_time={seconds}", "-max_len=1100", "-timeout=10",
-        "-rss_limit_mb=1024", "-print_final_stats=1",
-        f"-artifact_prefix={PLACE}/findings/{target}-", corpus, unpack_seeds(target))
-    stated = re.search(r"^stat::number_of_executed_units: *(\d+)", output, re.M)
+    log = PLACE / "log" / target
+    status = quietly(
+        log, PLACE / f"tests/fuzz/fuzz_{target}", f"-max_total_time={seconds}",
+        "-max_len=1100", "-timeout=10", "-rss_limit_mb=1024", "-print_final_stats=1",
+        f"-artifact_prefix={PLACE}/findings/{target}-", corpus, unpack_seeds(target),
+        check=False)
+    stated = re.search(r"^stat::number_of_executed_units: *(\d+)",
+                       log.read_text(errors="replace"), re.MULTILINE)
     runs = int(stated[1]) if stated else 0
-    if clean:
-        print(f"fuzz: {target}: no finding in {runs} runs, {seconds} s", flush=True)
-    else:
+    if status:
+        show_end(log)
         say(f"fuzz: {target}: a finding, in {PLACE}/findings")
-    return clean, runs
-
-
-def keep(target: str) -> None:
-    """Adds to the seeds what reaches more than they do."""
-    directory = unpack_seeds(target)
-    merged, _ = run_engine(target, "-merge=1", directory, PLACE / "corpus" / target)
-    if not merged:
-        stop(1, f"{target}: the seeds cannot be merged")
-    seeds = {path.read_bytes() for path in directory.iterdir()}
-    file = seeds_file(target)
-    head = re.match("(?:#.*\n)*", file.read_text("ascii"))[0]
-    lines = [escaped(seed) + "\n" for seed in sorted(seeds)]
-    file.write_text(head + "".join(lines), "ascii")
-    print(f"fuzz: {target}: {len(seeds)} seeds, {sum(map(len, seeds))} bytes")
+    else:
+        print(f"fuzz: {target}: no finding in {runs} runs, {seconds} s", flush=True)
+    return not status, runs
 
 
 def main() -> int:
     options = Options(__doc__)
     options.add_argument("--seconds", type=number, default=60)
-    options.add_argument("--keep", action="store_true")
     options.add_names("targets", TARGETS)
     arguments = options.parse_args()
     targets = arguments.targets
@@ -111,9 +81,6 @@ def main() -> int:
     runs = sum(runs for _, runs in results)
     print(f"fuzz: {len(targets)} targets, {runs} runs, {arguments.seconds} s each:",
           "no finding" if all_clean else "findings", flush=True)
-    if arguments.keep and all_clean:
-        for target in targets:
-            keep(target)
     return 0 if all_clean else 1
 
 
