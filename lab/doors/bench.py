@@ -5,9 +5,9 @@ Measures marlin, as it ships, inside a private device, beside the least that its
 calls can cost: "the floor", lab/bench/floor.c.
 
   --check       what is done without an option: compares instructions, system calls and
-                size with lab/bench/baseline.txt; fails when one has grown by more than
+                size with lab/bench/baseline.json; fails when one has grown by more than
                 3 percent, for calls by a single one
-  --record      writes lab/bench/baseline.txt anew
+  --record      writes lab/bench/baseline.json anew
   --companions  marlin-install with an update of 1 MB, which may take 100 ms beside
                 fsync(2) and 16 MB; marlin-mend, which has to cost less than marlin
 
@@ -28,8 +28,7 @@ from lab.words.places import BUILD
 
 PLACE = BUILD / "bench/static"
 FLOOR = f"{PLACE}/lab/bench/floor_SCENE"
-BASELINE = Path("lab/bench/baseline.txt")
-TOOLCHAIN = ("compiler", "libc", "instrument")
+BASELINE = Path("lab/bench/baseline.json")
 
 
 def output(*command: str) -> str:
@@ -50,70 +49,51 @@ def measured(job: str, *arguments: str):
                              "lab.bench.measure", job, *arguments))
 
 
-def all_figures() -> dict[str, str]:
-    """By name, in the order of the baseline."""
+def all_figures() -> dict:
+    """Of each, what marlin takes and what the floor takes; and by what it was built."""
     from lab.bench.measure import SCENES  # It takes pytest, which main() installs.
     marlin = built(*(f"floor_{scene}" for scene in SCENES))
-    figures = dict(zip(TOOLCHAIN, (
-        "g++ " + output("g++", "-dumpfullversion"),
-        output("getconf", "GNU_LIBC_VERSION"), output("valgrind", "--version"))))
+    figures = {"toolchain": [f"g++ {output('g++', '-dumpfullversion')}",
+                             output("getconf", "GNU_LIBC_VERSION"),
+                             output("valgrind", "--version")]}
     for scene, (floor, own) in measured("counts", FLOOR, marlin).items():
         print(f"{scene}: takes {own[2]} kB, the floor {floor[2]}")
-        for owner, (instructions, calls, _) in (("", own), ("floor.", floor)):
-            figures[f"{owner}instructions.{scene}"] = str(instructions)
-            figures[f"{owner}calls.{scene}"] = str(calls)
-    for owner, file in (("", marlin), ("floor.", FLOOR.replace("SCENE", "quiet"))):
-        figures[f"{owner}size"] = str(os.path.getsize(file))
+        for what, *both in zip(("instructions", "calls"), own, floor):
+            figures[f"{scene} {what}"] = both
+    figures["size"] = [os.path.getsize(file)
+                       for file in (marlin, FLOOR.replace("SCENE", "quiet"))]
     return figures
 
 
 def record():
-    BASELINE.write_text(
-        "# SPDX-License-Identifier: BSD-2-Clause\n"
-        "# What scripts/bench --check compares with; written by --record.\n" +
-        "".join(f"{name} {figure}\n" for name, figure in all_figures().items()))
+    told = (f"  {json.dumps(name)}: {json.dumps(both)}"
+            for name, both in all_figures().items())
+    BASELINE.write_text("{\n" + ",\n".join(told) + "\n}\n")
     print(f"bench: wrote {BASELINE}", file=sys.stderr)
 
 
 def check():
     """The floor stands for everything that is not ours: compiler, C library, instrument
-    and processor. Where one of them differs from the record, the floor shows it, and
-    what is compared is the floor of this run plus what marlin had beyond the floor when
-    it was recorded."""
-    was = dict(line.split(" ", 1) for line in BASELINE.read_text().splitlines()
-               if not line.startswith("#"))
-    now = all_figures()
-    if lacking := sorted(was.keys() ^ now.keys()):
-        stop(1, f"not in the baseline and in this run: {', '.join(lacking)}")
-    differs = [name for name in was if was[name] != now[name]
-               and name.startswith((*TOOLCHAIN, "floor."))]
-    for name in differs:
-        print(f"differs from the record: {name}, {was[name]}, here {now[name]}")
-    if (any(name.startswith(("floor.calls", "floor.size")) for name in differs)
-            and not any(name in TOOLCHAIN for name in differs)):
-        stop(1, "the floor itself has changed; if that is meant: --record")
-    if differs:
-        print("Not the recorded toolchain or processor: what is compared is the floor "
-              "of this run plus the recorded distance from the floor.")
-    grown = shrunk = 0
-    for name in was:
-        if name in TOOLCHAIN or name.startswith("floor."):
-            continue
-        here, floor = int(now[name]), int(now[f"floor.{name}"])
-        expected = int(was[name]) - int(was[f"floor.{name}"]) + floor
+    and processor. What is compared is the floor of this run plus what marlin had beyond
+    the floor when it was recorded."""
+    was, now = json.loads(BASELINE.read_text()), all_figures()
+    if lacking := was.keys() ^ now.keys():
+        stop(1, f"not in the baseline and in this run: {', '.join(sorted(lacking))}")
+    built_by, here_by = was.pop("toolchain"), now["toolchain"]
+    grown = 0
+    for name, (own, floor) in was.items():
+        here, here_floor = now[name]
+        expected = own - floor + here_floor
         percent = 100 * (here - expected) / expected
-        bad = here > expected if name.startswith("calls.") else percent > 3
-        print(f"{name:24} {here:8}, expected {expected:8}, floor {floor:8}  "
+        bad = percent > (0 if name.endswith("calls") else 3)
+        print(f"{name:24} {here:8}, expected {expected:8}, floor {here_floor:8}  "
               f"{percent:+6.2f} %{'  GROWN' if bad else ''}")
         grown += bad
-        shrunk += percent < -3
-    if grown and any(name in TOOLCHAIN for name in differs):
-        stop(77, f"recorded with {was['compiler']} and {was['libc']}, which this "
-             "machine lacks: what grows may be another's code")
+    if grown and built_by != here_by:
+        stop(77, f"recorded with {' and '.join(built_by)}, which this machine lacks: "
+             "what grows may be another's code")
     if grown:
         stop(1, f"{grown} figures have grown; if that is meant: --record")
-    if shrunk and not differs:
-        print("Some have shrunk by more than 3 %: --record keeps the gain.")
 
 
 def companions():

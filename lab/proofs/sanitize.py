@@ -16,8 +16,7 @@ Reports are left in build/asan/findings and build/memcheck/findings.
 import os
 import re
 import shutil
-from collections.abc import Callable
-from dataclasses import dataclass
+from dataclasses import dataclass, field
 from pathlib import Path
 
 from lab.carriers.building import build, locked, need, quietly, show_end, trials
@@ -31,106 +30,84 @@ LEAK = """int main() {
 """
 
 
-def sanitized(reports: str):
-    options = (
-        "detect_leaks=1:detect_stack_use_after_return=1:check_initialization_order=1:"
-        "strict_init_order=1:strict_string_checks=1:print_stacktrace=1:"
-        f"log_path='{reports}'")
-    return {"ASAN_OPTIONS": options, "UBSAN_OPTIONS": options}, []
-
-
-def memchecked(reports: str):
-    # Traced are the test programs and what they boot, not the machine's tools.
-    # "Possibly lost" does not count: so is every exception in flight when a boot ends
-    # abnormally, because the library holds it by its middle. A test's own operator new
-    # stays in force.
-    return {}, [*"""valgrind --quiet --leak-check=full --error-exitcode=99
-        --soname-synonyms=somalloc=nouserintercepts --show-leak-kinds=definite
-        --errors-for-leak-kinds=definite --trace-children=yes
-        --trace-children-skip=/usr/*,/bin/*""".split(),
-                f"--log-file={reports.replace('%', '%%')}.%p"]
-
-
 @dataclass
 class Tool:
-    """One build of the tests, run with one tool, whose reports are files."""
-
+    """One build of the tests, run under one tool, whose reports are files."""
     folder: Path
     preset: str
     option: str  # of the compiler, for a program that leaks
     tests: str
-    watched: Callable[[str], tuple[dict[str, str], list[str]]]  # environment, prefix
+    prefix: list[str] = field(default_factory=list)
+    environment: dict[str, str] = field(default_factory=dict)
 
     def __post_init__(self):
         self.findings, self.log = self.folder / "findings", self.folder / "sanitize.log"
 
-    def run(self) -> int:
-        """Returns how many tests have passed, without a finding."""
-        with locked(self.folder):
-            shutil.rmtree(self.findings, ignore_errors=True)
-            build(self.preset, folder=self.folder)
-            self.findings.mkdir()
-            self.find_a_leak()
-            tests = sum(map(self.passed, sorted(self.folder.glob("tests/*_test"))))
-            self.report()
-        return tests
-
-    def on_device(self, program: Path, *arguments: str) -> int:
-        """A program that is on a private device stays there."""
-        environment, prefix = self.watched(str(self.findings / program.name))
-        return quietly(
+    def watch(self, program: Path, *arguments: str) -> tuple[int, str]:
+        """The status of a program on a private device, and the reports of it."""
+        shutil.rmtree(self.findings, ignore_errors=True)
+        self.findings.mkdir()
+        status = quietly(
             self.log, PROJECT / "scripts/private-device", "--writable", self.folder,
-            "--", *prefix, program, *arguments, check=False,
-            env={**os.environ, **environment})
+            "--", *self.prefix, program, *arguments, check=False,
+            env={**os.environ, **self.environment})
+        return status, "".join(map(read, sorted(self.findings.iterdir())))
+
+    def run(self) -> int:
+        """How many tests have passed, without a finding."""
+        with locked(self.folder):
+            build(self.preset, folder=self.folder)
+            self.find_a_leak()
+            return sum(map(self.passed, sorted(self.folder.glob("tests/*_test"))))
 
     def find_a_leak(self):
         """A tool that says nothing is of use only if it would have said something."""
         source, leak = self.folder / "leak.cpp", self.folder / "leak"
         source.write_text(LEAK)
         quietly(self.log, "g++", self.option, source, "-o", leak)
-        self.on_device(leak)
-        reports = list(self.findings.iterdir())
         if not re.search("leak of 9 byte|9 bytes in 1 blocks are definitely lost",
-                         "".join(map(read, reports))):
+                         self.watch(leak)[1]):
             stop(1, f"a leak made on purpose was not found in {shown(self.folder)}")
-        for report in reports:
-            report.unlink()
 
     def passed(self, program: Path) -> int:
         """Runs the tests of a program and tells how many there were."""
-        status = self.on_device(program, "--gtest_brief=1",
-                                f"--gtest_filter={self.tests}")
+        status, reports = self.watch(program, "--gtest_brief=1",
+                                     f"--gtest_filter={self.tests}")
+        # Lines of the program itself do not count: valgrind's log can get them when a
+        # test closes every descriptor.
+        if found := re.findall(r"(?m)^==\d+==.*|^.*runtime error.*", reports):
+            say("\n".join(found[:200]))
+            stop(1, f"findings in {shown(self.findings)}")
         text = read(self.log)
         passed = re.search(r"PASSED  \] (\d+) tests?\.$", text, re.MULTILINE)
         if status or not passed:
             show_end(self.log)
-            self.report()
             stop(1, f"{program.name} fails")
         print(f"{shown(program)}: {passed[1]} tests", flush=True)
         if re.search(r"\.cpp:\d+: Skipped$", text, re.MULTILINE):
             stop(1, f"{program.name} skips tests")
         return int(passed[1])
 
-    def report(self):
-        """Ends the program with what was found, if anything. Lines of the program
-        itself do not count: valgrind's log can get them when a test closes every
-        descriptor."""
-        found = [line for file in sorted(self.findings.iterdir())
-                 for line in read(file).splitlines()
-                 if re.search(r"^==\d+==|runtime error", line)]
-        if found:
-            say("\n".join(found[:200]))
-            stop(1, f"findings in {shown(self.findings)}")
-
 
 TOOLS = {
     # A sanitizer makes calls of its own.
-    "sanitizers": Tool(BUILD / "asan", "asan", "-fsanitize=address",
-                       "-WholeListOfCalls.*", sanitized),
-    # valgrind itself exceeds limits of file sizes.
+    "sanitizers": Tool(
+        BUILD / "asan", "asan", "-fsanitize=address", "-WholeListOfCalls.*",
+        environment=dict.fromkeys(["ASAN_OPTIONS", "UBSAN_OPTIONS"], (
+            "detect_leaks=1:detect_stack_use_after_return=1:strict_string_checks=1:"
+            "check_initialization_order=1:strict_init_order=1:print_stacktrace=1:"
+            f"log_path='{BUILD}/asan/findings/of'"))),
+    # valgrind itself exceeds limits of file sizes. Traced are test programs and what
+    # they boot, not the machine's tools. "Possibly lost" does not count: so is every
+    # exception in flight when a boot ends abnormally, because the library holds it by
+    # its middle. A test's own operator new stays in force.
     "memcheck": Tool(
-        BUILD / "memcheck", "dev", "-g",
-        "-*CannotBeWrittenWhole*:WholeListOfCalls.*", memchecked),
+        BUILD / "memcheck", "dev", "-g", "-*CannotBeWrittenWhole*:WholeListOfCalls.*",
+        [*"""valgrind --quiet --leak-check=full --error-exitcode=99
+        --soname-synonyms=somalloc=nouserintercepts --show-leak-kinds=definite
+        --errors-for-leak-kinds=definite --trace-children=yes
+        --trace-children-skip=/usr/*,/bin/*""".split(),
+         f"--log-file={BUILD}/memcheck/findings/of".replace("%", "%%") + ".%p"]),
 }
 
 
