@@ -139,6 +139,8 @@ STAGES = {
                      door("package"), door("package", "release")),
     "arm64": Stage("arm64: build without a warning, all tests under qemu-user",
                    "-/115", door("test", "arm64-dev")),
+    "armhf": Stage("armhf: the same with 32 bits, and times of 64",
+                   "-/115", door("test", "armhf-dev")),
     "device": Stage("an emulated device: sequences of boots, power cuts", "-/100",
                     door("device", "--tests")),
     "systems": Stage("real systems boot with the package: the unit holds", "-/360",

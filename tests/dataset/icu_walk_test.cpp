@@ -46,7 +46,7 @@ struct {
 } walk;
 
 struct stat entry_status;
-char* entry_memory;
+FTSENT* last_read;
 
 }  // namespace
 
@@ -58,7 +58,8 @@ FTS* fts_open(char* const* roots, int options,
   EXPECT_EQ(roots[1], nullptr);
   walk.options = options;
   walk.sorted = compare != nullptr;
-  if (walk.open_error == 0) return reinterpret_cast<FTS*>(&walk);
+  void* const opened = &walk;
+  if (walk.open_error == 0) return static_cast<FTS*>(opened);
   errno = walk.open_error;
   return nullptr;
 }
@@ -66,10 +67,9 @@ FTS* fts_open(char* const* roots, int options,
 FTSENT* fts_read(FTS*) {
   if (walk.read == walk.entries.size()) return nullptr;
   const scripted_entry& scripted = walk.entries[walk.read++];
-  std::free(entry_memory);
-  entry_memory = static_cast<char*>(
+  std::free(last_read);
+  FTSENT* const entry = last_read = static_cast<FTSENT*>(
       std::calloc(1, sizeof(FTSENT) + scripted.name.size() + 1));
-  auto* const entry = reinterpret_cast<FTSENT*>(entry_memory);
   std::memcpy(entry->fts_name, scripted.name.c_str(), scripted.name.size() + 1);
   entry->fts_namelen = static_cast<unsigned short>(scripted.name.size());
   entry->fts_level = static_cast<short>(scripted.level);

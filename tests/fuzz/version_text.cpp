@@ -4,6 +4,7 @@
 // digits say, the lines that are printed, and the laws of the ordering. An
 // input is one text as a whole, and up to three texts with "|" between them.
 #include <array>
+#include <cstdint>
 #include <regex>
 #include <stdexcept>
 
@@ -16,9 +17,9 @@ namespace {
 constexpr std::size_t longest_for_regex = 200;
 
 // What a number group stands for; -1 for an empty one, -2 if it does not fit.
-long number_of(std::string_view digits) {
+std::int64_t number_of(std::string_view digits) {
   if (digits.empty()) return -1;
-  long number = 0;
+  std::int64_t number = 0;
   for (const char digit : digits) {
     number = number * 10 + (digit - '0');
     if (number > 2147483647) return -2;
@@ -63,9 +64,9 @@ mln_version parsed(const std::string& text) {
     return version;
   }
   expect(printed.empty(), "a well-formed text prints nothing");
-  const long year = number_of(groups->year);
-  const long major = number_of(groups->major);
-  const long minor = number_of(groups->minor);
+  const std::int64_t year = number_of(groups->year);
+  const std::int64_t major = number_of(groups->major);
+  const std::int64_t minor = number_of(groups->minor);
   expect(fits == (year != -2 && major != -2 && minor != -2),
          "a number is out of range above the largest of 32 bits");
   if (!fits) {
