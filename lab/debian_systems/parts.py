@@ -18,7 +18,8 @@ from lab.words.places import BUILD
 WORK = BUILD / "systems"
 GUEST = Path(__file__).parent / "guest"
 ROOT_PACKAGES = "apparmor,dbus,systemd,systemd-container,systemd-sysv,tzdata,udev"
-SYSVINIT = "sysvinit-core", "initscripts", "sysv-rc", "insserv", "startpar"
+INITS = {"sysvinit": ("sysvinit-core", "initscripts", "sysv-rc", "insserv", "startpar"),
+         "openrc": ("openrc", "librc1", "libeinfo1")}
 # Nobody asks these systems anything, and nobody reads on them.
 LEFT_OUT = [word for place in ("doc", "info", "locale", "man", "lintian")
             for word in (f"--dpkgopt=path-exclude=/usr/share/{place}/*",
@@ -56,7 +57,8 @@ def prepare():
     place, architecture = CHOSEN.place, CHOSEN.processor.architecture
     with qemu.preparing(CHOSEN.processor, place, "build", "demo", "systems",
                         *CHOSEN.packages):
-        qemu.fetch(place / "sysvinit", architecture, *SYSVINIT)
+        for init, names in INITS.items():
+            qemu.fetch(place / init, architecture, *names)
         if not (place / "root.tar").exists():
             say("Making a Debian system, in two minutes or three")
             make_root()

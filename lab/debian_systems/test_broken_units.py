@@ -83,6 +83,13 @@ FAULTS = {
          "marlin.service: read /dev/nvme0n1: done",
          "marlin.service: write /proc/1/oom_score_adj: done",
          "marlin.service: limit core: ")),
+    "no signals under the profile": Fault(
+        test_probe.test_signals_under_the_profile,
+        "sed -i /signal/d usr/share/doc/marlin/examples/apparmor\n",
+        (ENDED + "('signal', 'failed', '11')",)),
+    "a restart": Fault(
+        forged("openrc"), "sed -i '/^stop/,$d' usr/share/doc/marlin/examples/openrc\n",
+        ("changed",)),
     "commands to a console by busybox": Fault(
         forged("busybox"), UNFILTERED, (r"/x\x1b[31m",)),
     "commands to a console by SysV init": Fault(

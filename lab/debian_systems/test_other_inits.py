@@ -1,5 +1,6 @@
 # SPDX-License-Identifier: BSD-2-Clause
-"""Systems that boot without systemd, by the examples for busybox and for SysV init."""
+"""Systems that boot without systemd, by the examples for busybox, SysV init and
+OpenRC."""
 
 import pytest
 
@@ -20,21 +21,49 @@ ln -sfn /usr/lib/lab/busybox usr/sbin/init
 }} >etc/inittab
 """
 # As Debian's packages set it up; the order comes from the scripts' headers.
-SYSV = f"""
-tar -c -C {CHOSEN.place}/sysvinit . | tar -x --keep-directory-symlink
+SCRIPTS = f"""
+unpack() {{
+  tar -c -C {CHOSEN.place}/$1 . | tar -x --keep-directory-symlink
+}}
+unpack sysvinit
 sed 's,:respawn:.*getty .*,:off:,' usr/share/sysvinit/inittab >etc/inittab
 echo 'lab:2:wait:/usr/lib/lab/after' >>etc/inittab
-cp {EXAMPLES}/init-script etc/init.d/marlin
 rm etc/rc?.d/[SK]* etc/init.d/apparmor etc/init.d/dbus etc/init.d/udev  # for time
+"""
+SYSV = f"""{SCRIPTS}
+cp {EXAMPLES}/init-script etc/init.d/marlin
 bwrap --bind . / insserv --default $(find etc/init.d -type f ! -name '.*' -printf '%f ')
 """
-INITS = {"busybox": BUSYBOX, "sysv": SYSV}
+OPENRC = f"""{SCRIPTS}
+unpack openrc
+mkdir -p etc/runlevels/sysinit etc/runlevels/default
+ln -s $(grep -lx '# Default-Start: *S' etc/init.d/* | sed s,^,/,) etc/runlevels/sysinit
+install {EXAMPLES}/openrc etc/init.d/marlin
+ln -s /etc/init.d/marlin etc/runlevels/sysinit
+"""
+INITS = {"busybox": BUSYBOX, "sysv": SYSV, "openrc": OPENRC}
 # How the examples say that it is switched on: the file, what is there, and instead.
 MEND = {"busybox": ("inittab", "(timeout", "(/usr/libexec/marlin-mend; timeout"),
-        "sysv": ("init.d/marlin", "# run /", "run /")}
+        "sysv": ("init.d/marlin", "# run /", "run /"),
+        "openrc": ("init.d/marlin", "# /usr", "/usr")}
+# On a running system: no restart changes a link. What a script says of its status;
+# OpenRC knows of the start at boot, until that is forgotten.
+AGAIN = f"""
+[ -x /etc/init.d/marlin ] || exit 0
+rm {ZONEINFO}
+/etc/init.d/marlin restart
+[ ! -L {ZONEINFO} ] || echo changed >>/run/lab/seen/again
+/etc/init.d/marlin status
+echo $? >>/run/lab/seen/again
+/etc/init.d/marlin zap
+/etc/init.d/marlin status
+echo $? >>/run/lab/seen/again
+"""
+STATUS = {"busybox": "", "sysv": "3\n3\n", "openrc": "0\n3\n"}
 
 
-@pytest.fixture(params=INITS)
+@pytest.fixture(params=["busybox", "sysv",
+                        pytest.param("openrc", marks=pytest.mark.rest)])
 def init(request) -> str:
     return request.param
 
@@ -61,8 +90,9 @@ def test_an_update_and_a_forged_line(init):
     assert seen.text("reader") == "14:00 CEST\n" and update in seen.text(
         "/var/db/timezone/TZVersionDiffRecord")
 
-    seen = here.boot(options=DEVICES)
+    seen = here.boot(AGAIN, DEVICES)
     assert printed(seen) == [] and seen.text("reader") == "14:00 CEST\n"
+    assert seen.text("again") == STATUS[init]
 
 
 @pytest.mark.rest

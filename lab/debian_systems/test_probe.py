@@ -10,7 +10,7 @@ from lab.debian_systems.machine import Seen, System, UNIT, message
 from lab.debian_systems.scene import (ZONE, device, fail, insist, install_update_here,
                                       linked, names)
 from lab.words import lines
-from lab.words.paths import LOCALTIME, RECORD, ZONEINFO
+from lab.words.paths import LOCALTIME, RECORD, SYSTEM_ZONEINFO, ZONEINFO
 
 APPARMOR = "/usr/share/doc/marlin/examples/apparmor"
 # All else is refused: there is nothing else.
@@ -107,6 +107,15 @@ def test_the_probe_is_refused(root):
     fail(seen, found)
 
 
+PROFILE = f"""
+mkdir -p etc/systemd/system/{UNIT}.d
+echo '[Unit]\nAfter=apparmor.service' >etc/systemd/system/{UNIT}.d/order.conf
+rm etc/systemd/system/apparmor.service
+rm -f etc/apparmor.d/[a-z]*.*
+cp .{APPARMOR} etc/apparmor.d/usr.libexec.marlin
+"""
+
+
 @pytest.mark.parametrize("enforced", [True, False], ids=["enforced", "not loaded"])
 def test_a_record_that_is_a_link(enforced):
     """Only the profile forbids to write to what it names, and nothing else."""
@@ -116,11 +125,7 @@ def test_a_record_that_is_a_link(enforced):
         echo kept >.{other}
         ln -s {other} .{RECORD}
         ln -sfn /usr/share/zoneinfo/{ZONE} .{LOCALTIME}
-        mkdir -p etc/systemd/system/{UNIT}.d
-        echo '[Unit]\nAfter=apparmor.service' >etc/systemd/system/{UNIT}.d/order.conf
-        rm etc/systemd/system/apparmor.service
-        rm -f etc/apparmor.d/[a-z]*.*
-        {f"cp .{APPARMOR} etc/apparmor.d/usr.libexec.marlin" if enforced else ""}""")
+        {PROFILE * enforced}""")
     seen = system.boot("dmesg | grep DENIED >/run/lab/seen/denied",
                        "sysctl.kernel.printk_ratelimit=0")
     made = device(active=True, announced=True)
@@ -130,3 +135,32 @@ def test_a_record_that_is_a_link(enforced):
     assert denied == [other] * enforced, seen.text("denied")
     assert seen.text(other) == ("kept\n" if enforced else
                                 f"{names().system}.1.0_{update}")
+
+
+# In marlin's place, what never ends by itself.
+HANGS = f"""
+cp /usr/lib/lab/busybox /usr/libexec/marlin
+cd /run/systemd/system
+grep -v ^Refuse /usr/lib/systemd/system/{UNIT} >hangs.service
+mkdir hangs.service.d
+cat >hangs.service.d/lab.conf <<'END'
+[Service]
+ExecStart=
+ExecStart=@/usr/libexec/marlin sh -c 'while :; do :; done'
+TimeoutStartSec=5s
+END
+systemctl daemon-reload
+systemctl start hangs
+systemctl show --value -p Result,ExecMainStatus,MainPID hangs >/run/lab/seen/hangs
+"""
+
+
+@pytest.mark.rest
+def test_signals_under_the_profile():
+    """An abort is told as one, and systemd ends a marlin that hangs."""
+    seen = System("apparmor-signals", linked(device()) + PROFILE + f"""
+        echo 2147483648a >.{SYSTEM_ZONEINFO}/+VERSION""").boot(HANGS)
+    insist(seen, [lines.NO_DATA, " terminate called after throwing an instance of "
+                  "'std::out_of_range'", "   what():  stoi"], None,
+           ended=("signal", "failed", "6"), failed=[UNIT])
+    assert sorted(seen.text("hangs").split()) == ["0", "15", "timeout"]
