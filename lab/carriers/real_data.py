@@ -5,7 +5,7 @@ Lisbon changes its zone.
 
 Made are a system partition's data, a download, a later one whose ICU data has another
 schema, and what a still later system brings, each a `zoneinfo` tree beside an `icu` or
-`icutz` directory; what make-update told of each; and a program that reads ICU's data.
+`icutz` directory; and a program that reads ICU's data.
 """
 
 import shutil
@@ -47,10 +47,7 @@ def make():
         releases.make_system(made.upgrade, made.icu, upgrade)
         releases.make_system(made.system, made.other_icu, other)
         for name, partition in (("update", system), ("refused", other)):
-            told = releases.output(*releases.tool(
-                "make-update", **releases.given(getattr(made, name)),
-                system=partition, out=work), "--json")
-            (TARGET / f"{name}.json").write_bytes(told)
+            releases.make_update(getattr(made, name), partition, work)
             Path(work, getattr(names(), name)).rename(TARGET / name)
         for partition in (system, upgrade):
             (partition / "zoneinfo.default").rename(partition / "zoneinfo")

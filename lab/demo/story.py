@@ -12,7 +12,6 @@ from __future__ import annotations
 import contextlib
 import datetime
 import difflib
-import json
 import os
 import shutil
 import signal
@@ -21,7 +20,7 @@ import sys
 import zoneinfo
 from pathlib import Path
 
-from lab.carriers import boot, namespace, real_data, releases
+from lab.carriers import boot, namespace, real_data
 from lab.demo import screen
 from lab.words import lines
 from lab.words.device import Device
@@ -133,7 +132,7 @@ class Story:
         self.noon = datetime.datetime(self.year, 2, 1, 12, tzinfo=datetime.timezone.utc)
         self.scenes = 0
         self.facts = []  # as they were found
-        self.told = {}  # by make-update and marlin-install, since the last boot
+        self.told = {}  # by marlin-install, since the last boot
 
     def bring(self, source: str, target: str):
         """Has the device hold what stands somewhere in the data."""
@@ -160,14 +159,8 @@ class Story:
                               capture_output=True, text=True)
         shutil.rmtree(unpacked)
         self.device.root = as_device(namespace.look()).root
-        made = json.loads((real_data.TARGET / f"{data_set}.json").read_text())
-        zones = ", ".join(made["changed"])
-        self.told = {
-            "made": [f"{version} by make-update; differ from the system's: {zones}"],
-            "installer": [(done.stdout or done.stderr).strip()]}
-        if made["changed"] == releases.names_of_lisbon():
-            zones = "all names of Lisbon"
-        self.note(f"{version} differs in {zones}; installer: exit {done.returncode}")
+        self.told = {"installer": [(done.stdout or done.stderr).strip()]}
+        self.note(f"{version}: marlin-install, exit {done.returncode}")
 
     def make_real(self):
         # What is there already, from the boot before, is not made anew.
