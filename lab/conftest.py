@@ -39,6 +39,8 @@ def pytest_addoption(parser):
     parser.addoption("--states", type=int, metavar="N", help="so many random devices")
     parser.addoption("--seed", default="1", help="other random devices")
     parser.addoption("--state", metavar="SEED/N", help="one of the random devices")
+    parser.addoption("--unshrunk", action="store_true",
+                     help="tells of the first life that fails, not the shortest")
     parser.addoption("--story", help="events, with \";\" between them")
     parser.addoption("--preset", action="append", metavar="NAME",
                      help="the package of this preset; may be repeated")
@@ -50,7 +52,9 @@ def pytest_configure(config):
         "run, and --quick takes every so-manieth; option gives the value of an option")
     hypothesis.settings.register_profile(
         "run", max_examples=300 if config.getoption("quick") else 3000, deadline=None,
-        database=None, suppress_health_check=list(hypothesis.HealthCheck))
+        database=None, suppress_health_check=list(hypothesis.HealthCheck),
+        phases=[phase for phase in hypothesis.Phase if phase != hypothesis.Phase.shrink
+                or not config.getoption("unshrunk")])
     hypothesis.settings.load_profile("run")
 
 
@@ -122,6 +126,15 @@ def pytest_sessionfinish(session):
 
 @pytest.hookimpl(trylast=True)
 def pytest_terminal_summary(terminalreporter):
+    if TALLY.get("events"):
+        from lab.proofs.life import EVENTS
+        terminalreporter.line("\nEvents, and how often each kind came next, in the same "
+                              "order:")
+        for one in EVENTS:
+            followed = [TALLY.get(one + PAIR + other, 0) for other in EVENTS]
+            total = sum(followed) + TALLY.get(one + PAIR + "the end", 0)
+            terminalreporter.line(f"{one:17}{total:7}:" + "".join(
+                f"{number:4}" for number in followed))
     for title in never_seen():
         terminalreporter.line(f"FAILED: never seen: {title}")
     terminalreporter.line("figures: " + "; ".join(

@@ -26,14 +26,10 @@ REFUSED = lines.NOT_NEWER % (UPDATE, UPDATE)
 NO_ZONEINFO = (lines.BAD_LINK % "", lines.INVALID_LINKS)
 
 
-def updated(active=False, announced=False) -> Device:
+def updated() -> Device:
     """An update has been downloaded."""
     device = sound_device()
     device.install_update(UPDATE)
-    if active:
-        device.point_links_at(UPDATE)
-    if announced:
-        device.announce(UPDATE)
     return device
 
 
@@ -124,7 +120,9 @@ def test_read_only_disk(scene):
 
 def test_disk_with_a_bad_sector(scene):
     """Where the directory of the links should be there is only an I/O error."""
-    scene.on(updated(active=True))
+    device = updated()
+    device.point_links_at(UPDATE)
+    scene.on(device)
     var = scene.machine.var
     [blocks] = image.debugfs(var, f'blocks "{TIMEZONE.removeprefix("/var")}"')
     bad = ("driver=raw,node-name=var,file.driver=blkdebug,"
@@ -142,7 +140,9 @@ def test_disk_with_a_bad_sector(scene):
 def test_disk_with_a_lost_link(scene):
     """The name of the zoneinfo link leads to an inode that is gone; the disk goes
     read-only on the first error, until it is repaired."""
-    device = scene.on(updated(active=True))
+    device = updated()
+    device.point_links_at(UPDATE)
+    scene.on(device)
     device.put(ZONEINFO, Node("something else"))
     var = scene.machine.var
     image.debugfs(var, f'clri "{ZONEINFO.removeprefix("/var")}"', write=True)

@@ -23,9 +23,10 @@ from lab.arm64_device.machine import Console, Machine, plain, shown_links
 from lab.carriers import image
 from lab.oracles import model
 from lab.oracles.installer import HIDDEN, announced, below
+from lab.oracles.sets import link, mixed, names_of, needed
 from lab.oracles.trial import log_differences
 from lab.proofs import life
-from lab.proofs.life import RELEASES, link, mixed, names_of, needed, update_name
+from lab.proofs.life import RELEASES, update_name
 from lab.words.paths import (DOWNLOADS, FORMER_ZONEINFO, ICUTZ, LEGACY_ICUTZ, LOCALTIME,
                              OLD_ICU, RECORD, SYSTEM_ZONEINFO, TIMEZONE, TZ_LATEST,
                              ZONEINFO, update_path)

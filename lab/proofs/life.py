@@ -16,6 +16,7 @@ import copy
 import errno
 import fcntl
 import os
+import re
 import struct
 import subprocess
 from itertools import pairwise
@@ -30,6 +31,8 @@ from lab.oracles import model, properties
 from lab.oracles.conditions import Condition
 from lab.oracles.installer import (BUSY, DONE, FAILED, NOT_NEWER, PROGRAM, announced,
                                    below, hidden, put_update)
+from lab.oracles.sets import (is_due, is_welcome, link, mixed, names_of, needed,
+                              set_of, whole)
 from lab.oracles.trial import entry_differences, trial
 from lab.proofs import status
 from lab.words.device import Device
@@ -124,30 +127,6 @@ OFFSETS = {zone(sign * (offset(release) + system)): sign * (offset(release) + sy
            for system in (0, 1800)}
 
 
-def link(entries: Entries, path: str) -> str:
-    here = entries.get(path)
-    return here.text if here and here.kind == "link" else ""
-
-
-def needed(entries: Entries) -> set[str]:
-    """The names of sets that a link leads into, by its text."""
-    targets = [link(entries, path) for path in (ZONEINFO, ICUTZ, LOCALTIME, TZ_LATEST,
-                                                LEGACY_ICUTZ)]
-    return {target.removeprefix(DOWNLOADS).split("/")[0] for target in targets
-            if target.startswith(DOWNLOADS)}
-
-
-def mixed(entries: Entries) -> bool:
-    """Whether the two links are of different data."""
-    tree = properties.data_set_of(link(entries, ZONEINFO))
-    icu = entries.get(ICUTZ)
-    if not icu and properties.Sight(entries).leads_somewhere(LEGACY_ICUTZ):
-        icu = entries[LEGACY_ICUTZ]
-    if tree is None or icu and icu.kind != "link":
-        return False
-    return icu is not None if tree == "" else not icu or icu.text != f"{tree}/icutz"
-
-
 def is_a_directory(entries: Entries, path: str) -> bool:
     return path in entries and entries[path].kind == "dir"
 
@@ -185,7 +164,8 @@ class Troubled(Condition):
 
 
 class Life:
-    """One device; the names of the events are methods, and give what must not be."""
+    """One device. What our programs do are methods, named as the events, that give what
+    must not be; the other events are somebody's hand."""
 
     def __init__(self, count=lambda title: None):
         self.count, self.story, self.last_line = count, [], ""
@@ -195,7 +175,7 @@ class Life:
         device.choose_zone("Europe/Paris")
         device.directory(INCOMING.rstrip("/"))
         namespace.build(device)
-        self.system(None, "2023c", "44l")
+        install_system("2023c", "44l")
 
     def live(self, events: list[str]):
         for text in events:
@@ -208,7 +188,12 @@ class Life:
         before = namespace.look()
         verb, *words = text.split()
         try:
-            found = "\n  ".join(getattr(self, verb)(before, *words))
+            if program := getattr(self, verb, None):
+                found = "\n  ".join(program(before, *words))
+            else:
+                with contextlib.suppress(OSError):
+                    by_hand(verb, *words)
+                found = ""
         except pytest.fail.Exception as failed:
             found = failed.msg
         if found:
@@ -319,12 +304,17 @@ class Life:
         if told.ending == DONE and goes and announced(after):
             found.append("it is still announced")
         prunes = options == ("--prune",) or options == ("--settle",) and in_use
-        for name in set(names_of(before)) - set(names_of(after)):
-            if not prunes or name in needed(before):
+        for name in names_of(before):
+            stays = not prunes or name in needed(before) or is_due(before, name)
+            if stays and name not in names_of(after):
                 found.append(f"{name} was deleted")
+            elif not stays and name in names_of(after) and told.ending == DONE and (
+                    not link(before, update_path(name))):
+                found.append(f"{name} was not pruned")
         return found
 
     def run_tool(self, words, trouble: tuple[str, ...]) -> Booted:
+        self.calls = []
         if not trouble:
             return boot.run(PROGRAM, *words)
         kind, *arguments = trouble
@@ -335,7 +325,19 @@ class Life:
             options = boot.failing(family(arguments[0]), errno.EIO, arguments[1])
         else:
             options = boot.killing(f"?{family(arguments[0])}", int(arguments[1]))
-        return boot.traced(*options, command=[PROGRAM, *words])
+        told = boot.traced(*options, command=[PROGRAM, *words])
+        self.calls = [] if kind == "kill" else list(boot.calls())
+        return told
+
+    def unsynced(self) -> list[str]:
+        """What a tool that was traced did before the disk had what it builds upon: a
+        rename after a write, or another rename; or it ended after a change."""
+        letters = {"write": "w", "rename": "r", "unlink": "u", "fsync": "s"}
+        done = "".join(letters.get(call.name, "") for call in self.calls
+                       if not call.error)
+        installs = "w" in done
+        too_early = re.search("w[^s]*r|r[^s]*r|r[^s]*$" if installs else "[ru]$", done)
+        return [f"it did not wait for the disk: {done}"] * bool(too_early)
 
     def of_the_tool(self, before, after, told, words, trouble) -> list[str]:
         """What no run of the installer may do."""
@@ -348,6 +350,8 @@ class Life:
                 found.append(f"{name}, which is needed, is not as it was")
         if told.ending == "killed":
             return found
+        if told.ending == DONE:
+            found += self.unsynced()
         if told.ending not in (DONE, FAILED, BUSY, NOT_NEWER):
             found.append(f"it ends with {told.ending}")
         # What makes a write fail loses the line; an audit tells it in its table.
@@ -356,17 +360,18 @@ class Life:
         if told.log.count("\n") not in lines:
             found.append(f"{told.ending}: {told.log!r}")
         cleans_up = told.ending == DONE and not trouble and "--audit" not in words
-        if cleans_up and hidden_of(after) and after[PLACES["tz"]].mode == 0o755:
-            found.append(f"left behind: {hidden_of(after)}")
+        if cleans_up and hidden(after) and after[PLACES["tz"]].mode == 0o755:
+            found.append(f"left behind: {hidden(after)}")
         return found
 
     def install(self, before: Entries, release: str, kind="", *more: str) -> list[str]:
         name = update_name(release)
+        path = update_path(name)
         trouble = (kind, *more) if more else ()
         source = self.source(release, kind)
         words = {"forced": ["--force"], "verified": ["--verify", "/bin/true"],
                  "refused": ["--verify", "/bin/false"]}.get(kind, []) + [source]
-        whole = below(namespace.look(), source)
+        update = below(namespace.look(), source)
         if kind == "locked":
             told = self.while_locked(words)
         elif kind == "twice":
@@ -379,20 +384,24 @@ class Life:
         self.last_line = told.log
         found = [line for line in self.of_the_tool(before, after, told, words, trouble)
                  if not line.startswith(f"{name}, which is needed")
-                 or below(after, update_path(name)) != whole]
-        is_announced = announced(after) == update_path(name)
-        # What is in use, and was lost or damaged, is only put back.
-        put_back = name in needed(before) and announced(after) == announced(before)
+                 or below(after, path) != update]
+        is_whole = below(after, path) == update and after[path].mode == 0o755
         if told.ending == DONE:
-            if not (is_announced or put_back) or (
-                    below(after, update_path(name)) != whole):
+            # What is in use, and was lost or damaged, is only put back.
+            put_back = set_of(before, ZONEINFO) == name
+            if announced(after) != (announced(before) if put_back else path) or (
+                    not is_whole):
                 found.append(f"{name} is not announced, or not whole")
             if kind in ("damaged", "incomplete", "misnamed", "refused", "locked"):
                 found.append(f"an update that is {kind} was installed")
+            if kind != "forced" and not is_welcome(before, name):
+                found.append("an update that is not newer was installed")
         elif announced(after) != announced(before) and not (
-                trouble and is_announced
-                and below(after, update_path(name)) == whole):
+                trouble and announced(after) == path and is_whole):
             found.append(f"announced is {announced(after)}")
+        if told.ending == NOT_NEWER and is_welcome(before, name) or (
+                "is in use or announced" in told.log and not whole(before, name)):
+            found.append(f"it was refused: {told.log}")
         for other in set(names_of(before)) - set(names_of(after)):
             found.append(f"{other} was deleted")
         self.count(f"installations that end with {told.ending}")
@@ -435,70 +444,6 @@ class Life:
                  for each in running]
         return min(ended)  # by status, of which 0 is the first
 
-    # --- Hands ---
-
-    def zone(self, before, name: str):
-        replace(LOCALTIME)
-        os.symlink(f"{ZONEINFO}/{name}", LOCALTIME)
-        return []
-
-    def system(self, before, release: str, schema: str):
-        """The system partition of another release."""
-        device = Device()
-        device.file(f"{SYSTEM_ZONEINFO}/+VERSION", f"{release}\n")
-        for name, sign in SIGNS:
-            device.file(f"{SYSTEM_ZONEINFO}/{name}",
-                        zone(sign * (offset(release) + 1800)))
-        device.file(f"{SYSTEM_ICU}/icutzformat.txt", f"{schema}\n")
-        namespace.empty("/usr/share")
-        namespace.build_below("/usr/share", device.find("/usr/share"), exists=True)
-        return []
-
-    def legacy(self, before, what: str):
-        if what == "icutz":
-            replace(LEGACY_ICUTZ)
-            os.symlink(update_path(update_name("2024a")) + "/icutz", LEGACY_ICUTZ)
-        elif what == "icu":
-            os.makedirs(OLD_ICU, exist_ok=True)
-        else:
-            replace(LOCALTIME)
-            os.symlink(f"{FORMER_ZONEINFO}/Europe/Paris", LOCALTIME)
-        return []
-
-    def lose(self, before, what: str):
-        replace(place(what))
-        return []
-
-    def bend(self, before, what: str, to: str):
-        target = update_path(update_name(to)) if to in RELEASES else to
-        replace(place(what))
-        os.symlink(target, place(what))
-        return []
-
-    def file(self, before, what: str):
-        with contextlib.suppress(OSError):
-            replace(place(what))
-            with open(place(what), "x"):
-                pass
-        return []
-
-    def directory(self, before, what: str):
-        with contextlib.suppress(OSError):
-            replace(place(what))
-            os.mkdir(place(what), 0o755)
-        return []
-
-    def mode(self, before, what: str, mode: str):
-        with contextlib.suppress(OSError):
-            if not os.path.islink(place(what)):
-                os.chmod(place(what), int(mode, 8))
-        return []
-
-    def damage(self, before, release: str):
-        with contextlib.suppress(OSError):
-            os.truncate(f"{place(release)}/zoneinfo/Europe/Paris", 30)
-        return []
-
     # --- The end ---
 
     def end(self, before: Entries) -> list[str]:
@@ -533,21 +478,62 @@ def family(call: str) -> str:
             "write": "write"}.get(call, f"{call},?{call}at")
 
 
+# --- Hands ---------------------------------------------------------------------------
+
+
+def by_hand(*event: str):
+    """As far as it can be done; what is in the way stays."""
+    match event:
+        case "zone", name:
+            relink(LOCALTIME, f"{ZONEINFO}/{name}")
+        case "system", release, schema:
+            install_system(release, schema)
+        case "legacy", "icutz":
+            relink(LEGACY_ICUTZ, place("2024a") + "/icutz")
+        case "legacy", "icu":
+            os.makedirs(OLD_ICU)
+        case "legacy", "localtime":
+            relink(LOCALTIME, f"{FORMER_ZONEINFO}/Europe/Paris")
+        case "lose", what:
+            remove(place(what))
+        case "bend", what, to:
+            relink(place(what), place(to) if to in RELEASES else to)
+        case "file", what:
+            remove(place(what))
+            open(place(what), "x").close()
+        case "directory", what:
+            remove(place(what))
+            os.mkdir(place(what), 0o755)
+        case "mode", what, mode:
+            if not os.path.islink(place(what)):
+                os.chmod(place(what), int(mode, 8))
+        case "damage", release:
+            os.truncate(f"{place(release)}/zoneinfo/Europe/Paris", 30)
+        case _:
+            raise ValueError(f"no such event: {' '.join(event)}")
+
+
+def install_system(release: str, schema: str):
+    """The system partition of another release."""
+    device = Device()
+    device.file(f"{SYSTEM_ZONEINFO}/+VERSION", f"{release}\n")
+    for name, sign in SIGNS:
+        device.file(f"{SYSTEM_ZONEINFO}/{name}", zone(sign * (offset(release) + 1800)))
+    device.file(f"{SYSTEM_ICU}/icutzformat.txt", f"{schema}\n")
+    namespace.empty("/usr/share")
+    namespace.build_below("/usr/share", device.find("/usr/share"), exists=True)
+
+
 def place(what: str) -> str:
     return PLACES.get(what) or update_path(update_name(what))
 
 
-def names_of(entries: Entries) -> list[str]:
-    tz = entries.get(DOWNLOADS.rstrip("/"))
-    return [name for name in tz.names if not name.startswith(".")] if tz else []
+def relink(path: str, target: str):
+    remove(path)
+    os.symlink(target, path)
 
 
-def hidden_of(entries: Entries) -> list[str]:
-    return hidden(entries) if DOWNLOADS.rstrip("/") in entries else []
-
-
-def replace(path: str):
-    """Nothing stands there any more, if it can be removed."""
+def remove(path: str):
     with contextlib.suppress(OSError):
         if os.path.isdir(path) and not os.path.islink(path):
             os.chmod(path, 0o700)
@@ -560,34 +546,41 @@ def replace(path: str):
 # --- The lives -----------------------------------------------------------------------
 
 
-STORIES = {  # two that were faults, and what an updater does at any time
+STORIES = {  # those that were faults, and what an updater does at any time
     "a lost set comes back": "install 2024b; boot; lose 2024b; install 2024b; boot",
     "a zone that exists nowhere": "zone Mars/Base; install 2024b; boot",
+    "a withdrawn set can be announced again":
+        "install 2024a; boot; install 2024b; tool --withdraw; tool --prune; "
+        "bend tz_latest 2024b; boot",
+    "what is in use is only put back":
+        "install 2024b; boot; tool --withdraw; damage 2024b; install 2024b; boot",
+    "what is announced can be put back": "install 2024b; damage 2024b; install 2024b",
     "an update that waits": "install 2024a; boot; install 2025a; tool --settle; boot",
 }
 
 
 def lives(option):
+    """Stories, or the seeds and the numbers of random lives."""
     if option("story"):
-        return [option("story")]
-    return [*STORIES.values(), *range(2 if option("quick") else 100)]
+        return [(option("story"), 1)]
+    return [(story, 1) for story in STORIES.values()] + (
+        [(0, 30), (1, 30)] if option("quick") else [(each, 100) for each in range(29)])
 
 
-@pytest.mark.cases("number", lives)
-def test_a_life(number, count):
-    if isinstance(number, str):
-        return Life(count).live([text.strip() for text in number.split(";")])
+@pytest.mark.cases("start, number", lives)
+def test_a_life(start, number, count):
+    if isinstance(start, str):
+        return Life(count).live([text.strip() for text in start.split(";")])
 
-    @seed(number)
-    @settings(max_examples=25, database=None)
+    @seed(start)
+    @settings(max_examples=number, database=None)
     @given(st.lists(st.one_of([st.sampled_from(texts) for texts in EVENTS.values()]),
                     min_size=40, max_size=40))
     def live(events):
-        for text in events:
-            count("events")
-            count(f"of them {KINDS[text]}")
-        for one, other in pairwise(events):
-            count(f"{KINDS[one]}, then {KINDS[other]}")
+        kinds = [KINDS[text] for text in events]
+        count("events", len(kinds) - kinds.count("wait"))
+        for one, other in pairwise([*kinds, "the end"]):
+            count(f"{one}, then {other}")
         Life(count).live(events)
 
     live()
