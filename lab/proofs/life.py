@@ -144,6 +144,14 @@ HOPELESS = {  # what an installation and a boot cannot mend: somebody has to rem
 }
 
 
+def hopeless(entries: Entries) -> list[str]:
+    return [why for why, holds in HOPELESS.items() if holds(entries)]
+
+
+def schema_of_system(entries: Entries) -> str:
+    return entries[f"{SYSTEM_ICU}/icutzformat.txt"].text.strip()
+
+
 class Troubled(Condition):
     """Calls of one kind in a boot, told by their turn, fail; or all from then on."""
 
@@ -168,7 +176,7 @@ class Life:
     must not be; the other events are somebody's hand."""
 
     def __init__(self, count=lambda title: None):
-        self.count, self.story, self.last_line = count, [], ""
+        self.count, self.story = count, []
         device = Device()
         device.directory(DOWNLOADS.rstrip("/"))
         device.point_links_at(None)
@@ -381,7 +389,6 @@ class Life:
         namespace.empty(source)
         os.rmdir(source)
         after = namespace.look()
-        self.last_line = told.log
         found = [line for line in self.of_the_tool(before, after, told, words, trouble)
                  if not line.startswith(f"{name}, which is needed")
                  or below(after, path) != update]
@@ -399,9 +406,13 @@ class Life:
         elif announced(after) != announced(before) and not (
                 trouble and announced(after) == path and is_whole):
             found.append(f"announced is {announced(after)}")
-        if told.ending == NOT_NEWER and is_welcome(before, name) or (
-                "is in use or announced" in told.log and not whole(before, name)):
-            found.append(f"it was refused: {told.log}")
+        stays = name in needed(before) and whole(before, name)
+        if told.ending == DONE and stays:
+            found.append(f"{name}, which is needed, was replaced")
+        schema = {"": "44l", "verified": "44l", "schema": "45l"}.get(kind)
+        if told.ending != DONE and schema == schema_of_system(before) and not (
+                stays or hopeless(before)) and is_welcome(before, name):
+            found.append(f"it cannot be installed: {told.log}")
         for other in set(names_of(before)) - set(names_of(after)):
             found.append(f"{other} was deleted")
         self.count(f"installations that end with {told.ending}")
@@ -449,18 +460,16 @@ class Life:
     def end(self, before: Entries) -> list[str]:
         """Whatever happened: one sound installation and one boot put the newest update
         in use, and the next changes nothing. Where that cannot be, it is told."""
-        schema = before[f"{SYSTEM_ICU}/icutzformat.txt"].text.strip()
-        hopeless = [why for why, holds in HOPELESS.items() if holds(before)]
-        for why in hopeless:
+        for why in hopeless(before):
             self.count(f"lives that end hopelessly: {why}")
-        found = self.install(before, NEWEST, "schema" if schema == "45l" else "")
+        found = self.install(before, NEWEST, "schema" * (
+            schema_of_system(before) == "45l"))
         after = namespace.look()
         path = update_path(update_name(NEWEST))
-        if not found and announced(after) != path:
-            return [] if hopeless else ["the newest update cannot be installed: "
-                                        + self.last_line]
+        if announced(after) != path:
+            return found
         found += self.undisturbed(after)
-        if hopeless:
+        if hopeless(before):
             return found
         booted = namespace.look()
         if link(booted, ZONEINFO) != f"{path}/zoneinfo":
@@ -554,7 +563,11 @@ STORIES = {  # those that were faults, and what an updater does at any time
         "bend tz_latest 2024b; boot",
     "what is in use is only put back":
         "install 2024b; boot; tool --withdraw; damage 2024b; install 2024b; boot",
-    "what is announced can be put back": "install 2024b; damage 2024b; install 2024b",
+    "each link keeps its set": "install 2022b forced; " + "; ".join(
+        f"bend {name} 2022b; tool --prune; lose {name}"
+        for name in ("tz_latest", "zoneinfo", "icutz", "legacy", "localtime")),
+    "a set in use is not replaced": "install 2024b; boot; install 2024b forced",
+    "what is announced is put back": "install 2024b; damage 2024b; install 2024b",
     "an update that waits": "install 2024a; boot; install 2025a; tool --settle; boot",
 }
 
