@@ -31,7 +31,7 @@ from lab.oracles import model, properties
 from lab.oracles.conditions import Condition
 from lab.oracles.installer import (BUSY, DONE, FAILED, NOT_NEWER, PROGRAM, announced,
                                    below, hidden, put_update)
-from lab.oracles.sets import (is_due, is_welcome, link, mixed, names_of, needed,
+from lab.oracles.sets import (fits, is_due, is_welcome, link, mixed, names_of, needed,
                               set_of, whole)
 from lab.oracles.trial import entry_differences, trial
 from lab.proofs import status
@@ -80,8 +80,8 @@ EVENTS = {  # by kind, each drawn as often as the others
     "boot, log lost": ["boot deaf"],
     "install": all_of("install {}", RELEASES),
     "odd install": all_of("install {} {}", RELEASES, [
-        "damaged", "incomplete", "misnamed", "schema", "forced", "refused", "verified",
-        "locked", "twice"]),
+        "damaged", "incomplete", "misnamed", "lacking", "schema", "forced", "refused",
+        "verified", "locked", "twice"]),
     "troubled install": all_of("install {} {}", RELEASES, TROUBLES),
     "withdraw": ["tool --withdraw"],
     "prune": ["tool --prune"],
@@ -146,6 +146,12 @@ HOPELESS = {  # what an installation and a boot cannot mend: somebody has to rem
 
 def hopeless(entries: Entries) -> list[str]:
     return [why for why, holds in HOPELESS.items() if holds(entries)]
+
+
+def sets_paris(entries: Entries) -> bool:
+    here = properties.Sight(entries).find(LOCALTIME)[1]
+    return bool(here) and here.kind == "file" and link(
+        entries, LOCALTIME).endswith("/Europe/Paris")
 
 
 def schema_of_system(entries: Entries) -> str:
@@ -409,6 +415,10 @@ class Life:
         stays = name in needed(before) and whole(before, name)
         if told.ending == DONE and stays:
             found.append(f"{name}, which is needed, was replaced")
+        if told.ending == DONE and not fits(properties.Sight(after), name):
+            found.append(f"the schema of {name} is not the system's")
+        if told.ending == DONE and kind == "lacking" and sets_paris(before):
+            found.append(f"{name} lacks the zone that the device is set to")
         schema = {"": "44l", "verified": "44l", "schema": "45l"}.get(kind)
         if told.ending != DONE and schema == schema_of_system(before) and not (
                 stays or hopeless(before)) and is_welcome(before, name):
@@ -432,8 +442,14 @@ class Life:
         if kind == "damaged":
             with open(paris, "r+b") as file:
                 file.write(b"XXXX")
-        elif kind == "incomplete":
+        elif kind in ("incomplete", "lacking"):
             os.unlink(paris)
+        if kind == "lacking":
+            with open(f"{source}/SHA256SUMS", "r+") as file:
+                rest = [line for line in file if "Paris" not in line]
+                file.seek(0)
+                file.writelines(rest)
+                file.truncate()
         return source
 
     def while_locked(self, words) -> Booted:
@@ -561,6 +577,15 @@ STORIES = {  # those that were faults, and what an updater does at any time
     "a withdrawn set can be announced again":
         "install 2024a; boot; install 2024b; tool --withdraw; tool --prune; "
         "bend tz_latest 2024b; boot",
+    "what is older than that in use goes":
+        "install 2024a; boot; install 2024b; boot; tool --settle; "
+        "install 2025a; boot; tool --withdraw; tool --prune",
+    "settling keeps what is newer":
+        "install 2024a; boot; install 2024b; bend tz_latest 2024a; tool --settle",
+    "an older set helps where the newer is lost":
+        "install 2024b; boot; lose 2024b; install 2024a; boot; boot",
+    "one at a time": "install 2024b locked; install 2024b; boot",
+    "an update lacks the zone": "install 2024b lacking; zone Mars/Base; install 2024b",
     "what is in use is only put back":
         "install 2024b; boot; tool --withdraw; damage 2024b; install 2024b; boot",
     "each link keeps its set": "install 2022b forced; " + "; ".join(
