@@ -125,6 +125,14 @@ def differences(device: Device, outcome: model.Outcome, seen: Seen) -> list[str]
     return log_differences(outcome, seen) + entry_differences(device, seen.after)
 
 
+def left(device: Device, ending: str, outcome: model.Outcome) -> list[str]:
+    """Where a boot did not end, or leave the real device, as the model's."""
+    found = entry_differences(device, namespace.look())
+    if ending != outcome.ending:
+        found.append(f"ended with {ending}, expected {outcome.ending}")
+    return found
+
+
 def entry_differences(device: Device, entries: Entries) -> list[str]:
     """Where the real device is not as described. The description learns again in
     which order directories are listed."""

@@ -15,10 +15,10 @@ from collections.abc import Iterator
 
 import pytest
 
-from lab.carriers import boot, namespace
+from lab.carriers import boot
 from lab.oracles import model
 from lab.oracles.conditions import Killed
-from lab.oracles.trial import entry_differences, fail, real, recovers, undisturbed
+from lab.oracles.trial import fail, left, real, recovers, undisturbed
 from lab.proofs.windows import window_of
 from lab.words.chosen_devices import CHOSEN
 from lab.words.device import Device
@@ -66,10 +66,9 @@ def pairs(_):
 def killed(device: Device, kill: Killed, start: Entries, whole_log="") -> model.Outcome:
     """A boot that is killed, really and in the model."""
     outcome = model.boot(device, killed_before=kill.killed_before)
+    outcome.ending = "killed"  # perhaps behind the pass
     booted = boot.traced(*kill.options(outcome))
-    found = entry_differences(device, namespace.look())
-    if booted.ending != "killed":
-        found.append(f"ended with {booted.ending}")
+    found = left(device, booted.ending, outcome)
     if whole_log and not whole_log.startswith(booted.log):
         found.append(f"printed {booted.log!r}")
     fail(kill.name, found, start)
@@ -85,13 +84,14 @@ def test_a_kill(name, kill, count):
     device, start = real(name)
     outcome = killed(device, kill, start, undisturbed(name).log)
     recovers(name, device, start)
-    left = device.contents()
-    for path in sorted(left.keys() | usual.keys()):
-        if left.get(path) != usual.get(path):
-            window = window_of(path, left.get(path), usual.get(path), outcome.calls)
+    there = device.contents()
+    for path in sorted(there.keys() | usual.keys()):
+        was, now = usual.get(path), there.get(path)
+        if now != was:
+            window = window_of(path, now, was, outcome.calls)
             if not window:
-                fail(kill.name, [f"leaves {path} as {left.get(path)!r} for good, "
-                                 f"not as {usual.get(path)!r}"], start)
+                fail(kill.name, [f"leaves {path} as {now!r} for good, not as {was!r}"],
+                     start)
             count(f"kills leave {window}")
 
 

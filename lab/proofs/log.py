@@ -1,11 +1,9 @@
 # SPDX-License-Identifier: BSD-2-Clause
-"""Every chosen device boots with a log that is gone: standard error closed, full,
-limited in its size, read-only, a pipe whose reader is gone or that takes no more, and
-descriptors 0 to 2 closed at start in every combination; or with a log that fails in the
-middle: it takes only a part of a line, or not the first, second or third line, or none
-from the second on. The pass runs to its end and leaves the same device as with a log,
-no line ever lands in a file of the device, and the lines that were not hit are in the
-log. Where files are limited in their size the record is empty.
+"""Every chosen device boots with a log that is gone: closed, full, limited in its size,
+read-only, without a reader; or with one that fails in the middle: it takes only a part
+of a line, or not the first, second or third line, or none from the second on. The pass
+runs to its end and leaves the same device as with a log, no line ever lands in a file
+of the device, and the lines that were not hit are in the log.
 
 And with a log that is there every line reaches it whole, in one write. That goes for
 lines of up to BUFSIZ bytes, 8192 with the GNU C library; a longer one takes several.
@@ -21,7 +19,7 @@ import pytest
 
 from lab.carriers import boot, namespace
 from lab.oracles import model
-from lab.oracles.trial import entry_differences, fail, real, undisturbed
+from lab.oracles.trial import fail, left, real, undisturbed
 from lab.words import lines
 from lab.words.chosen_devices import CHOSEN
 from lab.words.device import decoded
@@ -104,11 +102,8 @@ def test_a_lost_log(name, log):
     ending = boot.ending_of(boot.spawn([*limit, boot.PROGRAM], at_start))
     for descriptor in {null, *at_start.values()} - {None}:
         os.close(descriptor)
-    after = namespace.look()
-    found = entry_differences(device, after)
-    if ending != outcome.ending:
-        found.append(f"ended with {ending}, expected {outcome.ending}")
-    found += [f"a line landed in {path}" for path, here in after.items()
+    found = left(device, ending, outcome)
+    found += [f"a line landed in {path}" for path, here in namespace.look().items()
               if "marlin" in here.text or "terminate" in here.text]
     fail(log, found, before)
 
@@ -132,21 +127,19 @@ def test_lines_in_one_write_each(name, count):
         fail("write by write", [repr(writes)], before)
 
 
-@pytest.mark.cases("name, what, options, hit, left", with_names)
-def test_a_log_that_fails_in_the_middle(name, what, options, hit, left):
+@pytest.mark.cases("name, what, options, hit, kept", with_names)
+def test_a_log_that_fails_in_the_middle(name, what, options, hit, kept):
     """The error texts of the lines that are left may have become those of the log's own
     failure."""
     device, before = real(name)
     outcome = boot_without_record(device, any(call.name == "write" for call in hit))
     booted = boot.traced(*options)
-    found = entry_differences(device, namespace.look())
-    if booted.ending != outcome.ending:
-        found.append(f"ended with {booted.ending}, expected {outcome.ending}")
+    found = left(device, booted.ending, outcome)
     injected = [call.number for call in boot.calls() if call.injected]
     if injected != [call.number for call in hit]:
         found.append(f"hit were the writes {injected}")
     printed = [line.rpartition(": ")[0] for line in booted.log.splitlines()]
-    if (printed[:len(left)] != left or
-            len(printed) > len(left) and outcome.ending != "abort"):
-        found.append(f"printed {booted.log!r}, expected {left}")
+    if (printed[:len(kept)] != kept or
+            len(printed) > len(kept) and outcome.ending != "abort"):
+        found.append(f"printed {booted.log!r}, expected {kept}")
     fail(what, found, before)

@@ -54,8 +54,8 @@ def reset_for_the_schema():
     return device
 
 
+# Why each is open, and what stays: docs/decisions.md.
 WINDOWS = {
-    # The next boot finds the update active, so not newer, and never links the rest.
     "an update's zoneinfo without its ICU data": Window(
         ICUTZ, ("symlink", ZONEINFO), ("symlink", ICUTZ),
         lambda left, usual, _: usual is not None, [
@@ -63,22 +63,17 @@ WINDOWS = {
                     {ZONEINFO: TREE}, *STAYS),
             Example(devices.activation_after_an_update, ("unlink", ICUTZ),
                     {ZONEINFO: TREE, ICUTZ: OLD_ICU, RECORD: OLD_RECORD}, *STAYS)]),
-    # The next boot accepts links at the system partition, whatever "icutz" names: even
-    # ICU data of a schema that the system cannot read.
     "the system's zoneinfo with an update's ICU data": Window(
         ICUTZ, ("symlink", ZONEINFO), ("unlink", ICUTZ),
         lambda left, usual, _: left is not None and usual is None, [
             Example(devices.system_overtakes_the_update, ("unlink", ICUTZ),
                     {ICUTZ: update_path("2023b.1.0/icutz"), LEGACY_ICUTZ: "/nowhere"}),
             Example(reset_for_the_schema, ("unlink", ICUTZ), {ICUTZ: ICU})]),
-    # Only an activation, such as that of a reset, removes it.
     "a legacy link that dangles is kept": Window(
         LEGACY_ICUTZ, ("symlink", ZONEINFO), ("unlink", LEGACY_ICUTZ),
         lambda left, usual, _: usual is None, [
             Example(devices.system_overtakes_the_update, ("unlink", LEGACY_ICUTZ),
                     {LEGACY_ICUTZ: "/nowhere"})]),
-    # It would be, right after the reset, and be reset by the next boot. After a kill
-    # during the reset it is compared with the system's data.
     "an update older than the system's data is not activated": Window(
         RECORD, ("unlink", ZONEINFO), ("create", RECORD),
         lambda left, usual, calls: left is None and usual == "2023c.1.0_2023b.1.0"
@@ -86,18 +81,15 @@ WINDOWS = {
             Example(devices.reset_then_an_update_older_than_the_system,
                     ("unlink", ICUTZ), {ICUTZ: update_path("2023a.1.0/icutz")},
                     *OLDER)]),
-    # The record is written last; the next boot has nothing to activate.
     "an activation without a record": Window(
         RECORD, ("symlink", ZONEINFO), ("create", RECORD),
         lambda left, usual, _: left is None or left.endswith("_2023d.1.0"), [
             Example(devices.activation_after_an_update, ("create", RECORD),
                     {ZONEINFO: TREE, ICUTZ: ICU, RECORD: OLD_RECORD}, *STAYS)]),
-    # The file is emptied before it is written.
     "an empty record": Window(
         RECORD, ("create", RECORD), ("write", None), lambda left, usual, _: left == "",
         [Example(devices.activation_after_an_update, ("write", None),
                  {ZONEINFO: TREE, ICUTZ: ICU, RECORD: ""}, *STAYS)]),
-    # While "zoneinfo" is removed nothing tells which update was active.
     "a record that starts from the system's release": Window(
         RECORD, ("unlink", ZONEINFO), ("symlink", ZONEINFO),
         lambda left, usual, _: left is not None and left.startswith("2023c.1.0_") and
@@ -105,7 +97,6 @@ WINDOWS = {
             Example(devices.activation_after_an_update, ("symlink", ZONEINFO),
                     {ZONEINFO: TREE, ICUTZ: ICU, RECORD: "2023c.1.0_2024a.1.0"},
                     [lines.BAD_LINK % "", lines.INVALID_LINKS], STAYS[0])]),
-    # The link is removed before it is made again; nothing else holds the user's zone.
     "a corrected localtime becomes the default": Window(
         LOCALTIME, ("unlink", LOCALTIME), ("symlink", LOCALTIME),
         lambda left, usual, _: left == DEFAULT_LOCALTIME, [
