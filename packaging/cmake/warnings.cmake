@@ -8,26 +8,10 @@ add_library(marlin_warnings INTERFACE)
 target_compile_options(
   marlin_warnings
   INTERFACE
-    -Wall
-    -Wextra
-    -Wpedantic
-    -Wshadow
-    -Wconversion
-    -Wsign-conversion
-    -Wdouble-promotion
-    -Wold-style-cast
-    -Wcast-align
-    -Wcast-qual
-    -Wformat=2
-    -Wformat-security
-    -Wimplicit-fallthrough
-    -Wnon-virtual-dtor
-    -Wnull-dereference
-    -Woverloaded-virtual
-    -Wundef
-    -Wunused
-    -Wvla
-    -Wextra-semi
+    -Wall -Wextra -Wpedantic -Wshadow -Wconversion -Wsign-conversion
+    -Wdouble-promotion -Wold-style-cast -Wcast-align -Wcast-qual -Wformat=2
+    -Wformat-security -Wimplicit-fallthrough -Wnon-virtual-dtor
+    -Wnull-dereference -Woverloaded-virtual -Wundef -Wunused -Wvla -Wextra-semi
     -Wzero-as-null-pointer-constant
     $<$<CXX_COMPILER_ID:GNU>:-Wduplicated-branches>
     $<$<CXX_COMPILER_ID:GNU>:-Wduplicated-cond>
