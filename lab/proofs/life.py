@@ -280,6 +280,12 @@ class Life:
                      + status.boot_differences(said["next_boot"], seen)
                      + status.status_differences(said, seen)
                      + status.reason_differences(said))
+            [step] = [each for each in said["next_boot"]["steps"]
+                      if each["step"] == "record"]
+            written = step["does"] == "written"
+            if written != (RECORD in seen.changed()) or (
+                    written and not step["text"].endswith(seen.after[RECORD].text)):
+                found.append(f"of the record it said: {step['text']}")
         found += properties.shortcomings(properties.Judged(seen))
         found += properties.data_changes(before, seen.after)
         if seen.ending == DONE:
@@ -584,6 +590,11 @@ STORIES = {  # those that were faults, and what an updater does at any time
         "install 2024a; boot; install 2024b; bend tz_latest 2024a; tool --settle",
     "an older set helps where the newer is lost":
         "install 2024b; boot; lose 2024b; install 2024a; boot; boot",
+    "the mend knows the former place":
+        "install 2024a; boot; lose icutz; legacy icutz; boot mend; "
+        "lose icutz; legacy icutz; lose 2024a; boot mend",
+    "a record after a reset":
+        "install 2024a; boot; install 2025a; system 2024b 44l; boot",
     "one at a time": "install 2024b locked; install 2024b; boot",
     "an update lacks the zone": "install 2024b lacking; zone Mars/Base; install 2024b",
     "what is in use is only put back":
