@@ -6,21 +6,7 @@ Shows that nothing breaks the program; docs/proofs.md says what each proof claim
 last lines give a figure for each. All of them take an hour on two processors; --quick
 takes samples, in a quarter of an hour.
 
-  faults     every system call that fails, storage that fails, memory refused
-  kills      every instant at which the program can be killed, and pairs of them
-  states     many thousand devices composed at random
-  life       what happens to a device, one thing after the other
-  load       too much of everything
-  log        a log that is lost, or fails in the middle
-  status     what marlin-status says, against what then happens
-  install    the installer of updates: calls that fail, kills, several at once
-  make       what makes updates and a system's data, and what it refuses
-  component  the third component of CONTRIBUTING.md
-  fuzz       hostile texts
-  sanitize   the tests under sanitizers and (not with --quick) valgrind
-  coverage   lines and branches that the tests run through
-  mutants    the program broken on purpose: the tests have to notice
-
+{proofs}
 TEST is one test as a failing trial names it, --state one random device, --story one
 life; each runs alone, with its output. MARLIN names another program than
 build/release/marlin.
@@ -38,18 +24,26 @@ from lab.carriers.building import build_program, need, trials
 from lab.words.command import Options, stop
 from lab.words.places import BUILD, PROJECT
 
-PYTHON = ["/usr/bin/python3", "-B", "-m"]
-TRIALS = {  # lab/proofs/NAME.py, each
-    "faults": ["faults"], "kills": ["kills", "windows"], "states": ["states"],
-    "life": ["life"], "load": ["load"], "log": ["log"], "status": ["status"],
-    "install": ["install_faults", "install_kills", "install_races"], "make": ["make"]}
-OTHERS = {  # the whole, and with --quick
-    "component": ([], []),
-    "fuzz": (["--seconds", "600"], ["--seconds", "60"]),
-    "sanitize": ([], ["--sanitizers"]),
-    "coverage": ([], []),
-    "mutants": ([], ["--quick", "10", "--seed", str(int(time.time()))]),
-}
+TRIALS = {  # each of files in lab/proofs, with what it shows
+    "faults": (["faults"], "every call that fails, storage that fails, memory refused"),
+    "kills": (["kills", "windows"],
+              "every instant at which the program can be killed, and pairs of them"),
+    "states": (["states"], "many thousand devices composed at random"),
+    "life": (["life"], "what happens to a device, one thing after the other"),
+    "load": (["load"], "too much of everything"),
+    "log": (["log"], "a log that is lost, or fails in the middle"),
+    "status": (["status"], "what marlin-status says, against what then happens"),
+    "install": (["install_faults", "install_kills", "install_races"],
+                "the installer of updates: calls that fail, kills, several at once"),
+    "make": (["make"], "what makes updates and a system's data, and what it refuses")}
+OTHERS = {  # programs in lab/proofs, with their arguments for the whole and for --quick
+    "component": ([], [], "the third component of CONTRIBUTING.md"),
+    "fuzz": (["--seconds", "600"], ["--seconds", "60"], "hostile texts"),
+    "sanitize": ([], ["--sanitizers"],
+                 "the tests under sanitizers and (not with --quick) valgrind"),
+    "coverage": ([], [], "lines and branches that the tests run through"),
+    "mutants": ([], ["--quick", "10", "--seed", str(int(time.time()))],
+                "the program broken on purpose: the tests have to notice")}
 
 
 def prove(name: str, command: list[str]) -> tuple[bool, str]:
@@ -70,7 +64,8 @@ def prove(name: str, command: list[str]) -> tuple[bool, str]:
 
 
 def main() -> int:
-    options = Options(__doc__)
+    options = Options(__doc__.format(proofs="".join(
+        f"  {name:10} {about}\n" for name, (*_, about) in (TRIALS | OTHERS).items())))
     options.add_argument("--quick", action="store_true")
     options.add_argument("--state")
     options.add_argument("--story")
@@ -104,9 +99,10 @@ def main() -> int:
         return subprocess.call(trials("alone", "-rs", *alone), cwd=PROJECT)
     results = [
         prove(name, trials(name, *["--quick"] * chosen.quick,
-                           *(f"lab/proofs/{test}.py" for test in TRIALS[name]))
+                           *(f"lab/proofs/{test}.py" for test in TRIALS[name][0]))
               if name in TRIALS else
-              [*PYTHON, f"lab.proofs.{name}", *OTHERS[name][chosen.quick]])
+              ["/usr/bin/python3", "-B", "-m", f"lab.proofs.{name}",
+               *OTHERS[name][chosen.quick]])
         for name in chosen.proofs or [*TRIALS, *OTHERS]]
     print("\n" + "\n".join(figure for _, figure in results))
     return 0 if all(holds for holds, _ in results) else 1
