@@ -7,7 +7,9 @@ constant, a text, a name, a condition, a statement, two neighbours; and by hand,
 break a sentence of what the program must do: mutants_by_hand.txt. Every one is built in
 a copy of the project and the test programs run against it, the one named after its
 folder first, slow tests last, up to the first failure; one that hangs is killed too.
-Survivors are printed, and mutants by hand that do not build.
+Others break what lies between two programs: mutants_between.txt. A quick run of lives
+has to notice each of these.
+Survivors are printed, and mutants from the lists that do not build.
 
 Those that change nothing that anybody could notice are listed, with a reason each, in
 mutants_equivalent.txt. Exit status: 0 when there is no other, 1 when there is, 2 for
@@ -29,10 +31,11 @@ import time
 from collections import Counter
 from collections.abc import Iterator
 from concurrent.futures import ThreadPoolExecutor
+from itertools import chain
 from pathlib import Path
 from typing import NamedTuple
 
-from lab.carriers.building import copy_the_project, locked, need
+from lab.carriers.building import copy_the_project, locked, need, trials
 from lab.words.command import Options, number
 from lab.words.places import BUILD, PROJECT
 
@@ -223,8 +226,8 @@ def listed(name: str) -> Iterator[tuple[str, str]]:
             yield sentence, line
 
 
-def by_hand() -> Iterator[Mutant]:
-    for sentence, line in listed("by_hand"):
+def from_list(kind: str) -> Iterator[Mutant]:
+    for sentence, line in listed(kind.replace(" ", "_")):
         texts = {}
         for edit in line.split("\n    and "):
             file, before, after = re.fullmatch(
@@ -232,12 +235,12 @@ def by_hand() -> Iterator[Mutant]:
             text = texts.get(file) or (PROJECT / file).read_text()
             form = r"\s+".join(map(re.escape, before.split()))
             if len(found := [*re.finditer(form, text)]) != 1:
-                sys.exit(f"mutants: by hand: found {len(found)} times: {edit}")
+                sys.exit(f"mutants: {kind}: found {len(found)} times: {edit}")
             start, end = found[0].span()
             after = after.replace("@", text[start:end])
             texts[file] = text[:start] + after + text[end:]
-        shown = f"by hand: {sentence}: {' '.join(line.split())}"
-        yield Mutant("by hand", texts, shown, shown)
+        shown = f"{kind}: {sentence}: {' '.join(line.split())}"
+        yield Mutant(kind, texts, shown, shown)
 
 
 def run(seconds: int, *command, file_size="unlimited") -> tuple[bool, str]:
@@ -256,20 +259,22 @@ def run(seconds: int, *command, file_size="unlimited") -> tuple[bool, str]:
 class Tree:
     """A copy of the project, and its build."""
 
-    def __init__(self, number: int):
-        """Builds and tests the copy as it is; finds each program's slow tests."""
-        self.root = PLACE / f"tree{number}"
+    def __init__(self, name: str, *settings: str):
+        self.root = PLACE / name
         copy_the_project(self.root)
         subprocess.run(
             ["cmake", "-S", self.root, "-B", self.root / "build", "-G", "Ninja",
-             "-DBUILD_TESTING=ON", "-DMARLIN_TOOLS=OFF", "-DCMAKE_BUILD_TYPE=None",
+             *settings, "-DCMAKE_BUILD_TYPE=None",
              "-DCMAKE_CXX_FLAGS=-O0 -w -D_GLIBCXX_ASSERTIONS -fsanitize=return " +
-             " ".join(f"-include {header}" for header in HEADERS),
-             "-DCMAKE_GTEST_DISCOVER_TESTS_DISCOVERY_MODE=PRE_TEST"],
+             " ".join(f"-include {header}" for header in HEADERS)],
             check=True, stdout=subprocess.DEVNULL)
         built, output = self.build("all")
         if not built:
             sys.exit(f"{output}\nmutants: the unchanged project does not build")
+        self.insist_on_passing()
+
+    def insist_on_passing(self):
+        """Tests the copy as it is; finds each program's slow tests."""
         self.slow = {}
         for path in sorted(self.root.glob("build/tests/*_test")):
             program = path.name
@@ -331,6 +336,32 @@ class Tree:
         return "survivor"
 
 
+class Lives(Tree):
+    """A copy of the project with the companions; lives are its only test."""
+
+    def __init__(self):
+        super().__init__("lives", "-DBUILD_TESTING=OFF", "-DMARLIN_STATIC=ON")
+
+    def insist_on_passing(self):
+        passed, output = self.live()
+        if not passed:
+            sys.exit(f"{output}\nmutants: lives fail as it is")
+
+    def live(self) -> tuple[bool, str]:
+        command = trials("mutant", "--quick", "--unshrunk", "-x", "lab/proofs/life.py")
+        done = subprocess.run(command, cwd=PROJECT, capture_output=True, text=True,
+                              env=os.environ | {"MARLIN": f"{self.root}/build/marlin"})
+        return done.returncode == 0, done.stdout + done.stderr
+
+    def tested(self, favourite: str) -> str:
+        if not self.build("all")[0]:
+            return "not built"
+        passed, output = self.live()
+        if not passed and "FAILED" not in output:
+            sys.exit(f"{output}\nmutants: lives did not come to an end")
+        return "survivor" if passed else "killed"
+
+
 def fates(trees: list[Tree], mutants: list[Mutant]) -> Iterator[tuple[Mutant, str]]:
     """Every mutant with its fate. Each worker has a tree to itself."""
     def fate(mutant):
@@ -358,9 +389,9 @@ def main() -> int:
     parser.add_argument("--only", default="")
     parser.add_argument("--list", action="store_true")
     options = parser.parse_args()
-    need("build", "private-device", "test", "mutants")
+    need("build", "private-device", "test", "mutants", "pytest", "prove")
 
-    mutants, equivalent = [*by_rule(), *by_hand()], {
+    mutants, equivalent = [*by_rule(), *from_list("by hand"), *from_list("between")], {
         " ".join(line.split()): reason for reason, line in listed("equivalent")}
     for key in equivalent.keys() - {mutant.key for mutant in mutants}:
         sys.exit(f"mutants: explained, but there is none: {key}")
@@ -379,16 +410,22 @@ def main() -> int:
 
 def judge(mutants: list[Mutant], equivalent: dict[str, str], chosen: str) -> int:
     """Tries all of them and tells their fates."""
-    wanted = min(os.cpu_count() or 1, 1 + len(mutants) // 100)
-    trees = [Tree(number) for number in range(wanted)]
+    lived = [mutant for mutant in mutants if mutant.kind == "between"]
+    others = [mutant for mutant in mutants if mutant.kind != "between"]
+    wanted = min(os.cpu_count() or 1, 1 + len(others) // 100) if others else 0
+    trees = [Tree(f"tree{number}", "-DBUILD_TESTING=ON", "-DMARLIN_TOOLS=OFF",
+                  "-DCMAKE_GTEST_DISCOVER_TESTS_DISCOVERY_MODE=PRE_TEST")
+             for number in range(wanted)]
     begun, wrong = time.monotonic(), False
-    counts = {"by rule": Counter(), "by hand": Counter()}
-    for done, (mutant, fate) in enumerate(fates(trees, mutants), 1):
+    counts = {"by rule": Counter(), "by hand": Counter(), "between": Counter()}
+    told = chain(fates(trees, others) if others else (),
+                 fates([Lives()], lived) if lived else ())
+    for done, (mutant, fate) in enumerate(told, 1):
         explained = mutant.key in equivalent
         if fate == "survivor" and explained:
             fate = "equivalent"
         elif explained or fate == "survivor" or (
-                fate == "not built" and mutant.kind == "by hand"):
+                fate == "not built" and mutant.kind != "by rule"):
             print(f"{fate}{', though explained' * explained}: {mutant.shown}",
                   flush=True)
             wrong = True
