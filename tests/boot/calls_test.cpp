@@ -149,32 +149,6 @@ TEST_F(Calls, NeverOpenAFifoOrADevice) {
   }
 }
 
-TEST_F(Calls, ThatFailAreReportedWhateverTheErrorButThatThePathIsMissing) {
-  wipe(tz_latest);
-  for (const int error : {EPERM, EIO, EACCES, EBUSY, ENOTDIR, EISDIR, EINVAL,
-                          EROFS, ELOOP, ENAMETOOLONG, ENOMEM}) {
-    const auto booted =
-        trace({"-P", tz_latest, "-P", icutz, "-e",
-               "inject=?readlink,?readlinkat,?unlink,unlinkat:error=" +
-                   std::to_string(error)});
-    EXPECT_THAT(booted.lines(),
-                lines(cannot_read(tz_latest, error), unable_to_locate(error),
-                      icu_link_stays(icutz, error)));
-  }
-}
-
-// Of 4096 bytes and some more the first part is kept.
-TEST_F(Calls, ThatFailToReadTheRestOfAWordKeepItsStart) {
-  const std::string file = system_tree + "/+VERSION";
-  const std::string start(4096, '7');
-  make_file(file, start + "8");
-  wipe(tz_latest);
-  const auto booted =
-      trace({"-P", file, "-e", "inject=read:error=EIO:when=2+2"});
-  const auto cut = unparsed(start + ".1.0", EIO);
-  EXPECT_THAT(booted.lines(), lines(cut, cut));
-}
-
 // What was only said to be written is missing from the record.
 TEST_F(Calls, OfAShortWriteGoOnBehindWhatWasTaken) {
   for (const auto& [taken, recorded] :

@@ -3,13 +3,11 @@
 // The words of the other tests, tested themselves.
 #include <gtest/gtest-spi.h>
 
-#include <cerrno>
 #include <iostream>
 
 #include "tests/device/device.h"
 
 using namespace device;
-using ::testing::Not;
 
 namespace {
 
@@ -43,19 +41,6 @@ TEST_F(PrivateDevice, ShowsEveryChangeInASnapshot) {
   changes([] { wipe("/var/db/file"); });
   make_link("/var/db/link", "target");
   changes([] { make_link("/var/db/link", "target"); });
-}
-
-TEST_F(PrivateDevice, ComparesALineWithOrWithoutItsErrorText) {
-  const std::vector<std::string> printed = {
-      "marlin: remove: x: Input/output error"};
-  EXPECT_THAT(printed, lines(failure("remove: x", EIO)));
-  EXPECT_THAT(printed, Not(lines(failure("remove: x", EPERM))));
-  EXPECT_THAT(printed, Not(lines(failure("remove: y", EIO))));
-  EXPECT_THAT(printed, lines(failure("remove: x", any_error)));
-  EXPECT_THAT(printed, Not(lines(failure("remove", any_error))));
-  EXPECT_THAT(printed, Not(no_lines()));
-  EXPECT_THAT(printed, Not(lines(failure("remove: x", any_error),
-                                 failure("remove: x", any_error))));
 }
 
 TEST_F(PrivateDevice, NoticesThatNothingWasThrown) {

@@ -106,13 +106,18 @@ void expect_links_at_update(const std::string& version);
 // Expects that `act` changes nothing, down to inodes and times.
 void expect_nothing_changed_by(const std::function<void()>& act);
 
+// Expects that a second `activate` makes the link once more that the first one
+// made, and throws if the old one cannot be removed.
+void expect_made_anew(const std::string& link,
+                      const std::function<void()>& activate);
+
 // --- Booting ---------------------------------------------------------------
 
 struct outcome {
   int exit_status;  // of a process that exited, otherwise -1
   int signal;       // that ended the process, otherwise 0
   std::string log;  // the bytes of standard error
-  std::vector<std::string> lines() const;
+  log_lines lines() const;
 };
 
 // Whether the program under test was built for another machine, and runs below
@@ -141,33 +146,47 @@ traced_outcome trace(const std::vector<std::string>& options,
 // on the system partition was changed by it.
 outcome boot();
 
-using lines_matcher = ::testing::Matcher<std::vector<std::string>>;
-
-// Boots, and expects an exit with status 0 after these lines.
-void boot_prints(const lines_matcher& expected);
+// Boots, and expects an exit with status 0 after these lines and no other.
+void boot_prints_exactly(const log_lines& expected);
+template <typename... Lines>
+void boot_prints(const Lines&... expected) {
+  boot_prints_exactly(lines(expected...));
+}
 // The same of a boot that changes nothing.
-void boot_changes_nothing_and_prints(const lines_matcher& expected);
+template <typename... Lines>
+void boot_only_prints(const Lines&... expected) {
+  expect_nothing_changed_by([&] { boot_prints(expected...); });
+}
 
 // --- Calling its functions in this process -----------------------------------
 
 // The lines that `act` prints to standard error.
-std::vector<std::string> printed_by(const std::function<void()>& act);
-
-// The same of an act that is expected to throw this int at its end.
-std::vector<std::string> printed_before_throwing(
-    int error, const std::function<void()>& act);
+log_lines printed_by(const std::function<void()>& act);
 
 // The int that `act` throws; fails the test when it throws none.
 int thrown_by(const std::function<void()>& act);
 
+// Expects that `act` prints these lines and no other.
+template <typename... Lines>
+void prints(const std::function<void()>& act, const Lines&... expected) {
+  EXPECT_EQ(printed_by(act), lines(expected...));
+}
+
+// The same of an act that throws this int at its end.
+template <typename... Lines>
+void throws(int error, const std::function<void()>& act,
+            const Lines&... expected) {
+  prints([&] { EXPECT_EQ(thrown_by(act), error); }, expected...);
+}
+
 // The result of `act`, which is expected to print nothing.
 template <typename Act>
-std::invoke_result_t<Act> quietly(const Act& act) {
+auto quietly(const Act& act) {
   if constexpr (std::is_void_v<std::invoke_result_t<Act>>) {
-    EXPECT_THAT(printed_by(act), no_lines());
+    prints(act);
   } else {
     std::optional<std::invoke_result_t<Act>> result;
-    EXPECT_THAT(printed_by([&] { result = act(); }), no_lines());
+    prints([&] { result = act(); });
     return *result;
   }
 }

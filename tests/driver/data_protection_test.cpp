@@ -7,6 +7,11 @@ namespace {
 
 class DataProtection : public SoundDeviceTest {
  protected:
+  void SetUp() override {
+    if (emulated()) GTEST_SKIP() << "strace would show the emulator's calls";
+    SoundDeviceTest::SetUp();
+  }
+
   // The first calls of a boot, as the build for a platform with
   // data-protection classes makes them. Descriptors are numbered the same way
   // in every run. What the shell redirects stays so for the program.
@@ -47,7 +52,6 @@ const std::string second = "/var/db/timezone/tz/";
 const auto looks_at_the_legacy_link = HasSubstr("\"/var/db/icutz\"");
 
 TEST_F(DataProtection, AsksForClassDOnBothDirectoriesBeforeAllElse) {
-  if (emulated()) GTEST_SKIP() << "strace would show the emulator's calls";
   EXPECT_THAT(first_calls(7),
               ElementsAre(opens(first, "3"), asks_for_class_d("3"), closes("3"),
                           opens(second, "3"), asks_for_class_d("3"),
@@ -55,7 +59,6 @@ TEST_F(DataProtection, AsksForClassDOnBothDirectoriesBeforeAllElse) {
 }
 
 TEST_F(DataProtection, AsksForClassDOnWhateverIsNamed) {
-  if (emulated()) GTEST_SKIP() << "strace would show the emulator's calls";
   make_link("/var/db/timezone/link", downloads);
   make_file("/var/db/timezone/file");
   for (const char* name : {"tz", "link", "file"}) {
@@ -67,14 +70,12 @@ TEST_F(DataProtection, AsksForClassDOnWhateverIsNamed) {
 }
 
 TEST_F(DataProtection, TakesDescriptorZeroForADescriptor) {
-  if (emulated()) GTEST_SKIP() << "strace would show the emulator's calls";
   EXPECT_THAT(
       first_calls(3, "<&-"),
       ElementsAre(opens(first, "0"), asks_for_class_d("0"), closes("0")));
 }
 
 TEST_F(DataProtection, IsQuietlyLeftOutForADirectoryThatCannotBeOpened) {
-  if (emulated()) GTEST_SKIP() << "strace would show the emulator's calls";
   const auto second_fails = [](const std::string& error) {
     return ElementsAre(opens(first, "3"), asks_for_class_d("3"), closes("3"),
                        opens(second, "-1 " + error), looks_at_the_legacy_link);

@@ -1,47 +1,33 @@
 // SPDX-License-Identifier: BSD-2-Clause
 //
-// An exception of any type, from anything that the pass calls, ends as it has
-// to: handled in place while the current links are resolved, otherwise in the
-// last resort. This program's own functions stand in for those of the
-// libraries; each does its job, except where it is told to throw.
-#include <array>
+// Every request for memory that a boot makes is refused in turn, with an
+// exception of any type. Each reaches the handler that it has to reach, and
+// finds everything freed that was built by then.
 #include <cerrno>
 #include <cstdlib>
-#include <functional>
 #include <map>
 #include <new>
-#include <stdexcept>
+#include <set>
+#include <utility>
 
-#include "dataset/dataset.h"
-#include "driver/dataset_links.h"
+#include "dataset/components.h"
+#include "driver/localtime_link.h"
 #include "driver/startup.h"
-#include "driver/version_record.h"
 #include "support/first_word.h"
-#include "support/version_grammar.h"
 #include "tests/device/device.h"
 
 using namespace device;
-using ::testing::Contains;
-using ::testing::Matches;
-using ::testing::Not;
 
 namespace {
 
-struct of_no_known_type {};
+int granted = 0;  // how many requests for memory are granted first
+int denied = 0;   // how many are denied after them
+std::function<void()> deny;
 
-const std::map<std::string, std::function<void()>> exceptions = {
-    {"int", [] { throw 5; }},
-    {"long", [] { throw 5l; }},
-    {"bad_alloc", [] { throw std::bad_alloc(); }},
-    {"out_of_range", [] { throw std::out_of_range("too great"); }},
-    {"invalid_argument", [] { throw std::invalid_argument("badpath"); }},
-    {"a class of its own", [] { throw of_no_known_type(); }},
-};
-
-// Which call of which function is to throw, and what.
-std::string thrower;
-int countdown = 0;
-std::function<void()> raise;
+// What is allocated: now, and at the request that follows on a denied one.
+long live = 0;
+long live_after_denial = 0;
+bool was_denied = false;
 
 // The data sets that were compared, receivers and arguments in turn: the
 // letters of an update's release, "-" for the system's.
@@ -52,21 +38,18 @@ char letter_of(const mln_dataset_component& component) {
   return path.empty() ? '-' : path[path.find('.') - 1];
 }
 
-// What is allocated: now, at each reading of a word, and when the local time is
-// repaired.
-long live = 0;
-long live_at_start = 0;
-std::array<long, 16> live_at_word{};
-std::size_t words = 0;
-long live_at_repair = 0;
-
-void called(const std::string& function) {
-  if (function == thrower && --countdown == 0) raise();
-}
-
 }  // namespace
 
 void* operator new(std::size_t size) {
+  if (std::exchange(was_denied, false)) live_after_denial = live;
+  if (granted > 0) {
+    --granted;
+  } else if (denied > 0) {
+    --denied;
+    was_denied = true;
+    errno = ENOMEM;
+    deny();
+  }
   ++live;
   if (void* const memory = std::malloc(size)) return memory;
   throw std::bad_alloc();
@@ -79,128 +62,167 @@ void operator delete(void* memory, std::size_t) noexcept {
   operator delete(memory);
 }
 
-void repair_localtime_link() {
-  live_at_repair = live;
-  make_link(local_time, default_localtime);
-}
-
-std::string read_first_word(const std::string& path) {
-  live_at_word.at(words++ % live_at_word.size()) = live;
-  called("read_first_word");
-  std::string word = file_at(path);
-  word.resize(std::min(word.find('\n'), word.size()));
-  return word;
-}
-
-std::optional<mln_version_groups> match_version_text(std::string_view text) {
-  called("match_version_text");
-  return mln_version_groups{text.substr(0, 4), text.substr(4, 1), "1", "0"};
-}
-
+// Stands in for the library's. It requests memory, so that it throws as well.
 bool compatible_components(const component_list& receivers,
                            const component_list& others) {
-  called("compatible_components");
+  operator delete(operator new(1));
   compared += letter_of(*receivers[1]);
   compared += letter_of(*others[1]);
   return receivers[1]->compatible_schema(*others[1]);
 }
 
-std::string latest_update_path() {
-  called("latest_update_path");
-  return link_at(tz_latest);
-}
-
-std::string current_dataset_path() {
-  called("current_dataset_path");
-  const std::string target = link_at(zoneinfo);
-  if (target == update("none") + "/zoneinfo") throw -1;
-  return target == system_tree ? "" : target.substr(0, target.rfind('/'));
-}
-
-void record_version_change(const std::string& from, const std::string& to) {
-  called("record_version_change");
-  make_file(record, from + "_" + to);
-}
-
 namespace {
 
-// An announced update; in use is the system's data, or an update that no longer
-// fits and is reset in the same boot.
 class Exceptions : public DeviceTest {
  protected:
   void SetUp() override {
     DeviceTest::SetUp();
-    thrower.clear();
+    deny = [] { throw std::bad_alloc(); };
     install_system("2023c", "44l");
     install_update("2022a.1.0", "45l");
     install_and_announce("2024a.1.0", "44l");
+    make_directory("/var/db/a-name-that-needs-memory");
   }
 
-  // Boots as often as `function` is called, each time with another call that
-  // throws, once for each type. Gives the number of its calls.
-  template <typename Expected>
-  static int sweep(const std::string& function, const std::string& in_use,
-                   Expected expected) {
-    for (int calls = 0;; ++calls) {
-      for (const auto& [type, act] : exceptions) {
-        SCOPED_TRACE(function + ", call " + std::to_string(calls + 1) +
-                     ", throws " + type);
-        wipe(record);
-        in_use.empty() ? point_links_at_system()
-                       : point_links_at_update(in_use);
-        wipe(local_time);
-        thrower = function;
-        countdown = calls + 1;
-        raise = act;
-        const auto printed = printed_by(run_startup_pass);
-        if (countdown > 0) return calls;
-        expected(printed);
-        // The boot went on to its end.
-        EXPECT_EQ(link_at(local_time), default_localtime);
+  // Grants so many requests of an act, and denies the next ones.
+  static void denying(const std::function<void()>& act, int first, int then) {
+    granted = first;
+    denied = then;
+    act();
+    granted = denied = 0;
+  }
+
+  struct ending {
+    log_lines printed;
+    bool was_denied;  // there was one more request
+    bool left_the_pass;
+    bool had_freed_all;  // when the next request came
+  };
+  static ending boot_denied_after(int requests) {
+    ending end{};
+    long live_at_start = 0;
+    compared.clear();
+    const auto boot = [&] {
+      try {
+        run_startup_pass();
+      } catch (...) {
+        end.left_the_pass = true;
       }
-    }
+      end.was_denied = denied == 0;
+    };
+    end.printed = printed_by([&] {
+      live_at_start = live;
+      denying(boot, requests, 1);
+      EXPECT_EQ(live, live_at_start);
+    });
+    end.had_freed_all = live_after_denial == live_at_start;
+    return end;
   }
 
-  static void expect_last_resort(const std::vector<std::string>& printed) {
-    EXPECT_THAT(printed, Contains(unable_to_locate(any_error)));
-    expect_links_at_system();
-    EXPECT_EQ(file_at(record), nothing);
-  }
-  static void expect_reset_and_activation(
-      const std::vector<std::string>& printed) {
-    EXPECT_THAT(printed, Contains(invalid_links(any_error)));
-    EXPECT_THAT(printed, Not(Contains(unable_to_locate(any_error))));
-    expect_links_at_update("2024a.1.0");
-    EXPECT_EQ(file_at(record), "2023c.1.0_2024a.1.0");
+  // What is to be seen of a boot after the line of any handler.
+  static void expect_activation_or_reset(const log_lines& printed) {
+    EXPECT_EQ(link_at(local_time), default_localtime);
+    EXPECT_EQ(link_at(legacy_icutz), nothing);
+    const auto is_printed = [&](const log_lines& line) {
+      return std::find(printed.begin(), printed.end(), line[0]) !=
+             printed.end();
+    };
+    // A link that is not removed is still there when it is made anew.
+    if (is_printed(unable_to_locate(ENOMEM)) ||
+        is_printed(unable_to_locate(EEXIST))) {
+      expect_links_at_system();
+      EXPECT_EQ(file_at(record), "old");
+    } else {
+      expect_links_at_update("2024a.1.0");
+      EXPECT_EQ(file_at(record), "2023c.1.0_2024a.1.0");
+    }
   }
 };
 
-TEST_F(Exceptions, FromTheCurrentLinksResetThemAndTheBootGoesOn) {
-  EXPECT_EQ(
-      sweep("current_dataset_path", "2022a.1.0", expect_reset_and_activation),
-      1);
+struct of_no_known_type {};
+
+const std::map<std::string, std::function<void()>> exceptions = {
+    {"a number", [] { throw 5; }},
+    {"no memory", [] { throw std::bad_alloc(); }},
+    {"a type of its own", [] { throw of_no_known_type(); }}};
+
+// The line of each handler, and whether all is freed by then.
+const std::map<log_lines, bool> handlers = {
+    {not_migrated(ENOMEM), false},
+    {invalid_links(ENOMEM), false},
+    {zoneinfo_not_unlinked(ENOMEM), false},
+    {icu_not_unlinked(ENOMEM), false},
+    {unable_to_locate(ENOMEM), true},
+    {resetting_localtime(ENOMEM), true}};
+
+// In use is an update that is reset in the same boot, or no data set.
+TEST_F(Exceptions, OfAnyTypeReachTheirHandlersWithEverythingFreed) {
+  for (const auto& in_use : {update("2022a.1.0") + "/zoneinfo", update("x")}) {
+    for (const auto& [type, act] : exceptions) {
+      deny = act;
+      std::set<log_lines> reached;
+      for (int requests = 0;; ++requests) {
+        SCOPED_TRACE(in_use + ", " + type + " after " +
+                     std::to_string(requests) + " requests");
+        point_zoneinfo_at(in_use);
+        wipe(icutz);
+        make_link(legacy_icutz, "/var/db/a-name-that-needs-memory");
+        make_file(record, "old");
+        point_localtime_at("/usr/share/zoneinfo/America/Los_Angeles");
+        const ending end = boot_denied_after(requests);
+        if (!end.was_denied) break;
+
+        // The migration's own paths are made before the first handler.
+        EXPECT_EQ(end.left_the_pass, requests == 0);
+        if (requests == 0) {
+          EXPECT_EQ(end.printed, no_lines());
+          EXPECT_NE(link_at(legacy_icutz), nothing);
+          continue;
+        }
+        const auto line = std::find_if(
+            end.printed.begin(), end.printed.end(), [](const auto& printed) {
+              return printed.ends_with(std::strerror(ENOMEM));
+            });
+        ASSERT_NE(line, end.printed.end()) << "nobody tells of it";
+        const auto handler = handlers.find({*line});
+        ASSERT_NE(handler, handlers.end()) << *line;
+        EXPECT_TRUE(end.had_freed_all || !handler->second);
+        reached.insert(handler->first);
+        expect_activation_or_reset(end.printed);
+      }
+      EXPECT_EQ(reached.size(), handlers.size());
+    }
+  }
 }
 
-TEST_F(Exceptions, FromAnythingElseTakeTheLastResort) {
-  const auto calls = [](const std::string& function,
-                        const std::string& in_use) {
-    return sweep(function, in_use, expect_last_resort);
+TEST_F(Exceptions, ThatAFallbackMeetsItselfLeaveThePass) {
+  point_localtime_at("/usr/share/zoneinfo/Europe/Paris");
+  const auto fails = [](const auto& act, int first, const log_lines& line) {
+    prints(
+        [&] {
+          denying([&] { EXPECT_THROW(act(), std::bad_alloc); }, first, 1000);
+        },
+        line);
   };
-  EXPECT_EQ(calls("latest_update_path", "2022a.1.0"), 1);
-  // The words of the system's set, of the current one, the update's, and before
-  // it those of a reset.
-  EXPECT_EQ(calls("read_first_word", ""), 5);
-  EXPECT_EQ(calls("read_first_word", "2022a.1.0"), 6);
-  // Also an update that is in use and announced is read as both.
-  EXPECT_EQ(calls("read_first_word", "2024a.1.0"), 4);
-  // Those of a reset and then of the system's set, for a link that is rejected.
-  EXPECT_EQ(calls("read_first_word", "none"), 7);
-  EXPECT_EQ(calls("match_version_text", ""), 3);
-  EXPECT_EQ(calls("match_version_text", "2022a.1.0"), 4);
-  EXPECT_EQ(calls("compatible_components", ""), 2);
-  EXPECT_EQ(calls("compatible_components", "2022a.1.0"), 2);
-  EXPECT_EQ(calls("record_version_change", ""), 1);
-  EXPECT_EQ(calls("record_version_change", "2022a.1.0"), 1);
+  fails(run_startup_pass, 1, unable_to_locate(ENOMEM));
+  fails(repair_localtime_link, 0, resetting_localtime(ENOMEM));
+}
+
+// What was read before stays: the first 4096 bytes are there when room for
+// those behind them is denied.
+TEST_F(Exceptions, CutAFirstWordWhereMemoryEnds) {
+  const std::string path = "/usr/share/file";
+  make_file(path, std::string(4096, 'x') + std::string(4096, 'y'));
+  for (const int first : {0, 1}) {
+    std::string word = "unread";
+    denying(
+        [&] {
+          word = read_first_word(path);
+          EXPECT_EQ(denied, 0);
+        },
+        first, 1);
+    EXPECT_EQ(word, first == 0 ? "" : std::string(4096, 'x'));
+  }
 }
 
 // The components of the set in question are asked about the system's, never the
@@ -213,52 +235,6 @@ TEST_F(Exceptions, AskTheSetInQuestionAboutTheSystems) {
     compared.clear();
     printed_by(run_startup_pass);
     EXPECT_EQ(compared, "d-a-");
-  }
-}
-
-// The last resort holds no more than a reset of its own does, and the repair of
-// the local time nothing: all that the pass has built is gone by then.
-TEST_F(Exceptions, FindEverythingDiscardedBeforeTheLastResortAndTheRepair) {
-  words = 0;
-  live_at_start = live;
-  reset_to_system_partition();
-  const long of_a_reset = live_at_word[0] - live_at_start;
-  thrower = "record_version_change";
-  countdown = 1;
-  raise = [] { throw of_no_known_type(); };
-  printed_by([] {
-    words = 0;
-    live_at_start = live;
-    run_startup_pass();
-  });
-  // A reset reads two words; here they are the last two.
-  EXPECT_EQ(live_at_word.at(words - 2) - live_at_start, of_a_reset);
-  EXPECT_EQ(live_at_repair, live_at_start);
-  EXPECT_GT(live_at_word.at(4) - live_at_start, of_a_reset) << "the update's";
-
-  thrower.clear();
-  live_at_start = live;
-  run_startup_pass();
-  EXPECT_EQ(live_at_repair, live_at_start) << "after an activation";
-}
-
-// With "zoneinfo" in the way every activation fails, that of a reset as well.
-TEST_F(Exceptions, FromAResetTakeTheLastResortAndFromThatLeaveThePass) {
-  make_directory(zoneinfo);
-  for (const std::string function :
-       {"latest_update_path", "current_dataset_path"}) {
-    for (const auto& [type, act] : exceptions) {
-      SCOPED_TRACE(function + " throws " + type);
-      thrower = function;
-      countdown = 1;
-      raise = act;
-      const auto printed =
-          printed_by([] { EXPECT_EQ(thrown_by(run_startup_pass), EEXIST); });
-      EXPECT_EQ(Matches(Contains(invalid_links(any_error)))(printed),
-                function == "current_dataset_path");
-      EXPECT_THAT(printed, Contains(unable_to_locate(any_error)));
-      EXPECT_EQ(link_at(local_time), nothing);
-    }
   }
 }
 

@@ -30,7 +30,7 @@ class LocaltimeLinkRepair : public DeviceTest {
   static void repairs(const std::string& target, const std::string& to,
                       const Lines&... expected) {
     point_localtime_at(target);
-    EXPECT_THAT(printed_by(repair_after_an_old_error), lines(expected...));
+    prints(repair_after_an_old_error, expected...);
     EXPECT_EQ(link_at(local_time), to);
   }
   static void corrects(const std::string& target, const std::string& to) {
@@ -60,10 +60,8 @@ TEST_F(LocaltimeLinkRepair, AcceptsThePrefixWithoutASeparator) {
 }
 
 TEST_F(LocaltimeLinkRepair, CorrectsALinkIntoTheFormerTreeOrToItself) {
-  corrects("/usr/share/zoneinfo/Europe/Paris",
-           "/var/db/timezone/zoneinfo/Europe/Paris");
-  corrects("/usr/share/zoneinfo", "/var/db/timezone/zoneinfo");
-  corrects("/usr/share/zoneinfo/", "/var/db/timezone/zoneinfo/");
+  for (const std::string rest : {"/Europe/Paris", "", "/"})
+    corrects("/usr/share/zoneinfo" + rest, "/var/db/timezone/zoneinfo" + rest);
 }
 
 TEST_F(LocaltimeLinkRepair, LooksForTheCorrectedZoneInTheActiveDataSet) {
@@ -73,17 +71,12 @@ TEST_F(LocaltimeLinkRepair, LooksForTheCorrectedZoneInTheActiveDataSet) {
            "/var/db/timezone/zoneinfo/Europe/Kyiv");
 }
 
+// Only the prefix is replaced, though nothing separates it or it comes again.
 TEST_F(LocaltimeLinkRepair, AnnouncesACorrectionThatThenFails) {
-  corrects_and_then_resets("/usr/share/zoneinfo/usr/share/zoneinfo/Base",
-                           "/var/db/timezone/zoneinfo/usr/share/zoneinfo/Base");
-}
-
-TEST_F(LocaltimeLinkRepair, CorrectsThePrefixWithoutASeparatorAndThenResets) {
-  corrects_and_then_resets("/usr/share/zoneinfo.default/Europe/Paris",
-                           "/var/db/timezone/zoneinfo.default/Europe/Paris");
-}
-
-TEST_F(LocaltimeLinkRepair, ResetsWhenTheZoneinfoLinkDoesNotWork) {
+  for (const std::string rest :
+       {"/usr/share/zoneinfo/Base", ".default/Europe/Paris"})
+    corrects_and_then_resets("/usr/share/zoneinfo" + rest,
+                             "/var/db/timezone/zoneinfo" + rest);
   point_zoneinfo_at("/var/db/gone");
   corrects_and_then_resets("/usr/share/zoneinfo/Europe/Paris",
                            "/var/db/timezone/zoneinfo/Europe/Paris");
@@ -91,16 +84,15 @@ TEST_F(LocaltimeLinkRepair, ResetsWhenTheZoneinfoLinkDoesNotWork) {
 }
 
 TEST_F(LocaltimeLinkRepair, ResetsAMissingLink) {
-  EXPECT_THAT(printed_by(repair_localtime_link), lines(resetting_localtime()));
+  prints(repair_localtime_link, resetting_localtime());
   EXPECT_EQ(link_at(local_time), default_localtime);
 }
 
 TEST_F(LocaltimeLinkRepair, ResetsARelativeLinkOrOneToAnywhereElse) {
   for (const char* target :
-       {"zoneinfo/Europe/Paris", "../zoneinfo/Europe/Paris",
-        "../../../usr/share/zoneinfo/Europe/Paris", "/", "/usr/share/zoneinf",
-        "/usr/share/zoneinfX/Europe/Paris", "/usr/share/Zoneinfo/Europe/Paris",
-        "/var/db/timezone/zoneinf", "/VAR/db/timezone/zoneinfo/Europe/Paris",
+       {"zoneinfo/Europe/Paris", "../../../usr/share/zoneinfo/Europe/Paris",
+        "/", "/usr/share/zoneinf", "/usr/share/zoneinfX/Europe/Paris",
+        "/usr/share/Zoneinfo/Europe/Paris", "/var/db/timezone/zoneinf",
         "//var/db/timezone/zoneinfo/Europe/Paris",
         "/var/db/timezone/tz/2024a.1.0/zoneinfo/Europe/Paris",
         "/usr/share/lib/zoneinfo/Europe/Paris", "%s%n"})
@@ -114,9 +106,8 @@ TEST_F(LocaltimeLinkRepair, ResetsToTheDefaultZoneWhetherOrNotItExists) {
 
 TEST_F(LocaltimeLinkRepair, ReplacesAFileOrAnEmptyDirectory) {
   const auto replaces_it = [] {
-    EXPECT_THAT(
-        printed_by(repair_localtime_link),
-        lines(cannot_read(local_time, EINVAL), resetting_localtime(EINVAL)));
+    prints(repair_localtime_link, cannot_read(local_time, EINVAL),
+           resetting_localtime(EINVAL));
     EXPECT_EQ(link_at(local_time), default_localtime);
   };
   make_file(local_time, "TZif");
@@ -127,29 +118,27 @@ TEST_F(LocaltimeLinkRepair, ReplacesAFileOrAnEmptyDirectory) {
 
 TEST_F(LocaltimeLinkRepair, ThrowsWhenADirectoryStandsInTheWay) {
   make_file(local_time + "/file");
-  EXPECT_THAT(
-      printed_before_throwing(EEXIST, repair_localtime_link),
-      lines(cannot_read(local_time, EINVAL), resetting_localtime(EINVAL),
-            cannot_link(local_time, default_localtime, EEXIST)));
+  throws(EEXIST, repair_localtime_link, cannot_read(local_time, EINVAL),
+         resetting_localtime(EINVAL),
+         cannot_link(local_time, default_localtime, EEXIST));
 }
 
 TEST_F(LocaltimeLinkRepair, ThrowsWithoutATimezoneDirectory) {
   wipe(timezone_root);
-  EXPECT_THAT(printed_before_throwing(ENOENT, repair_localtime_link),
-              lines(resetting_localtime(),
-                    cannot_link(local_time, default_localtime, ENOENT)));
+  throws(ENOENT, repair_localtime_link, resetting_localtime(),
+         cannot_link(local_time, default_localtime, ENOENT));
 }
 
+// In a directory that cannot be written the old link stays, so creating the
+// corrected one fails, and so does the default one.
 TEST_F(LocaltimeLinkRepair, FallsBackWhenTheCorrectedLinkCannotBeCreated) {
-  // In a directory that cannot be written the old link stays, so creating the
-  // corrected one fails, and so does the default one.
   point_localtime_at("/usr/share/zoneinfo/Europe/Paris");
   set_mode(timezone_root, 0555);
-  EXPECT_THAT(printed_before_throwing(EEXIST, repair_after_an_old_error),
-              lines(correcting_localtime(zoneinfo + "/Europe/Paris", EXDEV),
-                    cannot_link(local_time, zoneinfo + "/Europe/Paris", EEXIST),
-                    resetting_localtime(EEXIST),
-                    cannot_link(local_time, default_localtime, EEXIST)));
+  throws(EEXIST, repair_after_an_old_error,
+         correcting_localtime(zoneinfo + "/Europe/Paris", EXDEV),
+         cannot_link(local_time, zoneinfo + "/Europe/Paris", EEXIST),
+         resetting_localtime(EEXIST),
+         cannot_link(local_time, default_localtime, EEXIST));
   EXPECT_EQ(link_at(local_time), "/usr/share/zoneinfo/Europe/Paris");
 }
 

