@@ -3,11 +3,15 @@
 // What every fuzz target needs: bytes in, properties out.
 #pragma once
 
+#include <errno.h>
+
 #include <cstdint>
 #include <cstdio>
 #include <cstdlib>
+#include <cstring>
 #include <string>
 #include <string_view>
+#include <utility>
 
 // What an engine, or the replay of its seeds, calls with one input.
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data,
@@ -31,8 +35,8 @@ std::string printed_by(const Act& act) {
   char* bytes = nullptr;
   std::size_t size = 0;
   std::FILE* const log = ::open_memstream(&bytes, &size);
-  std::FILE* const standard_error = stderr;
-  stderr = log;
+  std::FILE* const standard_error = std::exchange(stderr, log);
+  errno = 0;
   act();
   stderr = standard_error;
   std::fclose(log);
@@ -41,16 +45,9 @@ std::string printed_by(const Act& act) {
   return printed;
 }
 
-// Whether `printed` is one line of warn(3) with this message, as far as its
-// first NUL goes, whatever the error text; what follows the line is cut off.
-inline bool take_warning(std::string& printed, const std::string& message) {
-  const std::string start =
-      std::string(": ") + message.c_str() + std::string(": ");
-  const std::size_t name = printed.find(start);
-  if (name == std::string::npos || printed.find_first_of(":\n") != name)
-    return false;
-  const std::size_t end = printed.find('\n', name + start.size());
-  if (end == std::string::npos) return false;
-  printed.erase(0, end + 1);
-  return true;
+// The line of warn(3) with this message, which goes up to its first NUL, where
+// no call has failed.
+inline std::string warning(const std::string& message) {
+  return std::string(program_invocation_short_name) + ": " + message.c_str() +
+         ": " + std::strerror(0) + "\n";
 }
