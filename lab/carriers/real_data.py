@@ -9,8 +9,6 @@ schema, and what a still later system brings, each a `zoneinfo` tree beside an `
 """
 
 import shutil
-import subprocess
-import sys
 import tempfile
 from pathlib import Path
 
@@ -23,13 +21,10 @@ ICU_SOURCE = PROJECT / "lab/readers/icu.c"
 
 
 def prepare():
-    try:
-        releases.prepare()
-        releases.once(TARGET, [
-            releases.TARGET / "inputs", shutil.which("zic"), __file__, ICU_SOURCE,
-            *sorted(PROJECT.glob("tools/make*"))], make)
-    except (releases.NotOfTheForm, subprocess.CalledProcessError) as failed:
-        sys.exit(f"demo: {failed}")
+    releases.prepare()
+    releases.once(TARGET, [
+        releases.TARGET / "inputs", shutil.which("zic"), __file__, ICU_SOURCE,
+        *sorted(PROJECT.glob("tools/make*"))], make)
 
 
 def names() -> releases.Names:

@@ -17,6 +17,7 @@ import tempfile
 from pathlib import Path
 from typing import NamedTuple
 
+from lab.words.command import stop
 from lab.words.places import BUILD, PROJECT
 
 TARGET = BUILD / "releases"
@@ -27,18 +28,17 @@ LISBON = r"(?m)^(Z Europe/Lisbon .*\n(?:[^RLZ].*\n)*?0 (\S+) WE%sT)$"
 RESOURCES = "metaZones.res timezoneTypes.res windowsZones.res zoneinfo64.res".split()
 
 
-class NotOfTheForm(Exception):
-    """The data of this machine is not what is expected."""
-
-
 def output(*command, **options) -> bytes:
-    return subprocess.run(command, stdout=subprocess.PIPE, check=True, **options).stdout
+    done = subprocess.run(command, stdout=subprocess.PIPE, **options)
+    if done.returncode:
+        stop(1, f"failed: {' '.join(map(str, command))}")
+    return done.stdout
 
 
 def find(what: str, pattern: str, text: str) -> re.Match[str]:
     if found := re.search(pattern, text, re.MULTILINE):
         return found
-    raise NotOfTheForm(f"this machine has no {what} of the expected form")
+    stop(1, f"this machine has no {what} of the expected form")
 
 
 def tool(name: str, **options: str | Path) -> list[str]:
@@ -59,7 +59,7 @@ def once(target: Path, inputs: list, make):
         return
     if target.exists():
         if not made_from.exists():
-            raise NotOfTheForm(f"{target} is there, and not made by this; remove it")
+            stop(1, f"{target} is there, and not made by this; remove it")
         shutil.rmtree(target)
     target.mkdir(parents=True)
     made_from.touch()  # from here on it is
@@ -177,7 +177,7 @@ def icu_text(folder: Path, release: str, lisbon_from: int | None) -> str:
     zones = list(re.finditer(r"^        (?:\{\n.*?^        \}|:int \{.*?\})", text,
                              re.MULTILINE | re.DOTALL))
     if len(zones) != len(names):
-        raise NotOfTheForm("this machine's ICU data has zones of another form")
+        stop(1, "this machine's ICU data has zones of another form")
     lisbon = zones[names.index("Europe/Lisbon")]
     return (text[:lisbon.start()] + central(lisbon[0], lisbon_from)
             + text[lisbon.end():])
@@ -214,18 +214,13 @@ def central(entry: str, year: int) -> str:
 
 
 def make_system(release: str, schema: str, out: Path):
-    run(tool("make-system", **given(release), schema=schema, out=out))
+    output(*tool("make-system", **given(release), schema=schema, out=out))
 
 
 def make_update(release: str, system: Path, out: Path):
-    run(tool("make-update", **given(release), system=system, out=out))
+    output(*tool("make-update", **given(release), system=system, out=out))
 
 
 def given(release: str) -> dict[str, Path]:
     """The options that name a release."""
     return {"rules": TARGET / release / "tzdata.zi", "icu": TARGET / release / "icu"}
-
-
-def run(command: list[str]):
-    if subprocess.run(command, stdout=subprocess.DEVNULL).returncode:
-        raise NotOfTheForm(f"failed: {' '.join(command)}")

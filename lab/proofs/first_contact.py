@@ -144,8 +144,9 @@ def test_a_folder_that_somebody_else_made_is_refused(tmp_path):
     refusal = f"{parts} is there, and not made by this; remove it"
     assert refusal in told(run(PROJECT / "scripts/device", MARLIN_BUILD=str(tmp_path)),
                            77)
-    with pytest.raises(releases.NotOfTheForm, match="not made by this"):
+    with pytest.raises(SystemExit):
         releases.once(parts, [], parts.rmdir)
+    assert parts.exists()
 
 
 def test_a_signal_that_python_ignores_ends_a_command():

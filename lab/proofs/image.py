@@ -30,9 +30,7 @@ def console(tmp_path_factory):
     """A system from the recipe, logged in."""
     place = tmp_path_factory.mktemp("image")
     release = releases.names().system
-    given = releases.given(release)
-    releases.run(releases.tool("make-system", **given, schema=releases.icu_schema(),
-                               out=place / "system"))
+    releases.make_system(release, releases.icu_schema(), place / "system")
     package("release", place)
     text = (PROJECT / "docs/integration.md").read_text()
     recipe = re.search(r"(?s)<!-- image -->\n```\n(.*?)```\n<!-- end -->", text)[1]
