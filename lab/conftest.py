@@ -128,8 +128,8 @@ def pytest_sessionfinish(session):
 def pytest_terminal_summary(terminalreporter):
     if TALLY.get("events"):
         from lab.proofs.life import EVENTS
-        terminalreporter.line("\nEvents, and how often each kind came next, in the same "
-                              "order:")
+        terminalreporter.line("\nEvents, and how often each kind came next, in the "
+                              "same order:")
         for one in EVENTS:
             followed = [TALLY.get(one + PAIR + other, 0) for other in EVENTS]
             total = sum(followed) + TALLY.get(one + PAIR + "the end", 0)

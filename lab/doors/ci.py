@@ -34,7 +34,7 @@ def run(*command, words=""):
     status = subprocess.run(command, cwd=PROJECT, input=words, text=True).returncode
     if status:
         stop(77 if status == 77 else 1,
-             f"exit status {status}: {shlex.join(map(str, command))}")
+             f"exit status {status}: {shlex.join(map(str, command[:6]))}")
 
 
 def files(*patterns: str) -> list[str]:
@@ -46,15 +46,7 @@ def files(*patterns: str) -> list[str]:
                       if name not in (".git", "build") and here / name != BUILD]
         found += [str((here / name).relative_to(PROJECT)) for name in names
                   if any((here / name).match(pattern) for pattern in patterns)]
-    return sorted(found)
-
-
-def many(command: str, names: list[str], at_once=1):
-    """Runs a command on files, four of them in each of so many processes."""
-    if not names:
-        stop(1, f"no files for {command}")
-    run("xargs", "-0", "-n", "4", "-P", str(at_once), *shlex.split(command),
-        words="\0".join(names))
+    return sorted(found) or stop(1, f"no files like {patterns}")
 
 
 def another_version(tool: str) -> bool:
@@ -69,7 +61,7 @@ def check_format():
     need("lint")
     if another_version("clang-format"):
         return
-    many("clang-format --dry-run --Werror", files("*.cpp", "*.c", "*.h"))
+    run("clang-format", "--dry-run", "--Werror", *files("*.cpp", "*.c", "*.h"))
 
 
 def clang_tidy():
@@ -79,14 +71,15 @@ def clang_tidy():
     folder = configure("clang")
     product = [name for name in files("*.cpp")
                if name.startswith(("driver/", "dataset/", "support/"))]
-    many(f"clang-tidy --quiet -p {shlex.quote(str(folder))}", product, os.cpu_count())
+    run("xargs", "-0", "-n", "4", "-P", str(os.cpu_count()), "clang-tidy", "--quiet",
+        "-p", folder, words="\0".join(product))
 
 
 def check_shell():
     need("lint")
-    many("shellcheck -x", [
+    run("shellcheck", "-x", *(
         name for name in files("*")
-        if re.match(rb"#!.*\b(ba)?sh\b", (PROJECT / name).read_bytes())])
+        if re.match(rb"#!.*\b(ba)?sh\b", (PROJECT / name).read_bytes())))
     for door in sorted((PROJECT / "scripts").iterdir()):
         if door.is_file() and len(door.read_text().splitlines()) > LONGEST_DOOR:
             stop(1, f"{door.name} has more lines than a door may have, {LONGEST_DOOR}")
@@ -95,8 +88,8 @@ def check_shell():
 def check_python():
     need("lint")
     names = files("*.py", "tools/make-*")
-    many("/usr/bin/python3 -m pycodestyle --max-line-length=88", names)
-    many("/usr/bin/python3 -m pyflakes", names)
+    run("/usr/bin/python3", "-m", "pycodestyle", "--max-line-length=88", *names)
+    run("/usr/bin/python3", "-m", "pyflakes", *names)
 
 
 def first_contact():

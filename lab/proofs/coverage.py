@@ -5,7 +5,7 @@ Measures which lines and branches of driver/, dataset/ and support/ the tests ru
 through, those of the program that they boot included. Fails unless all of them are.
 Not counted as branches are the edges on which exceptions leave a call, and whether the
 address of a reference is null, which the compiler asks before a dynamic_cast; nor as
-lines those that only close a block, which some compilers take for the way of exceptions.
+lines those that only close a block, which some compilers take for an exception's way.
 
 The report is build/coverage/report/index.html. Exit status: 0 when everything is
 covered, 1 when a test fails or something is not, 2 for bad use.
