@@ -19,6 +19,7 @@ from lab.words.places import BUILD  # noqa: E402
 
 TALLY = {}
 PAIR = ", then "  # in the title of two kinds of events that met
+REASON = "marlin-status said: "  # before a reason; of them only their number is shown
 # Of tests that scripts/prove cannot run.
 DOORS = {"lab/arm64_device/": "device --tests",
          "lab/proofs/cuts": "device --tests", "lab/debian_systems/": "device --systems",
@@ -115,6 +116,9 @@ def never_seen() -> list[str]:
     if TALLY.get("events", 0) >= 50_000:
         from lab.proofs.life import EVENTS
         wanted += [one + PAIR + other for one in EVENTS for other in EVENTS]
+    if TALLY.get("devices asked about", 0) >= 20_000:
+        from lab.oracles.status import OF_STORAGE, REASONS
+        wanted += [REASON + reason for reason in REASONS - OF_STORAGE]
     return [title for title in wanted if not TALLY.get(title)]
 
 
@@ -137,6 +141,10 @@ def pytest_terminal_summary(terminalreporter):
                 f"{number:4}" for number in followed))
     for title in never_seen():
         terminalreporter.line(f"FAILED: never seen: {title}")
+    shown = {title: number for title, number in TALLY.items()
+             if PAIR not in title and not title.startswith(REASON)}
+    if reasons := sum(title.startswith(REASON) for title in TALLY):
+        shown["reasons of marlin-status that were met"] = reasons
     terminalreporter.line("figures: " + "; ".join(
         f"{title.removeprefix('test_').replace('_', ' ')}: {number}"
-        for title, number in TALLY.items() if PAIR not in title))
+        for title, number in shown.items()))

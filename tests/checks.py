@@ -147,21 +147,12 @@ def manual_pages() -> Iterator[str]:
     yield from differences(texts, "the program", set(lines.FORMATS),
                            "lab/words/lines.py")
 
-    # What marlin-status knows of a boot: its lines, and why it does what.
+    # The lines by which marlin-status knows what a boot does.
     known = Path("tools/status/explanation.cpp").read_text()
     named = re.search(r"namespace lines \{\n(.*?)\n\}", known, re.S)[1]
     for text in re.findall(r'=\s*"([^"]*)";', named):
         if text not in texts:
             yield f"marlin-status looks for a line that no boot prints: {text}"
-    reasons = {" ".join(row) for row in re.findall(
-        r'^    \{"(\w+)", "(\w+)", "(\w+)",', known, re.M)}
-    page = Path("docs/marlin-status.8").read_text()
-    page = re.search(r"^\.Sh STEPS\n(.*?)^\.Sh ", page, re.M | re.S)[1]
-    told = {f"{name} {does} {reason}"
-            for name, rows in re.findall(r"^\.It Cm (\w+)\n([^.]*)", page, re.M)
-            for does, listed in re.findall(r"(\w+): ([\w, \n]+)", rows)
-            for reason in listed.replace(",", "").split()}
-    yield from differences(reasons, "marlin-status", told, "its manual page")
 
     zones = re.findall(r'default_zone\[\] = "([^"]+)"', code)
     told_zones = re.findall(r"default zone, ([\w/]+)", marlin)

@@ -27,14 +27,13 @@ from hypothesis import strategies as st
 
 from lab.carriers import boot, namespace
 from lab.carriers.boot import Booted
-from lab.oracles import model, properties
+from lab.oracles import model, properties, status
 from lab.oracles.conditions import Condition
 from lab.oracles.installer import (BUSY, DONE, FAILED, NOT_NEWER, PROGRAM, announced,
                                    below, hidden, put_update)
 from lab.oracles.sets import (fits, is_due, is_welcome, link, mixed, names_of, needed,
                               set_of, whole)
 from lab.oracles.trial import entry_differences, trial
-from lab.proofs import status
 from lab.words.device import Device
 from lab.words.paths import (DOWNLOADS, FORMER_ZONEINFO, ICUTZ, LEGACY_ICUTZ, LOCALTIME,
                              OLD_ICU, RECORD, SYSTEM_ICU, SYSTEM_ZONEINFO, TZ_LATEST,

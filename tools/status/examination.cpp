@@ -51,8 +51,9 @@ void insist_on_enough_memory(const report& told) {
 // sound.
 void insist_on_rights(const report& told, const place& here) {
   const std::string& foreign = told.device.foreign_part;
-  if (!foreign.empty() && (told.why.is != verdict::sound ||
-                           told.device.has_closed_part || !here.has_one_owner))
+  if (!foreign.empty() &&
+      (told.why.is != verdict::sound || told.device.has_closed_part ||
+       !here.owner_may_change_links))
     throw cannot_tell(escaped(foreign) +
                       " belongs to another user or group, or has an access "
                       "list; run this as root");
@@ -60,25 +61,25 @@ void insist_on_rights(const report& told, const place& here) {
 
 // Tried, because it does not follow from the links.
 bool is_mended_by_a_removal(const report& told) {
-  return told.after == told.device.links && !fits(told.after.pair) &&
+  return told.after == told.device.links && !told.after.pair.fits &&
          ::unlink(paths::zoneinfo_link) == 0 && rehearse_boot().ends_normally &&
-         fits(read_links().pair);
+         read_links().pair.fits;
 }
 
 }  // namespace
 
 report examine(const std::string& root) {
   limit_time();
-  const place here = enter_throwaway_device(root);
+  place here = enter_throwaway_device(root);
   become_the_boot();
   limit_memory();
   count_refusals();
   report told;
-  told.device = read_device();
+  told.device = read_device(here.seen);
   if (!here.has_all_users) {
     told.device.foreign_part = here.foreign_part;
     told.device.has_known_owner = !here.has_foreign_links;
-    note_rights(told.device);
+    note_rights(told.device, here.seen);
   }
   insist_on_enough_memory(told);
   told.boot = rehearse_boot();

@@ -19,7 +19,7 @@ enum class verdict {
 struct step {
   std::string name;    // such as "update"
   std::string does;    // such as "refused"
-  std::string reason;  // such as "older"; together they name a row of the table
+  std::string reason;  // such as "older"; the page lists all
   std::string text;    // the same for a person, device texts escaped
 
   std::string sentence() const;  // the text, after the name in words

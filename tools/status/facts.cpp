@@ -9,8 +9,6 @@
 #include <algorithm>
 #include <array>
 #include <cerrno>
-#include <climits>
-#include <cstdlib>
 #include <cstring>
 #include <map>
 #include <memory>
@@ -25,6 +23,7 @@
 #include "support/fsutil.h"
 #include "support/paths.h"
 #include "tools/status/rehearsal.h"
+#include "tools/status/sight.h"
 
 namespace {
 
@@ -53,31 +52,6 @@ bool is_regular(const std::string& path) {
   return ::stat(path.c_str(), &status) == 0 && S_ISREG(status.st_mode);
 }
 
-std::string real_path(const std::string& path) {
-  char real[PATH_MAX];
-  return ::realpath(path.c_str(), real) == nullptr ? "" : real;
-}
-
-// Whose the first part is, on the way or at its end, that others than its owner
-// may not pass or, a directory too if `lists`, read.
-std::optional<uid_t> owner_of_closed(const std::string& path, bool lists) {
-  char resolved[PATH_MAX];
-  // What is on the way is there too if this process may not go on.
-  if (::realpath(path.c_str(), resolved) == nullptr && errno != EACCES)
-    return std::nullopt;
-  const std::string real = resolved;
-  struct stat status {};
-  for (std::size_t end = 0; end < real.size();) {
-    end = std::min(real.find('/', end + 1), real.size());
-    if (::stat(real.substr(0, end).c_str(), &status) != 0) return status.st_uid;
-    const mode_t needed = !S_ISDIR(status.st_mode) ? S_IROTH
-                          : lists                  ? S_IXOTH | S_IROTH
-                                                   : S_IXOTH;
-    if ((status.st_mode & needed) != needed) return status.st_uid;
-  }
-  return std::nullopt;
-}
-
 entry record_at(const char* path) {
   entry record = entry_at(path);
   if (record.what != entry::kind::file) return record;
@@ -95,51 +69,63 @@ entry record_at(const char* path) {
 }
 
 link_pair pair_of(const link_facts& links) {
-  if (!links.current_path) return link_pair::no_dataset;
+  if (!links.current_path) return {};
   const std::string& path = *links.current_path;
-  const bool has_icu = links.icutz.what != entry::kind::none;
-  if (path.empty())
-    return has_icu ? link_pair::system_with_icu : link_pair::system;
-  if (links.zoneinfo.text != path + "/zoneinfo") return link_pair::not_the_tree;
-  if (!has_icu) return link_pair::update_without_icu;
   const std::string icu = path + "/icutz";
-  return links.icutz.text == icu || is_same_directory(paths::icu_link, icu)
-             ? link_pair::update
-             : link_pair::update_with_other_icu;
+  const bool has_icu = links.icutz.what != entry::kind::none;
+  const link_pair one{path.empty() ? "system" : "update",
+                      "zoneinfo and icutz name the same data", true};
+  if (path.empty() && has_icu)
+    return {"system_with_icu",
+            "zoneinfo names the system partition, but there is a link icutz"};
+  if (path.empty()) return one;
+  if (links.zoneinfo.text != path + "/zoneinfo")
+    return {"not_the_tree",
+            "zoneinfo leads into an update, but not to its tree"};
+  if (!has_icu)
+    return {"update_without_icu",
+            "zoneinfo names an update, but there is no link icutz"};
+  if (links.icutz.text == icu || is_same_directory(paths::icu_link, icu))
+    return one;
+  return {"update_with_other_icu",
+          "icutz does not name the ICU data of zoneinfo's update"};
 }
 
-void note_need(const char* label, const char* link,
-               std::map<std::string, std::vector<std::string>>& sets) {
-  const entry here = entry_at(link);
-  if (here.what != entry::kind::link) return;
-  // By its text, or by where it leads; what is in a directory needs that.
-  const std::pair<std::string, std::string> ways[] = {
-      {here.text, paths::download_root},
-      {real_path(link), real_path(paths::download_root) + "/"}};
-  for (const auto& [target, root] : ways) {
-    if (!target.starts_with(root)) continue;
-    const std::string name =
-        target.substr(root.size(), target.find('/', root.size()) - root.size());
-    if (name.empty() || name == "." || name == ".." ||
-        !is_directory(paths::download_root + name))
-      continue;
-    auto& needed_by = sets[name];
-    if (needed_by.empty() || needed_by.back() != label)
-      needed_by.emplace_back(label);
-  }
-}
+// The links that need a download, and their names.
+constexpr std::pair<const char*, const char*> needing[] = {
+    {"zoneinfo", paths::zoneinfo_link},
+    {"icutz", paths::icu_link},
+    {"tz_latest", paths::latest_update_link},
+    {"/var/db/icutz", paths::legacy_icu_link},
+};
 
-void list_downloads(device_facts& device) {
+void list_downloads(device_facts& device, sight& seen) {
   std::vector<std::string> names;
   device.downloads_error = list_directory(paths::download_root, names);
   device.has_more_downloads = names.size() > most_names;
   std::map<std::string, std::vector<std::string>> sets;
   for (const auto& name : names)
     if (is_directory(paths::download_root + name)) sets[name];
-  note_need("zoneinfo", paths::zoneinfo_link, sets);
-  note_need("icutz", paths::icu_link, sets);
-  note_need("tz_latest", paths::latest_update_link, sets);
-  note_need("/var/db/icutz", paths::legacy_icu_link, sets);
+
+  const std::string real_root = seen.follow(paths::download_root).real + "/";
+  for (const auto& [label, link] : needing) {
+    // By its text, or by where it leads; what is in a directory needs that.
+    const std::string text = target_of(link);
+    const std::string real = text.empty() ? text : seen.follow(link).real;
+    for (const auto& [target, root] :
+         {std::pair<std::string, std::string>(text, paths::download_root),
+          {real, real_root}}) {
+      if (!target.starts_with(root)) continue;
+      const std::string name = target.substr(
+          root.size(), target.find('/', root.size()) - root.size());
+      if (name.empty() || name == "." || name == ".." ||
+          (!sets.contains(name) && !is_directory(paths::download_root + name)))
+        continue;
+      auto& needed_by = sets[name];
+      if (needed_by.empty() || needed_by.back() != label)
+        needed_by.emplace_back(label);
+    }
+  }
   for (const bool is_needed : {true, false})
     for (const auto& [name, needed_by] : sets)
       if (needed_by.empty() != is_needed)
@@ -190,20 +176,22 @@ std::string icu_schema_of(const mln_dataset& built) {
   return {};
 }
 
-// Building it tells; what is kept afterwards is short.
-dataset_facts facts_of(const std::string& path, const mln_dataset* system) {
+// Building it tells; what is kept afterwards is short, and the `system`.
+dataset_facts facts_of(const std::string& path,
+                       std::unique_ptr<const mln_dataset>& system) {
   dataset_facts facts;
   facts.path = path;
   const unsigned before = refused;
   errno = 0;
   walk_was_refused = false;
   try {
-    const mln_dataset built(path);
-    facts.version_text = built.version_string.substr(0, longest_word);
-    facts.version = built.version;
-    facts.schema = icu_schema_of(built);
+    auto built = std::make_unique<const mln_dataset>(path);
+    facts.version_text = built->version_string.substr(0, longest_word);
+    facts.version = built->version;
+    facts.schema = icu_schema_of(*built);
     facts.fits_system =
-        path.empty() || (system != nullptr && built.compatible_with(*system));
+        path.empty() || (system && built->compatible_with(*system));
+    if (path.empty()) system = std::move(built);
   } catch (const std::invalid_argument&) {
     facts.ends = dataset_facts::state::bad_path;
   } catch (const std::out_of_range&) {
@@ -221,19 +209,21 @@ dataset_facts facts_of(const std::string& path, const mln_dataset* system) {
 
 }  // namespace
 
+std::string target_of(const char* link) {
+  char target[longest_text];
+  const ssize_t length = ::readlink(link, target, sizeof target);
+  return {target, static_cast<std::size_t>(std::max<ssize_t>(length, 0))};
+}
+
 entry entry_at(const char* path) {
+  const std::string target = target_of(path);
+  if (!target.empty()) return {entry::kind::link, target};
   struct stat status {};
-  if (::lstat(path, &status) != 0) {
-    if (errno == ENOENT) return {};
-    return {entry::kind::unknown, {}, errno};
-  }
+  if (errno == ENOENT) return {};
+  if (::lstat(path, &status) != 0) return {entry::kind::unknown, {}, errno};
   if (S_ISREG(status.st_mode)) return {entry::kind::file};
   if (S_ISDIR(status.st_mode)) return {entry::kind::directory};
-  if (!S_ISLNK(status.st_mode)) return {entry::kind::special};
-  char target[longest_text];
-  const ssize_t length = ::readlink(path, target, sizeof target);
-  if (length < 0) return {entry::kind::unknown, {}, errno};
-  return {entry::kind::link, {target, static_cast<std::size_t>(length)}};
+  return {entry::kind::special};
 }
 
 int list_directory(const std::string& path, std::vector<std::string>& names) {
@@ -260,13 +250,14 @@ void count_refusals() {
 unsigned refusals() { return refused; }
 
 std::string closed_part() {
+  sight seen;
   for (const char* path :
        {"/var/db/timezone", paths::localtime_link, paths::icu_link})
-    if (owner_of_closed(path, false)) return path;
+    if (seen.follow(path).closed) return path;
   return {};
 }
 
-void note_rights(device_facts& device) {
+void note_rights(device_facts& device, sight& seen) {
   std::vector<std::string> parts = {
       "/var/db/timezone", paths::system_zoneinfo,
       std::string(paths::system_zoneinfo) + "/+VERSION", paths::system_icu,
@@ -277,8 +268,11 @@ void note_rights(device_facts& device) {
     if (*set && !(*set)->path.empty())
       for (const char* part : {"", "/zoneinfo", "/zoneinfo/+VERSION", "/icutz"})
         parts.push_back((*set)->path + part);
+  // The boot's user may be any of the three.
+  constexpr mode_t open_to_all = 0555;
   for (const auto& part : parts)
-    if (const auto owner = owner_of_closed(part, true)) {
+    if (const auto owner =
+            seen.follow(part, open_to_all, open_to_all & 0444).closed) {
       device.has_closed_part = true;
       if (*owner == nobody && device.foreign_part.empty())
         device.foreign_part = part;
@@ -295,7 +289,8 @@ link_facts read_links() {
   links.legacy_icutz = entry_at(paths::legacy_icu_link);
   links.old_icu = entry_at(paths::obsolete_icu);
   struct stat record {};
-  if (::stat(paths::version_record, &record) == 0 && S_ISREG(record.st_mode))
+  if (links.record.what != entry::kind::none &&
+      ::stat(paths::version_record, &record) == 0 && S_ISREG(record.st_mode))
     links.recorded =
         record.st_mtim.tv_sec * 1'000'000'000LL + record.st_mtim.tv_nsec;
   links.is_writable = ::access("/var/db/timezone", W_OK | X_OK) == 0;
@@ -308,7 +303,7 @@ link_facts read_links() {
   return links;
 }
 
-device_facts read_device() {
+device_facts read_device(sight& seen) {
   // A walk that gets no memory looks like one that finds nothing.
   take_lines([](const line& said) {
     if (said.error == ENOMEM) walk_was_refused = true;
@@ -317,15 +312,13 @@ device_facts read_device() {
   device.links = read_links();
   device.legacy_resolves = fsutil::exists(paths::legacy_icu_link);
   device.icutz_resolves = fsutil::exists(paths::icu_link);
-  std::unique_ptr<mln_dataset> system;
-  device.system = facts_of({}, nullptr);
-  if (device.system.ends == dataset_facts::state::built)
-    system = std::make_unique<mln_dataset>();
+  std::unique_ptr<const mln_dataset> system;
+  device.system = facts_of({}, system);
   if (device.links.current_path)
-    device.current = facts_of(*device.links.current_path, system.get());
+    device.current = facts_of(*device.links.current_path, system);
   if (device.links.tz_latest.what == entry::kind::link)
-    device.update = facts_of(latest_update_path(), system.get());
-  list_downloads(device);
+    device.update = facts_of(latest_update_path(), system);
+  list_downloads(device, seen);
   take_lines(nullptr);
   return device;
 }
@@ -339,25 +332,6 @@ std::string kind_of(const entry& here) {
 std::string data_in_use(const link_facts& links) {
   if (!links.current_path) return "none";
   return links.current_path->empty() ? "system" : "update";
-}
-
-bool fits(link_pair pair) {
-  return pair == link_pair::system || pair == link_pair::update;
-}
-
-pair_words words_for(link_pair pair) {
-  static constexpr pair_words words[] = {
-      {"system", "zoneinfo and icutz name the same data"},
-      {"update", "zoneinfo and icutz name the same data"},
-      {"update_without_icu",
-       "zoneinfo names an update, but there is no link icutz"},
-      {"update_with_other_icu",
-       "icutz does not name the ICU data of zoneinfo's update"},
-      {"system_with_icu",
-       "zoneinfo names the system partition, but there is a link icutz"},
-      {"not_the_tree", "zoneinfo leads into an update, but not to its tree"},
-      {"no_dataset", "zoneinfo names no data set"}};
-  return words[static_cast<std::size_t>(pair)];
 }
 
 std::string zone_of(const link_facts& links) {

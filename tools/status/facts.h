@@ -6,9 +6,11 @@
 #include <cstddef>
 #include <optional>
 #include <string>
+#include <string_view>
 #include <vector>
 
 #include "support/version.h"
+#include "tools/status/sight.h"
 
 // What stands at a path. "none" is an answer, `unknown` comes with an errno.
 struct entry {
@@ -22,6 +24,7 @@ struct entry {
 // No more of a text is read.
 inline constexpr std::size_t longest_text = 4096;
 entry entry_at(const char* path);
+std::string target_of(const char* link);  // empty: it is none
 
 // The names in a directory, as it lists them, no more than anybody reads.
 // Returns an errno, or 0.
@@ -58,15 +61,13 @@ struct dataset_facts {
   bool has_version() const { return !(version == mln_version()); }
 };
 
-// How "zoneinfo" and "icutz" fit together.
-enum class link_pair {
-  system,              // the system's tree, no ICU link
-  update,              // both of one update
-  update_without_icu,  // an update's tree, no ICU link
-  update_with_other_icu,
-  system_with_icu,  // the system's tree, an ICU link
-  not_the_tree,     // "zoneinfo" leads into a data set, but not to its tree
-  no_dataset,       // "zoneinfo" names no data set
+// How "zoneinfo" and "icutz" fit together, as a name and as a sentence.
+struct link_pair {
+  std::string_view name = "no_dataset";
+  std::string_view sentence = "zoneinfo names no data set";
+  bool fits = false;
+
+  bool operator==(const link_pair&) const = default;
 };
 
 struct link_facts {
@@ -78,7 +79,7 @@ struct link_facts {
   entry legacy_icutz{};
   entry old_icu{};
   std::optional<std::string> current_path{};  // if "zoneinfo" is accepted
-  link_pair pair = link_pair::no_dataset;
+  link_pair pair{};
   bool zone_is_file = false;            // "localtime" leads to a regular file
   std::optional<long long> recorded{};  // when the record's file was written
   bool is_writable = false;             // the links' directory, by a boot
@@ -116,14 +117,14 @@ link_facts read_links();
 std::string closed_part();
 
 // Notes whose the parts are that a boot reads, where not everybody may.
-void note_rights(device_facts& device);
+void note_rights(device_facts& device, sight& seen);
 
 // How often memory was refused to this process from now on is counted.
 void count_refusals();
 unsigned refusals();
 
 // All of it. The data sets are read as a boot reads them.
-device_facts read_device();
+device_facts read_device(sight& seen);
 
 // The words in which they are told, the same for people and for programs.
 std::string kind_of(const entry& here);
@@ -131,14 +132,6 @@ std::string kind_of(const entry& here);
 // Which data is in use: "system", "update", or "none" when "zoneinfo" names no
 // data set.
 std::string data_in_use(const link_facts& links);
-
-// How the links fit: a name, such as "update_without_icu", and a sentence.
-struct pair_words {
-  const char* name;
-  const char* sentence;
-};
-pair_words words_for(link_pair pair);
-bool fits(link_pair pair);
 
 // The zone that "localtime" names, below the active tree; empty: none.
 std::string zone_of(const link_facts& links);

@@ -56,7 +56,7 @@ json object_of(const link_facts& links) {
     record["text"] =
         links.record.error == 0 ? json(escaped(links.record.text)) : json();
   return {{"in_use", data_in_use(links)},
-          {"pair", words_for(links.pair).name},
+          {"pair", links.pair.name},
           {"zoneinfo", object_of(links.zoneinfo)},
           {"icutz", object_of(links.icutz)},
           {"localtime", object_of(links.localtime)},

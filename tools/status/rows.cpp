@@ -114,8 +114,8 @@ void add_data(rows& shown, const report& told) {
 
 void add_links(rows& shown, const report& told) {
   const link_facts& links = told.device.links;
-  shown.add("links", words_for(links.pair).sentence);
-  if (links.pair != link_pair::system && links.pair != link_pair::update) {
+  shown.add("links", std::string(links.pair.sentence));
+  if (!links.pair.fits) {
     shown.add("", "zoneinfo " + plain(links.zoneinfo));
     shown.add("", "icutz " + plain(links.icutz));
   }

@@ -1,79 +1,126 @@
 // SPDX-License-Identifier: BSD-2-Clause
 #include "tools/status/sight.h"
 
-#include <fcntl.h>
 #include <sys/stat.h>
-#include <sys/xattr.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <cstring>
 #include <set>
+#include <tuple>
 #include <vector>
 
 #include "support/paths.h"
 #include "tools/status/facts.h"
 
-namespace {
-
-void look_at(const std::string& path, sight& seen) {
-  std::string& here = seen[path];
-  struct stat status {};
-  for (const int flags : {AT_SYMLINK_NOFOLLOW, 0}) {
-    if (::fstatat(AT_FDCWD, path.c_str(), &status, flags) != 0) {
-      here.append("error ").append(std::to_string(errno));
-      return;
+sight::way sight::follow(std::string rest, mode_t of_directories,
+                         mode_t of_file) {
+  way found;
+  std::string here;
+  for (int links = 0; links <= 40;) {
+    const place& at = look(here);
+    const auto start = rest.find_first_not_of('/');
+    if (!S_ISDIR(at.mode) && !rest.empty()) return {};
+    const mode_t needed = S_ISDIR(at.mode) ? of_directories : of_file;
+    if (!here.empty() && !found.closed && (at.mode & needed) != needed)
+      found.closed = at.owner;
+    if (start == std::string::npos) {
+      found.real = here.empty() ? "/" : here;
+      return found;
     }
-    here += std::to_string(status.st_mode) + " " +
-            std::to_string(S_ISDIR(status.st_mode) ? 0 : status.st_size) + " ";
-    if (!S_ISLNK(status.st_mode)) break;
-    here += entry_at(path.c_str()).text + " ";
+    rest.erase(0, start);
+    const std::string name = rest.substr(0, rest.find('/'));
+    rest.erase(0, name.size());
+    if (name == "..") here.erase(std::min(here.rfind('/'), here.size()));
+    if (name == "." || name == "..") continue;
+    const place& next = look(here + "/" + name);
+    // What this process may not look at is there too.
+    if (next.error == EACCES) return {{}, found.closed.value_or(at.owner)};
+    if (next.error != 0) return {};
+    if (!S_ISLNK(next.mode)) {
+      here += "/" + name;
+    } else {
+      ++links;
+      if (next.target.starts_with('/')) here.clear();
+      rest.insert(0, next.target);
+    }
   }
-  char list[4096];
-  const ssize_t size = S_ISDIR(status.st_mode)
-                           ? ::getxattr(path.c_str(), "system.posix_acl_access",
-                                        list, sizeof list)
-                           : 0;
-  if (size > 0) here.append(list, static_cast<std::size_t>(size));
+  return {};
 }
 
-void look_into(const std::string& directory, sight& seen) {
+bool sight::place::looks_like(const place& other) const {
+  return std::tie(mode, size, error, target, names) ==
+         std::tie(other.mode, other.size, other.error, other.target,
+                  other.names);
+}
+
+sight::place& sight::look(const std::string& real) {
+  const auto [found, is_new] = seen_.try_emplace(real);
+  place& here = found->second;
+  struct stat status {};
+  if (!is_new) return here;
+  const std::string path = root_ + real;
+  if (::lstat(path.empty() ? "/" : path.c_str(), &status) != 0)
+    here.error = errno;
+  here.mode = status.st_mode;
+  here.owner = status.st_uid;
+  if (!S_ISDIR(here.mode)) here.size = status.st_size;
+  if (S_ISLNK(here.mode)) here.target = ::target_of(path.c_str());
+  return here;
+}
+
+void sight::look_into(const std::string& directory) {
+  const std::string real = follow(directory).real;
   std::vector<std::string> names;
-  list_directory(directory, names);
+  if (!real.empty() && S_ISDIR(look(real).mode) && look(real).names.empty())
+    list_directory(root_ + real, names);
   for (const auto& name : names) {
-    seen[directory] += "\n" + name;
+    look(real).names += name + "/";
     // A name that is listed and hidden does not keep a directory.
-    look_at(directory + "/" + name, seen);
+    look(real + "/" + name);
   }
 }
 
-}  // namespace
+const sight::place& sight::at(const std::string& path) {
+  static const place nothing{.error = ENOENT};
+  const auto name = path.rfind('/');
+  const std::string parent = follow(path.substr(0, name)).real;
+  return parent.empty() ? nothing : look(parent + path.substr(name));
+}
 
-sight look_around() {
-  sight seen;
+void sight::look_around() {
   for (const char* path :
-       {"/var/db", "/var/db/timezone", "/var/db/timezone/tz", paths::icu_link,
-        paths::localtime_link, paths::zoneinfo_link, paths::latest_update_link,
-        paths::version_record, paths::legacy_icu_link, paths::obsolete_icu,
-        "/usr/share/icu/icutzformat.txt"})
-    look_at(path, seen);
-  for (const char* path : {paths::localtime_link, paths::obsolete_icu})
-    look_into(path, seen);
+       {"/var/db/timezone/tz", paths::icu_link, paths::version_record,
+        paths::legacy_icu_link, "/usr/share/icu/icutzformat.txt"})
+    follow(path);
+  look_into(paths::localtime_link);
+  look_into(paths::obsolete_icu);
 
-  const std::string in_use = entry_at(paths::zoneinfo_link).text;
-  std::set<std::string> trees = {paths::system_zoneinfo};
+  const std::string in_use = at(paths::zoneinfo_link).target;
+  std::set<std::string> trees = {paths::zoneinfo_link, paths::system_zoneinfo};
   for (const auto& set : {in_use.substr(0, in_use.rfind('/')),
-                          entry_at(paths::latest_update_link).text}) {
+                          at(paths::latest_update_link).target}) {
     if (!set.starts_with(paths::download_root)) continue;
     trees.insert(set + "/zoneinfo");
-    look_at(set + "/icutz", seen);
-    look_into(set + "/icutz", seen);
+    look_into(set + "/icutz");
   }
-  const std::string zone = entry_at(paths::localtime_link).text;
+  const std::string zone = at(paths::localtime_link).target;
   const auto tree_end = zone.find("/zoneinfo/");
   std::set<std::string> files = {"+VERSION", "America/Los_Angeles"};
   if (tree_end != std::string::npos)
     files.insert(zone.substr(tree_end + std::strlen("/zoneinfo/")));
   for (const auto& tree : trees)
-    for (const auto& file : files) look_at(tree + "/" + file, seen);
-  return seen;
+    for (const auto& file : files) follow(tree + "/" + file);
+}
+
+std::optional<std::string> sight::first_difference(const sight& other) const {
+  const auto [one, another] =
+      std::mismatch(seen_.begin(), seen_.end(), other.seen_.begin(),
+                    other.seen_.end(), [](const auto& left, const auto& right) {
+                      return left.first == right.first &&
+                             left.second.looks_like(right.second);
+                    });
+  if (one != seen_.end()) return one->first;
+  if (another != other.seen_.end()) return another->first;
+  return std::nullopt;
 }

@@ -1,13 +1,58 @@
 // SPDX-License-Identifier: BSD-2-Clause
 //
-// What a boot can see, to compare a device with a layer over it.
+// What can be seen of a device.
 #pragma once
 
-#include <map>
-#include <string>
+#include <sys/types.h>
 
-// The kind, mode, size, target, access list and names of each place that a boot
-// looks at or changes, as it stands there and where it leads. No owners. Opens
+#include <map>
+#include <optional>
+#include <string>
+#include <utility>
+
+// Follows paths as the kernel does, and looks at each place only once. Opens
 // nothing but directories. Throws std::bad_alloc only.
-using sight = std::map<std::string, std::string>;
-sight look_around();
+class sight {
+ public:
+  // Of a device that is not "/" yet, and from when on it is.
+  explicit sight(std::string root = {}) : root_(std::move(root)) {}
+  void enter() { root_.clear(); }
+
+  struct way {
+    std::string real{};             // where it leads; empty: nowhere
+    std::optional<uid_t> closed{};  // whose the first part without a mode is
+  };
+  // Directories on the way and at its end, except "/", have to have one mode,
+  // a file at the end the other.
+  way follow(std::string path, mode_t of_directories = 01, mode_t of_file = 04);
+
+  // Looks at each place that a boot looks at or changes, as it stands there and
+  // where it leads.
+  void look_around();
+
+  // Of what was seen, without owners.
+  std::optional<std::string> first_difference(const sight& other) const;
+  template <typename Condition>
+  void forget(Condition is_it) {
+    std::erase_if(seen_, [&](const auto& one) { return is_it(one.first); });
+  }
+
+  struct place {
+    mode_t mode = 0;
+    off_t size = 0;  // not of a directory
+    int error = 0;
+    std::string target{};
+    std::string names{};  // in a directory whose names count
+    uid_t owner = 0;
+
+    bool looks_like(const place& other) const;
+  };
+  const place& at(const std::string& path);  // what stands there itself
+
+ private:
+  place& look(const std::string& real);
+  void look_into(const std::string& directory);
+
+  std::string root_;
+  std::map<std::string, place> seen_{};  // "" is the root
+};

@@ -13,7 +13,6 @@
 #include <sys/xattr.h>
 #include <unistd.h>
 
-#include <algorithm>
 #include <cerrno>
 #include <cstdint>
 #include <cstdio>
@@ -35,7 +34,8 @@ namespace {
 constexpr char writable[] = "/var/db";
 constexpr char links[] = "/var/db/timezone";
 constexpr char downloads[] = "/var/db/timezone/tz";
-constexpr char no_overlay[] = "no overlay can be made here";
+constexpr char in_base[] = "/root";  // the device, as long as it is not "/"
+constexpr char access_list[] = "system.posix_acl_access";
 constexpr char ask_outside[] =
     "; run this as root, and from outside of a container or chroot, with "
     "--root";
@@ -81,22 +81,28 @@ void enter_namespaces() {
   write_file("/proc/self/gid_map", "0 " + std::to_string(group) + " 1\n");
 }
 
-std::optional<uid_t> owner_of(int root, const char* path) {
-  const descriptor opened = open_inside(root, path);
-  struct stat status {};
-  if (opened.number() < 0) return std::nullopt;
-  must(::fstat(opened.number(), &status), "stat");
-  return status.st_uid;
-}
-
 // Before namespaces, in which all other users look like one.
-bool has_one_owner(const std::string& root) {
+bool owner_may_change_links(const std::string& root) {
+  const descriptor device = open_directory(root);
+  struct stat top {
+  }, directory{};
   try {
-    const descriptor device = open_directory(root);
-    return owner_of(device.number(), "/") == owner_of(device.number(), links);
+    const descriptor opened = open_inside(device.number(), links);
+    return ::fstat(device.number(), &top) == 0 &&
+           ::fstat(opened.number(), &directory) == 0 &&
+           top.st_uid == directory.st_uid && (directory.st_mode & S_IWUSR) != 0;
   } catch (const cannot_tell&) {
     return false;
   }
+}
+
+// Attributes and numbers of the device's own mean something to overlayfs, and
+// what is covered loses its access list.
+[[noreturn]] void refuse_layer(const std::string& path) {
+  throw cannot_tell(escaped(path) +
+                    " looks different in an overlay; is it being changed, or "
+                    "has it an access "
+                    "list, an overlay attribute or the device number 0?");
 }
 
 void set_attributes(int tree, unsigned flags, unsigned long attributes) {
@@ -114,8 +120,6 @@ void enter(const descriptor& root) {
 // The kernel's files about this process, also when the root is another.
 class process {
  public:
-  process() : directory_(open_directory("/proc")) {}
-
   std::string path_of(const descriptor& opened) const {
     char path[4096];
     const ssize_t length = ::readlinkat(
@@ -130,12 +134,10 @@ class process {
   }
 
   bool has_all_users() const {
-    const descriptor file = open("self/uid_map");
-    char text[4096];
-    const ssize_t length = ::read(file.number(), text, sizeof text);
-    must(length, "uid_map");
-    return std::string(text, static_cast<std::size_t>(length))
-               .find("4294967295") != std::string::npos;
+    char text[4096] = {};
+    must(::read(open("self/uid_map").number(), text, sizeof text - 1),
+         "uid_map");
+    return std::strstr(text, "4294967295") != nullptr;
   }
 
   // Where something is mounted below a directory, parents first.
@@ -145,13 +147,11 @@ class process {
         ::fdopen(file.release(), "r"), &std::fclose);
     if (!list) must(-1, "mounts");
     std::set<std::string> places;
-    std::vector<char> line(65536);
+    static char line[65536];
     mntent mounted{};
-    while (::getmntent_r(list.get(), &mounted, line.data(),
-                         static_cast<int>(line.size())) != nullptr) {
-      std::string place = mounted.mnt_dir;
-      if (place.starts_with(directory + "/")) places.insert(std::move(place));
-    }
+    while (::getmntent_r(list.get(), &mounted, line, sizeof line) != nullptr)
+      if (std::string(mounted.mnt_dir).starts_with(directory + "/"))
+        places.insert(mounted.mnt_dir);
     if (std::ferror(list.get()) != 0) must(-1, "mounts");
     return places;
   }
@@ -167,7 +167,7 @@ class process {
     return file;
   }
 
-  descriptor directory_;
+  descriptor directory_ = open_directory("/proc");
 };
 
 descriptor clone_tree(const descriptor& place, unsigned flags = 0) {
@@ -184,8 +184,8 @@ void attach(const descriptor& tree, const descriptor& target) {
        "move_mount");
 }
 
-// The layers over "/var/db" and what is mounted below. All paths here are seen
-// from the base, in which the device is "/root".
+// The layers over "/var/db" and what is mounted below. All paths here are real
+// ones, seen from the base.
 class layers {
  public:
   // Finds what has to be covered, before everything becomes read only.
@@ -197,21 +197,33 @@ class layers {
     const std::string top = self_.path_of(base);
     std::set<std::string> places = self_.mounts_below(top);
     places.insert(top);
-    for (const auto& place : places) find(place.substr(std::strlen("/root")));
+    for (const auto& place : places) find(place);
     // Without the layer, which shows some files of an update as missing.
     kept_ = open_inside(root_.number(), downloads, O_DIRECTORY);
   }
 
-  void lay() const {
-    for (const auto& one : found_) {
-      const descriptor target = open_inside(root_.number(), one.path);
-      if (target.number() >= 0) cover(one, target);
-    }
+  void lay() {
+    for (const auto& one : found_) cover(one);
     const descriptor tz = open_inside(root_.number(), downloads, O_DIRECTORY);
     if (kept_.number() < 0 || tz.number() < 0) return;
+    kept_path_ = self_.path_of(tz);
+    // What a unit may write stays so if all around it is only to be read.
+    if (!found_.empty() && found_.front().path.starts_with(kept_path_ + "/"))
+      return;
     const descriptor copy = clone_tree(kept_, AT_RECURSIVE);
     set_attributes(copy.number(), AT_RECURSIVE, MOUNT_ATTR_RDONLY);
     attach(copy, tz);
+  }
+
+  // Whether a path of the device leads through a layer.
+  bool hide(const std::string& path) const {
+    const auto is_in = [](const std::string& inner, const std::string& outer) {
+      return (inner + "/").starts_with(outer + "/");
+    };
+    if (found_.empty()) return false;
+    const std::string& top = found_.front().path;
+    return is_in(in_base + path, top) &&
+           !(is_in(in_base + path, kept_path_) && is_in(kept_path_, top));
   }
 
  private:
@@ -222,26 +234,30 @@ class layers {
   };
 
   void find(const std::string& path) {
-    descriptor place = open_inside(root_.number(), path);
+    descriptor place(::open(path.c_str(), O_PATH | O_CLOEXEC));
     if (place.number() < 0) return;
+    if (::getxattr(path.c_str(), access_list, nullptr, 0) > 0)
+      refuse_layer(path.substr(std::strlen(in_base)));
     struct statvfs status {};
-    must(::fstatvfs(place.number(), &status), "statvfs");
+    if (here_.is_running_system)
+      must(::fstatvfs(place.number(), &status), "statvfs");
     found_.push_back(
-        {path, std::move(place),
-         here_.is_running_system && (status.f_flag & ST_RDONLY) != 0});
+        {path, std::move(place), (status.f_flag & ST_RDONLY) != 0});
   }
 
-  void cover(const covered& below, const descriptor& target) const {
+  void cover(const covered& below) const {
     struct stat status {};
     must(::fstat(below.place.number(), &status), "stat");
-    const std::string name = std::to_string(&below - found_.data());
-    const descriptor cover =
-        S_ISDIR(status.st_mode)   ? layer(below.place, name, status)
-        : S_ISREG(status.st_mode) ? copy(below.place, name, status)
-                                  : clone_tree(below.place);
+    const std::string name =
+        std::string("/").append(std::to_string(&below - found_.data()));
+    if (S_ISDIR(status.st_mode)) return layer(below, name, status);
+    const descriptor cover = S_ISREG(status.st_mode)
+                                 ? copy(below.place, name, status)
+                                 : clone_tree(below.place);
     if (below.is_read_only)
       set_attributes(cover.number(), 0, MOUNT_ATTR_RDONLY);
-    attach(cover, target);
+    const descriptor target(::open(below.path.c_str(), O_PATH | O_CLOEXEC));
+    if (target.number() >= 0) attach(cover, target);
   }
 
   // What a boot sees of the cover is what it sees of the device.
@@ -251,38 +267,26 @@ class layers {
         (here_.has_all_users || errno != EINVAL))
       must(-1, "chown");
     must(::chmod(path.c_str(), status.st_mode & 07777), "chmod");
-    const timespec times[] = {status.st_atim, status.st_mtim};
-    must(::utimensat(AT_FDCWD, path.c_str(), times, 0), "utimensat");
   }
 
   // A writable layer over a directory. Its own place is a directory of the
-  // base, so that no name of the device's becomes part of a list of options.
-  descriptor layer(const descriptor& lower, const std::string& name,
-                   const struct stat& status) const {
-    const std::string upper = "/" + name + "/upper";
-    const std::string work = "/" + name + "/work";
-    for (const auto& path : {"/" + name, upper, work})
+  // base, and the other is the current one, so that no name of the device's
+  // becomes part of a list of options.
+  void layer(const covered& below, const std::string& name,
+             const struct stat& status) const {
+    const std::string upper = name + "/upper";
+    const std::string work = name + "/work";
+    for (const auto& path : {name, upper, work})
       must(::mkdir(path.c_str(), 0700), "mkdir");
     // The layer's own root gives the merged directory its owner and mode.
     resemble(upper, status);
-    const descriptor options(::fsopen("overlay", FSOPEN_CLOEXEC));
-    must(options.number(), no_overlay, ask_outside);
-    const auto configure = [&](unsigned command, const char* key,
-                               const char* value) {
-      must(::fsconfig(options.number(), command, key, value, 0), no_overlay,
-           ask_outside);
-    };
-    must(::fchdir(lower.number()), "chdir");
-    configure(FSCONFIG_SET_STRING, "lowerdir", ".");
-    configure(FSCONFIG_SET_STRING, "upperdir", upper.c_str());
-    configure(FSCONFIG_SET_STRING, "workdir", work.c_str());
+    must(::fchdir(below.place.number()), "chdir");
     // Ordinary users may not set the attributes of the other kind.
-    configure(FSCONFIG_SET_FLAG, "userxattr", nullptr);
-    configure(FSCONFIG_CMD_CREATE, nullptr, nullptr);
-    descriptor mounted(::fsmount(options.number(), FSMOUNT_CLOEXEC, 0));
-    must(mounted.number(), no_overlay, ask_outside);
-    must(::chdir("/"), "chdir");
-    return mounted;
+    const std::string options =
+        "userxattr,lowerdir=.,upperdir=" + upper + ",workdir=" + work;
+    must(::mount("overlay", below.path.c_str(), "overlay",
+                 below.is_read_only ? MS_RDONLY : 0, options.c_str()),
+         "no overlay can be made here", ask_outside);
   }
 
   // Of a file that is mounted by itself, which can have no layer.
@@ -306,46 +310,30 @@ class layers {
   const place& here_;
   std::vector<covered> found_{};  // parents first
   descriptor kept_{};
+  std::string kept_path_{};
 };
 
 // What this user cannot stand in for: in a layer, it cannot be changed.
-void note_foreign_parts(place& here) {
+void note_foreign_parts(place& here, sight& seen) {
   for (const char* path : {"/", writable, links, paths::version_record}) {
+    const sight::way found = seen.follow(path);
+    if (found.real.empty()) continue;
+    const std::string real = in_base + found.real;
     struct stat status {};
-    if (::stat(path, &status) != 0) continue;
-    const bool is_foreign =
-        status.st_uid != 0 || status.st_gid != 0 ||
-        ::getxattr(path, "system.posix_acl_access", nullptr, 0) > 0;
-    if (is_foreign && here.foreign_part.empty()) here.foreign_part = path;
+    must(::lstat(real.c_str(), &status), "stat");
+    if (here.foreign_part.empty() &&
+        (status.st_uid != 0 || status.st_gid != 0 ||
+         ::getxattr(real.c_str(), access_list, nullptr, 0) > 0))
+      here.foreign_part = path;
     if (path == links) here.has_foreign_links = status.st_uid != 0;
   }
-}
-
-void insist_on_a_device(const std::string& root) {
-  struct stat status {};
-  for (const char* path : {writable, paths::system_zoneinfo})
-    if (::lstat(path, &status) == 0) return;
-  throw cannot_tell(escaped(root) + " is not a device: it has neither " +
-                    writable + " nor " + paths::system_zoneinfo);
-}
-
-// Attributes and numbers of the device's own mean something to overlayfs, and
-// what is covered loses its access list.
-void insist_on_the_same(const sight& before, const sight& after) {
-  const auto [one, other] =
-      std::mismatch(before.begin(), before.end(), after.begin(), after.end());
-  if (one == before.end() && other == after.end()) return;
-  throw cannot_tell(escaped(one == before.end() ? other->first : one->first) +
-                    " looks different in an overlay; is it being changed, or "
-                    "has it an access "
-                    "list, an overlay attribute or the device number 0?");
 }
 
 }  // namespace
 
 place enter_throwaway_device(const std::string& root) {
   place here;
-  here.has_one_owner = has_one_owner(root);
+  here.owner_may_change_links = owner_may_change_links(root);
   enter_namespaces();
   must(::mount(nullptr, "/", nullptr, MS_REC | MS_PRIVATE, nullptr), "mount",
        ask_outside);
@@ -362,19 +350,24 @@ place enter_throwaway_device(const std::string& root) {
        ask_outside);
   const descriptor base = open_directory("/proc");
   enter(base);
-  must(::mkdir("/root", 0700), "mkdir");
-  attach(tree, open_directory("/root"));
-  const descriptor inside = open_directory("/root");
-  const layers covers(inside, self, here);
-  set_attributes(inside.number(), AT_RECURSIVE, MOUNT_ATTR_RDONLY);
+  must(::mkdir(in_base, 0700), "mkdir");
+  attach(tree, open_directory(in_base));
+  layers covers(tree, self, here);
+  set_attributes(tree.number(), AT_RECURSIVE, MOUNT_ATTR_RDONLY);
 
-  enter(inside);
-  insist_on_a_device(root);
-  note_foreign_parts(here);
-  const sight before = look_around();
-  enter(base);
+  sight before(in_base);
+  if (before.at(writable).error != 0 &&
+      before.at(paths::system_zoneinfo).error != 0)
+    throw cannot_tell(escaped(root) + " is not a device: it has neither " +
+                      writable + " nor " + paths::system_zoneinfo);
+  if (!here.has_all_users) note_foreign_parts(here, before);
+  before.look_around();
   covers.lay();
-  enter(inside);
-  insist_on_the_same(before, look_around());
+  here.seen = before;
+  here.seen.forget([&](const auto& path) { return covers.hide(path); });
+  here.seen.look_around();
+  if (const auto path = before.first_difference(here.seen)) refuse_layer(*path);
+  enter(tree);
+  here.seen.enter();
   return here;
 }

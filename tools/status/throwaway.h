@@ -5,14 +5,17 @@
 
 #include <string>
 
+#include "tools/status/sight.h"
+
 struct place {
   bool is_running_system = false;
   bool has_all_users = false;  // in no user namespace with fewer
   // The first part that a boot changes and that is another user's; whether the
-  // links' directory is; whether that belongs to whom "/" does.
+  // links' directory is; whether that is of the owner of "/", who may write it.
   std::string foreign_part{};
   bool has_foreign_links = false;
-  bool has_one_owner = false;
+  bool owner_may_change_links = false;
+  sight seen{};  // of the device
 };
 
 // Moves this process, for good, into mount namespaces of its own in which
