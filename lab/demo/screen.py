@@ -63,15 +63,6 @@ def broken(text: str) -> list[str]:
 
 
 def printed(lines: Iterable[str]):
-    """Lines of a boot. One that is too long is broken before the system's text, which
-    follows the last colon."""
-    told = []
-    for line in lines:
-        head, colon, text = line.rpartition(": ")
-        head, text = (head + ":", " " + text) if colon else (line, "")
-        if len(line) > WIDTH - NAME:
-            indent = "\n" + " " * NAME
-            head = indent.join(broken(head))
-            text = indent + " " + text
-        told.append(paint(YELLOW, head) + paint(DIM, text))
-    field("printed", *told or ["nothing"])
+    """Lines of a boot."""
+    parts = [paint(YELLOW, part) for line in lines for part in broken(line)]
+    field("printed", *parts or ["nothing"])
