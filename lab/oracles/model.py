@@ -1,17 +1,15 @@
 # SPDX-License-Identifier: BSD-2-Clause
 """How one boot has to go, call by call.
 
-The first of two oracles. Written from what the program has to do, not from its
-code: a reader checks the model against what is required, and a trial compares it with
-the program. What must hold of any boot is said once more in `properties`,
-without this idea of a boot: a mistake made here and in the program alike shows
-there.
+The first of two oracles. Written from what the program has to do, not from its code: a
+reader checks the model against what is required, and a trial compares it with the
+program. Why there is another: docs/proofs.md.
 
-Only where several ways would do are the calls those that the program chose: how
-much it reads at a time, that it asks what kind of file it has open, the walk. In
-goes a device; out come the device afterwards, the lines that are printed, how the
-process ends, and every file-system call on the way, in order, any of which can be
-made to fail. The sections go from the bottom up.
+Only where several ways would do are the calls those that the program chose: how much it
+reads at a time, that it asks what kind of file it has open, the walk. In goes a device;
+out come the device afterwards, the lines that are printed, how the process ends, and
+every file-system call, any of which can be made to fail. The sections go from the
+bottom up.
 """
 
 import functools
