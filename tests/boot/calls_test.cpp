@@ -69,6 +69,16 @@ TEST_F(WholeListOfCalls, OfAMigrationAnActivationAndACorrection) {
       calls.clear();
     calls += plain(line);
   }
+  const std::string the_system =
+      R"(stat "/usr/share/zoneinfo.default/+VERSION"
+open "/usr/share/zoneinfo.default/+VERSION", O_RDONLY|O_CLOEXEC
+read 3
+close 3
+stat "/usr/share/icu/icutzformat.txt"
+open "/usr/share/icu/icutzformat.txt", O_RDONLY|O_CLOEXEC
+read 3
+close 3
+)";
   EXPECT_EQ(calls, R"(rt_sigaction SIGPIPE
 rt_sigaction SIGXFSZ
 access "/var/db/icutz"
@@ -78,25 +88,9 @@ symlink "/usr/share/icu", "/var/db/timezone/icutz"
 access "/var/db/icutz"
 unlink "/var/db/icutz"
 unlink "/var/db/icu"
-stat "/usr/share/zoneinfo.default/+VERSION"
-open "/usr/share/zoneinfo.default/+VERSION", O_RDONLY|O_CLOEXEC
-read 3
-close 3
-stat "/usr/share/icu/icutzformat.txt"
-open "/usr/share/icu/icutzformat.txt", O_RDONLY|O_CLOEXEC
-read 3
-close 3
-readlink "/var/db/timezone/tz_latest"
+)" + the_system + R"(readlink "/var/db/timezone/tz_latest"
 readlink "/var/db/timezone/zoneinfo"
-stat "/usr/share/zoneinfo.default/+VERSION"
-open "/usr/share/zoneinfo.default/+VERSION", O_RDONLY|O_CLOEXEC
-read 3
-close 3
-stat "/usr/share/icu/icutzformat.txt"
-open "/usr/share/icu/icutzformat.txt", O_RDONLY|O_CLOEXEC
-read 3
-close 3
-stat "/var/db/timezone/tz/2024a.1.0/zoneinfo/+VERSION"
+)" + the_system + R"(stat "/var/db/timezone/tz/2024a.1.0/zoneinfo/+VERSION"
 open "/var/db/timezone/tz/2024a.1.0/zoneinfo/+VERSION", O_RDONLY|O_CLOEXEC
 read 3
 close 3

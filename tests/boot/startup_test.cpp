@@ -364,22 +364,6 @@ TEST_F(StartupPass, UndoesAnActivationThatStopsHalfway) {
   EXPECT_EQ(file_at(record), nothing);
 }
 
-TEST_F(StartupPass, EndsWithADefaultLocalTimeWhenTheCorrectedLinkFails) {
-  // In the second boot the old link stays until the fallback deletes it; the
-  // first that is deleted is "/var/db/icu".
-  for (const auto& [failing, error] :
-       {std::pair("?symlink,symlinkat:error=EIO:when=1", EIO),
-        std::pair("?unlink,unlinkat:error=EIO:when=2", EEXIST)}) {
-    point_localtime_at("/usr/share/zoneinfo/Europe/Paris");
-    const outcome booted = trace({"-e", std::string("inject=") + failing});
-    EXPECT_EQ(booted.lines(),
-              lines(correcting_localtime(zoneinfo + "/Europe/Paris", ENOENT),
-                    cannot_link(local_time, zoneinfo + "/Europe/Paris", error),
-                    resetting_localtime(error)));
-    EXPECT_EQ(link_at(local_time), default_localtime);
-  }
-}
-
 // --- Ends that are not an exit
 
 TEST_F(StartupPass, EndsAbnormallyWhenTheLastResortFails) {
