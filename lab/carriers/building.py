@@ -19,7 +19,7 @@ from lab.words.places import BUILD, PROJECT, shown
 ODD = re.compile(r"""[\x00-\x1f"#*;<>?\\|]|\$\{|['&^`]""")
 # What the machine of a preset cannot do, and the tests that therefore skip themselves.
 MAY_SKIP = {
-    **dict.fromkeys(["dev", "clang", "coverage"], (None, "")),
+    **dict.fromkeys(["dev", "clang"], (None, "")),
     "asan": (r"WholeListOfCalls\.", "a sanitizer makes calls of its own"),
     **dict.fromkeys(["arm64-dev", "armhf-dev"], (
         r"(Calls|DataProtection|WholeListOfCalls)\.",

@@ -1,7 +1,7 @@
 # SPDX-License-Identifier: BSD-2-Clause
 """usage: scripts/test [PRESET] [-R REGEX]
 
-Builds the program and all tests with a preset (dev by default; clang, asan, coverage,
+Builds the program and all tests with a preset (dev by default; clang, asan,
 arm64-dev, armhf-dev), and runs them, or those whose names match REGEX, each on a
 private device of its own. Installs what that takes, as root: some 100 MB of Debian
 packages, 400 MB on the disk; otherwise says what is missing. Nothing else is touched
