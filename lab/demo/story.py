@@ -52,14 +52,12 @@ def tell(story: Story):
   record      the versions before and after the last update
   clock       what "date" shows at noon UTC on 1 February {year}
   ICU clock   the same of a program with Debian's ICU""")
-    screen.say("""Before each boot marlin-status is asked what it will do, and every
-        answer is compared with what it then did.""")
-    screen.say("""The device is private and gone when this ends. Its data is real,
-        that of this machine, except for the names of the releases and one invention
-        in the later ones: Lisbon goes from Western European Time, WET, to Central
-        European Time, CET, in the zone files and in the ICU data. All of it is made
-        by make-system and make-update. One download is made for another ICU
-        format.""")
+    screen.say("""Before each boot marlin-status tells what it will do.""")
+    screen.say("""The device is private and gone when this ends. Its data is this
+        machine's, except for the names of the releases and one invention in the later
+        ones: Lisbon goes from Western European Time, WET, to Central European Time,
+        CET, in the zone files and in the ICU data. One download is made for another
+        ICU format.""")
     print(f"""
   {screen.paint(screen.DIM, " " * 12 + "ICU format   Lisbon changes   what it is")}
   {names.system:<11} {names.icu:<12} never            system partition, at first
