@@ -142,17 +142,6 @@ def test_an_update(place):
     assert {mode for mode, _ in found.values()} == {"0o40755", "0o100644"}
 
 
-def test_what_people_are_told(place):
-    done = update(place)
-    assert done.stdout == (
-        f"{place}/out/{NAMES.update}.1.0: {NAMES.update}.1.0 for systems with "
-        f"{NAMES.system}.1.0 and the ICU schema {NAMES.icu}\n"
-        f"zones that differ from the system's from {SINCE} on: {len(LISBON)}\n" +
-        "".join(f"  {name}\n" for name in LISBON) +
-        "zones that are new: none\nzones that are gone: none\n"
-        "the times that ICU tells were not compared: install python3-icu\n")
-
-
 def test_a_system(place):
     out = place / "out/new"
     facts = made(system(place, "--json"))
