@@ -9,7 +9,7 @@ calls can cost: "the floor", lab/bench/floor.c.
                 3 percent, for calls by a single one
   --record      writes lab/bench/baseline.json anew
   --companions  marlin-install with an update of 1 MB, which may take 100 ms beside
-                fsync(2) and 16 MB; marlin-mend, which has to cost less than marlin
+                syncfs(2) and 16 MB; marlin-mend, which has to cost less than marlin
 
 Installs the Debian packages that it needs. Instructions are those of an environment
 that holds only PATH: each variable more costs some 550 in the C library's start-up, for
