@@ -19,6 +19,7 @@ import subprocess
 import tarfile
 import termios
 from pathlib import Path
+from urllib.parse import unquote
 
 import pytest
 
@@ -39,18 +40,15 @@ from lab.words.seen import Seen
 BLOCK = 50
 
 
-def times(*places: str) -> dict[bytes, tuple]:
+def times(*places: str) -> dict[str, tuple]:
     """Of access, too. Asked without a look that would change them."""
     found = {}
-    for place in places:
-        for folder, folders, names in os.walk(os.fsencode(place)):
-            for path in [folder, *(os.path.join(folder, name)
-                                   for name in folders + names)]:
-                with contextlib.suppress(PermissionError):
-                    status = os.lstat(path)
-                    found[path] = (status.st_ino, status.st_atime_ns,
-                                   status.st_mtime_ns, status.st_ctime_ns,
-                                   status.st_mode)
+    for folder, folders, names in itertools.chain(*map(os.walk, places)):
+        for path in folder, *(f"{folder}/{name}" for name in folders + names):
+            with contextlib.suppress(PermissionError):
+                here = os.lstat(path)
+                found[path] = (here.st_ino, here.st_mode, here.st_atime_ns,
+                               here.st_mtime_ns, here.st_ctime_ns)
     return found
 
 
@@ -59,8 +57,8 @@ def examine(device: Device, tell: str, count):
     namespace.build(device)
     before, untouched = namespace.look(), times(*PLACES)
     answer = ask("--json")
-    found = [f"changed: {path}" for path, now in times(*PLACES).items()
-             if untouched.get(path) != now]
+    found = [f"changed: {now}" for now in
+             times(*PLACES).items() - untouched.items()]
     if answer.status == 77:
         fail(tell, [*found, answer.errors], before)
     said = answer.said
@@ -152,18 +150,17 @@ class Tree(Device):
 def word(text: str):
     if re.fullmatch("0[0-7]{3}", text):
         return int(text, 8)
-    return re.sub("^[A-Z_]+(?=/|$)", lambda match: WORDS.get(match[0], match[0]), text)
+    text = re.sub("^[A-Z_]+(?=/|$)", lambda match: WORDS.get(match[0], match[0]), text)
+    return unquote(text, "latin-1")
 
 
-def unpack(story: str, *changes: tuple):
-    """Has a tree below TREE. A change is a verb of Tree, with its arguments; in a story
-    they are words, with ";" between changes."""
+def unpack(story: str):
+    """Has a tree below TREE, changed by verbs of Tree with their arguments; there is
+    ";" between changes, and "%20" for a blank."""
     namespace.insist_on_private_device()
     tree = Tree()
-    for verb, *arguments in [*(change.split() for change in story.split(";") if change),
-                             *changes]:
-        getattr(tree, verb)(*(word(one) if isinstance(one, str) and not changes else one
-                              for one in arguments))
+    for verb, *words in (change.split() for change in story.split(";") if change):
+        getattr(tree, verb)(*map(word, words))
     os.makedirs(TREE, exist_ok=True)
     namespace.empty(TREE)
     namespace.build_below(TREE, tree.root, exists=True)
@@ -185,7 +182,6 @@ def fact(said, name: str):
 TREES = [
     (0, "", "now.pair system"),
     (0, "use 2024a.1.0", "now.pair update", "current.version 2024a.1.0"),
-    (0, "use 2024a.1.0; announce 2024a.1.0", "update same_set"),
     (2, "use 2024a.1.0; drop ICUTZ", "now.pair update_without_icu"),
     (2, "use 2024a.1.0; link ICUTZ TZ/2023d.1.0/icutz",
      "now.pair update_with_other_icu"),
@@ -195,20 +191,20 @@ TREES = [
     (2, "use 2024a.1.0; link ZONEINFO U/x", "now.pair not_the_tree"),
     (1, "drop ZONEINFO", "now.zoneinfo.kind none", "current no_link"),
     (2, "link ZONEINFO none", "now.zoneinfo.target none", "now.pair no_dataset"),
+    (2, "link ZONEINFO (a%20directory)", "now.zoneinfo.target (a directory)"),
+    (2, "link ZONEINFO x%0amarlin:%20forged:%20No%20error",
+     r"next_boot.lines.0 marlin: Bad zoneinfo link x\x0amarlin: forged: No error: "
+     "No such file or directory"),
+    (2, "announce a%0ab%1b[2J%20%25s%ff\\",
+     r"now.tz_latest.target /var/db/timezone/tz/a\x0ab\x1b[2J %s\xff\\"),
     (2, "file ZONEINFO", "now.in_use none"),
-    (2, "drop ZONEINFO; directory ZONEINFO/x", "next_boot.ends abnormally"),
-    (2, "announce 2147483648a", "announced.state number_too_large"),
     (2, "use 2147483648a", "last_resort current_number_too_large"),
     (2, "file SYSTEM/+VERSION 2147483648a; use 2024a.1.0", "next_boot.ends abnormally",
      "system.version", "last_resort system_number_too_large"),
     (2, "drop SYSTEM/+VERSION", "system.version"),
-    (2, "drop SYSTEM", "system.version"),
     (2, "drop SYSTEM_ICU/icutzformat.txt", "system.schema"),
     (2, "drop SYSTEM/+VERSION; directory SYSTEM/+VERSION", "system.version",
      "system.unreadable.0.error Not a file"),
-    (2, "fifo SYSTEM/+VERSION", "system.version"),
-    (1, "announce 2024a.1.0; fifo U/zoneinfo/+VERSION", "update newer"),
-    (2, "announce 2024a.1.0; fifo U/icutz/icutz44l.dat", "announced.schema"),
     (2, "announce 2024a.1.0; file U/icutz/icutz44l.dat ICU 0640", "announced.schema",
      "announced.unreadable.0.error Others may not read it"),
     # Readers who are not root could not read it.
@@ -217,7 +213,6 @@ TREES = [
     (2, "use 2024a.1.0; move U/zoneinfo /var/db/tree; link U/zoneinfo /var/db/shut/way;"
      "link /var/db/shut/way ../tree; directory /var/db/shut 0700",
      "reasons.0.code closed"),
-    (2, "announce 2024a.1.0; drop U/icutz", "update other_schema"),
     (2, "use 2024a.1.0; drop U/icutz/icutz44l.dat; file U/icutz/icutz45l.dat;"
      "file U/icutz/icutz46l.dat", "current.has_several_schemas True"),
     (0, "use 2024a.1.0; link U/icutz/icutz45l.dat U/icutz/icutz44l.dat;"
@@ -231,7 +226,6 @@ TREES = [
      "now.zone_is_file False"),
     (2, "announce 2024a.1.0; link RECORD /etc/passwd",
      "next_boot.after.record.target /etc/passwd"),
-    (2, "announce 2024a.1.0; directory RECORD", "record not_opened"),
     (2, "announce 2024a.1.0; file RECORD 2 0444", "record not_opened"),
     (2, "announce 2024a.1.0; file RECORD 2023c.1.0_2024a.1.0 0444",
      "record not_opened"),
@@ -246,7 +240,6 @@ TREES = [
      "next_boot.ends abnormally"),
     (2, "announce 2024a.1.0; directory TIMEZONE 0555", "next_boot.ends abnormally"),
     (2, "directory TIMEZONE 0555", "reasons.0.code not_writable"),
-    (2, "directory TIMEZONE 0000"),
     (0, "directory TZ 0000"),
     # Behind what the boot removes.
     (2, "use 2024a.1.0; announce 2024b.1.0; move TZ/2024b.1.0/icutz /var/db/real;"
@@ -263,11 +256,7 @@ TREES = [
     (0, "file TZ", "downloads []", "downloads_error Not a directory"),
     (2, "file /var/db", "old_icu unreachable", "legacy_icu_link unreachable"),
     (2, "drop /var"),
-    (2, "drop TIMEZONE", "next_boot.ends abnormally"),
-    (2, "drop LOCALTIME; drop SYSTEM/America", "localtime no_link"),
-    (1, "link LOCALTIME /usr/share/zoneinfo/Europe/Paris", "localtime former_place"),
     (2, "link LOCALTIME ZONEINFO/Europe/Nowhere", "reasons.0.subject local_zone"),
-    (2, "link LEGACY_ICUTZ SYSTEM_ICU", "legacy_icu_link no_present_link"),
     (1, "announce 2024a.1.0; sparse U/zoneinfo/+VERSION", "update newer"),
     (0, "use 2024a.1.0; fill TZ 10100", "has_more_downloads True",
      "downloads [{'name': '2024a.1.0', 'needed_by': ['zoneinfo', 'icutz']}]"),
@@ -279,10 +268,6 @@ TREES = [
 def test_a_tree(status, story, facts, count):
     """Of any device: the status, the facts, and not a trace left on it."""
     unpack(story)
-    tell_of_the_tree(status, facts, count)
-
-
-def tell_of_the_tree(status, facts, count):
     before = times(TREE)
     answer = ask("--root", TREE, "--json")
     assert times(TREE) == before
@@ -302,18 +287,6 @@ def tell_of_the_tree(status, facts, count):
     assert check.output == "".join(
         f"{reason['subject'].replace('_', ' ')}: {reason['text']}\n"
         for reason in answer.said["reasons"])
-
-
-@pytest.mark.parametrize("change, fact", [
-    (("link", ZONEINFO, "(a directory)"), "now.zoneinfo.target (a directory)"),
-    (("announce", "a\nb\033[2J %s\xff\\"),
-     r"now.tz_latest.target /var/db/timezone/tz/a\x0ab\x1b[2J %s\xff\\"),
-    (("link", ZONEINFO, "x\nmarlin: forged: No error"),
-     r"next_boot.lines.0 marlin: Bad zoneinfo link x\x0amarlin: forged: No error: "
-     "No such file or directory")])
-def test_a_text_that_lies(change, fact, count):
-    unpack("", change)
-    tell_of_the_tree(2, [fact], count)
 
 
 def cannot_tell(why: str) -> Answer:
@@ -563,30 +536,25 @@ def another_users(name: str, otherwise: str) -> str:
                 if os.path.exists(path) and os.stat(path).st_uid != os.geteuid())
 
 
-@pytest.mark.parametrize("status, story", [
-    (0, "directory SYSTEM"),
-    (77, "announce 2024a.1.0"),
-    (77, "file SYSTEM/+VERSION 2023c 0600"),
-    (77, "file SYSTEM/+VERSION 2023c 0604"),
+FOREIGN_FILE = "/file", "/etc/passwd"
+
+
+@pytest.mark.parametrize("part, foreign, story, is_told", [
+    (RECORD, FOREIGN_FILE, "file RECORD", True),
+    (RECORD, FOREIGN_FILE, "file RECORD; announce 2024a.1.0", False),
+    # Sound only with the rights of everybody, and of any group.
+    (RECORD, FOREIGN_FILE, "file RECORD; file SYSTEM/+VERSION 2023c 0600", False),
+    (RECORD, FOREIGN_FILE, "file RECORD; file SYSTEM/+VERSION 2023c 0604", False),
+    # Whether the boot may write there, this user cannot try.
+    ("/var/db", ("", "/etc"), "drop /var/db; directory /var/db", False),
 ])
-def test_a_record_of_another_user(status, story):
-    """It is sound only if it is so with the rights of everybody, and of any group."""
-    unpack("file RECORD;" + story)
-    foreign = another_users("/file", "/etc/passwd")
-    said = as_root(f"""mount --bind {foreign} {TREE}{RECORD}
+def test_a_part_of_another_user(part, foreign, story, is_told):
+    unpack(story)
+    said = as_root(f"""mount --bind {another_users(*foreign)} {TREE}{part}
                        exec {STATUS} --root {TREE} --check""")
-    assert said == (Answer(0, "", "") if status == 0 else cannot_tell(
-        f"{RECORD} belongs to another user or group, or has an access list; run this "
-        "as root"))
-
-
-def test_a_directory_of_another_user():
-    """Whether the boot may write there, this user cannot try."""
-    unpack("drop /var/db; directory /var/db")
-    assert as_root(f"""mount --bind {another_users("", "/etc")} {TREE}/var/db
-                       exec {STATUS} --root {TREE}""") == cannot_tell(
-        "/var/db belongs to another user or group, or has an access list; run this as "
-        "root")
+    assert said == (Answer(0, "", "") if is_told else cannot_tell(
+        f"{part} belongs to another user or group, or has an access list; run this as "
+        "root"))
 
 
 def test_a_record_that_is_mounted():
@@ -605,12 +573,13 @@ def test_a_file_system_of_its_own(place):
     """What is mounted inside the device is seen, covered and left alone."""
     unpack("announce 2024a.1.0")
     at, aside = TREE + place, "/tmp/aside"
+    look = f"find {TREE} -printf '%p %i %T@ %C@ %l\\n'"
     answer = as_root(f"""
         mkdir {aside} && cp -a {at}/. {aside}
         mount -t tmpfs -o mode=755 own {at} && cp -a {aside}/. {at}
-        find {TREE} -printf '%p %i %T@ %C@ %l\\n' >/tmp/before
+        {look} >/tmp/before
         {STATUS} --root {TREE} --json || [ $? = 1 ]
-        find {TREE} -printf '%p %i %T@ %C@ %l\\n' | cmp /tmp/before -
+        {look} | cmp /tmp/before -
         rm -r {aside}""")
     assert answer.errors == ""
     assert fact(answer.said, "update") == "newer"

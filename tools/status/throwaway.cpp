@@ -2,14 +2,12 @@
 #include "tools/status/throwaway.h"
 
 #include <fcntl.h>
-#include <linux/openat2.h>
 #include <mntent.h>
 #include <sched.h>
 #include <sys/mount.h>
 #include <sys/sendfile.h>
 #include <sys/stat.h>
 #include <sys/statvfs.h>
-#include <sys/syscall.h>
 #include <sys/xattr.h>
 #include <unistd.h>
 
@@ -46,21 +44,8 @@ descriptor open_directory(const std::string& path) {
   return opened;
 }
 
-// Inside `root`, whatever links say; none if there is nothing.
-descriptor open_inside(int root, const std::string& path,
-                       std::uint64_t flags = 0) {
-  open_how how{};
-  how.flags = O_PATH | O_CLOEXEC | flags;
-  how.resolve = RESOLVE_IN_ROOT | RESOLVE_NO_MAGICLINKS;
-  for (int attempts = 0;; ++attempts) {
-    const auto opened = static_cast<int>(
-        ::syscall(SYS_openat2, root, path.c_str(), &how, sizeof how));
-    // While anything is renamed anywhere, links cannot be kept inside.
-    if (opened < 0 && errno == EAGAIN && attempts < 1000) continue;
-    if (opened < 0 && errno != ENOENT && errno != ENOTDIR && errno != ELOOP)
-      must(opened, escaped(path), ask_outside);
-    return descriptor(opened);
-  }
+descriptor place_at(const std::string& path) {
+  return descriptor(::open(path.c_str(), O_PATH | O_NOFOLLOW | O_CLOEXEC));
 }
 
 void write_file(const char* path, const std::string& text) {
@@ -69,31 +54,28 @@ void write_file(const char* path, const std::string& text) {
   must(::write(file.number(), text.data(), text.size()), path);
 }
 
-void enter_namespaces() {
+// Returns whether this process is a user of no namespace of its own.
+bool enter_namespaces() {
   const unsigned user = ::geteuid();
   const unsigned group = ::getegid();
-  if (::unshare(CLONE_NEWNS) == 0) return;
+  if (::unshare(CLONE_NEWNS) == 0) return true;
   must(errno == EPERM ? 0 : -1, "unshare", ask_outside);
   must(::unshare(CLONE_NEWUSER | CLONE_NEWNS),
        "this user may not have namespaces", ask_outside);
   write_file("/proc/self/setgroups", "deny");
   write_file("/proc/self/uid_map", "0 " + std::to_string(user) + " 1\n");
   write_file("/proc/self/gid_map", "0 " + std::to_string(group) + " 1\n");
+  return false;
 }
 
 // Before namespaces, in which all other users look like one.
 bool owner_may_change_links(const std::string& root) {
-  const descriptor device = open_directory(root);
-  struct stat top {
-  }, directory{};
-  try {
-    const descriptor opened = open_inside(device.number(), links);
-    return ::fstat(device.number(), &top) == 0 &&
-           ::fstat(opened.number(), &directory) == 0 &&
-           top.st_uid == directory.st_uid && (directory.st_mode & S_IWUSR) != 0;
-  } catch (const cannot_tell&) {
-    return false;
-  }
+  sight outside(root);
+  const std::string real = outside.follow(links).real;
+  if (real.empty()) return false;
+  const sight::place& directory = outside.at(real);
+  return directory.owner == outside.at("/.").owner &&
+         (directory.mode & S_IWUSR) != 0;
 }
 
 // Attributes and numbers of the device's own mean something to overlayfs, and
@@ -189,27 +171,29 @@ void attach(const descriptor& tree, const descriptor& target) {
 class layers {
  public:
   // Finds what has to be covered, before everything becomes read only.
-  layers(const descriptor& root, const process& self, const place& here)
-      : root_(root), self_(self), here_(here) {
-    const descriptor base = open_inside(root_.number(), writable, O_DIRECTORY);
+  layers(const process& self, const place& here, sight& seen)
+      : self_(self), here_(here) {
+    const std::string real = seen.follow(writable).real;
     // Without the directory there is nothing that a boot could write to.
-    if (base.number() < 0) return;
-    const std::string top = self_.path_of(base);
-    std::set<std::string> places = self_.mounts_below(top);
-    places.insert(top);
+    if (real.empty() || !S_ISDIR(seen.at(real).mode)) return;
+    top_ = in_base + real;
+    std::set<std::string> places = self_.mounts_below(top_);
+    places.insert(top_);
     for (const auto& place : places) find(place);
+    const std::string kept = seen.follow(downloads).real;
+    // What a unit may write stays so if all around it is only to be read.
+    if (kept.empty() || !S_ISDIR(seen.at(kept).mode) ||
+        real.starts_with(kept == "/" ? kept : kept + "/"))
+      return;
+    kept_path_ = in_base + kept;
     // Without the layer, which shows some files of an update as missing.
-    kept_ = open_inside(root_.number(), downloads, O_DIRECTORY);
+    kept_ = place_at(kept_path_);
   }
 
   void lay() {
     for (const auto& one : found_) cover(one);
-    const descriptor tz = open_inside(root_.number(), downloads, O_DIRECTORY);
+    const descriptor tz = place_at(kept_path_);
     if (kept_.number() < 0 || tz.number() < 0) return;
-    kept_path_ = self_.path_of(tz);
-    // What a unit may write stays so if all around it is only to be read.
-    if (!found_.empty() && found_.front().path.starts_with(kept_path_ + "/"))
-      return;
     const descriptor copy = clone_tree(kept_, AT_RECURSIVE);
     set_attributes(copy.number(), AT_RECURSIVE, MOUNT_ATTR_RDONLY);
     attach(copy, tz);
@@ -218,12 +202,10 @@ class layers {
   // Whether a path of the device leads through a layer.
   bool hide(const std::string& path) const {
     const auto is_in = [](const std::string& inner, const std::string& outer) {
-      return (inner + "/").starts_with(outer + "/");
+      return !outer.empty() && (inner + "/").starts_with(outer + "/");
     };
-    if (found_.empty()) return false;
-    const std::string& top = found_.front().path;
-    return is_in(in_base + path, top) &&
-           !(is_in(in_base + path, kept_path_) && is_in(kept_path_, top));
+    return is_in(in_base + path, top_) &&
+           !(is_in(in_base + path, kept_path_) && is_in(kept_path_, top_));
   }
 
  private:
@@ -234,7 +216,7 @@ class layers {
   };
 
   void find(const std::string& path) {
-    descriptor place(::open(path.c_str(), O_PATH | O_CLOEXEC));
+    descriptor place = place_at(path);
     if (place.number() < 0) return;
     if (::getxattr(path.c_str(), access_list, nullptr, 0) > 0)
       refuse_layer(path.substr(std::strlen(in_base)));
@@ -256,7 +238,7 @@ class layers {
                                  : clone_tree(below.place);
     if (below.is_read_only)
       set_attributes(cover.number(), 0, MOUNT_ATTR_RDONLY);
-    const descriptor target(::open(below.path.c_str(), O_PATH | O_CLOEXEC));
+    const descriptor target = place_at(below.path);
     if (target.number() >= 0) attach(cover, target);
   }
 
@@ -305,10 +287,10 @@ class layers {
     return clone_tree(to);
   }
 
-  const descriptor& root_;
   const process& self_;
   const place& here_;
   std::vector<covered> found_{};  // parents first
+  std::string top_{};
   descriptor kept_{};
   std::string kept_path_{};
 };
@@ -334,12 +316,12 @@ void note_foreign_parts(place& here, sight& seen) {
 place enter_throwaway_device(const std::string& root) {
   place here;
   here.owner_may_change_links = owner_may_change_links(root);
-  enter_namespaces();
+  const bool is_as_outside = enter_namespaces();
   must(::mount(nullptr, "/", nullptr, MS_REC | MS_PRIVATE, nullptr), "mount",
        ask_outside);
   const descriptor device = open_directory(root);
   const process self;
-  here.has_all_users = self.has_all_users();
+  here.has_all_users = is_as_outside && self.has_all_users();
   here.is_running_system = self.path_of(device) == "/";
 
   // Taken before anything is covered.
@@ -352,10 +334,10 @@ place enter_throwaway_device(const std::string& root) {
   enter(base);
   must(::mkdir(in_base, 0700), "mkdir");
   attach(tree, open_directory(in_base));
-  layers covers(tree, self, here);
+  sight before(in_base);
+  layers covers(self, here, before);
   set_attributes(tree.number(), AT_RECURSIVE, MOUNT_ATTR_RDONLY);
 
-  sight before(in_base);
   if (before.at(writable).error != 0 &&
       before.at(paths::system_zoneinfo).error != 0)
     throw cannot_tell(escaped(root) + " is not a device: it has neither " +
