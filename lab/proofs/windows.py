@@ -4,6 +4,7 @@ examples: a device is killed at one call and then looked at, boot by boot. Nothi
 example comes from the model, so that a change of the window is noticed even if model
 and program change alike."""
 
+import itertools
 from collections.abc import Callable
 from typing import NamedTuple
 
@@ -109,12 +110,12 @@ WINDOWS = {
 def window_of(path, left, usual, carried_out) -> str | None:
     """The window that explains a difference after a kill."""
     for name, window in WINDOWS.items():
-        if (window.path == path and window.different(left, usual, carried_out)
-                and window.opened in carried_out):
-            since = carried_out[len(carried_out) -
-                                carried_out[::-1].index(window.opened):]
-            if window.closed not in since:
-                return name
+        since = list(itertools.takewhile(lambda call: call != window.opened,
+                                         reversed(carried_out)))
+        if (window.path == path and window.opened in carried_out
+                and window.closed not in since
+                and window.different(left, usual, carried_out)):
+            return name
     return None
 
 
