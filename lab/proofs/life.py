@@ -403,31 +403,32 @@ class Life:
         found = [line for line in self.of_the_tool(before, after, told, words, trouble)
                  if not line.startswith(f"{name}, which is needed")
                  or below(after, path) != update]
+        done = told.ending == DONE
         is_whole = below(after, path) == update and after[path].mode == 0o755
-        if told.ending == DONE:
-            # What is in use, and was lost or damaged, is only put back.
-            put_back = set_of(before, ZONEINFO) == name
-            if announced(after) != (announced(before) if put_back else path) or (
-                    not is_whole):
-                found.append(f"{name} is not announced, or not whole")
-            if kind in ("damaged", "incomplete", "misnamed", "refused", "locked"):
-                found.append(f"an update that is {kind} was installed")
-            if kind != "forced" and not is_welcome(before, name):
-                found.append("an update that is not newer was installed")
-        elif announced(after) != announced(before) and not (
-                trouble and announced(after) == path and is_whole):
-            found.append(f"announced is {announced(after)}")
+        # What is in use, and was lost or damaged, is only put back.
+        wanted = announced(before) if set_of(before, ZONEINFO) == name else path
         stays = name in needed(before) and whole(before, name)
-        if told.ending == DONE and stays:
-            found.append(f"{name}, which is needed, was replaced")
-        if told.ending == DONE and not fits(properties.Sight(after), name):
-            found.append(f"the schema of {name} is not the system's")
-        if told.ending == DONE and kind == "lacking" and sets_paris(before):
-            found.append(f"{name} lacks the zone that the device is set to")
         schema = {"": "44l", "verified": "44l", "schema": "45l"}.get(kind)
-        if told.ending != DONE and schema == schema_of_system(before) and not (
-                stays or hopeless(before)) and is_welcome(before, name):
-            found.append(f"it cannot be installed: {told.log}")
+        wrong = {
+            f"{name} is not announced, or not whole":
+                done and not (is_whole and announced(after) == wanted),
+            f"{name}, which is needed, was replaced": done and stays,
+            f"an update that is {kind} was installed": done and kind in (
+                "damaged", "incomplete", "misnamed", "refused", "locked"),
+            "an update that is not newer was installed":
+                done and kind != "forced" and not is_welcome(before, name),
+            f"the schema of {name} is not the system's":
+                done and not fits(properties.Sight(after), name),
+            f"{name} lacks the zone that the device is set to":
+                done and kind == "lacking" and sets_paris(before),
+            f"announced is {announced(after)}":
+                not done and announced(after) != announced(before)
+                and not (trouble and announced(after) == path and is_whole),
+            f"it cannot be installed: {told.log}":
+                not done and schema == schema_of_system(before) and not stays
+                and not hopeless(before) and is_welcome(before, name),
+        }
+        found += [what for what, is_so in wrong.items() if is_so]
         for other in set(names_of(before)) - set(names_of(after)):
             found.append(f"{other} was deleted")
         self.count(f"installations that end with {told.ending}")
