@@ -10,7 +10,7 @@ import pytest
 
 from lab.debian_systems import (machine, parts, test_chosen, test_limits, test_ordinary,
                                 test_other_inits, test_package_on_a_system, test_probe,
-                                test_slow, test_starts, test_var)
+                                test_starts, test_var)
 
 pytestmark = pytest.mark.rest
 
@@ -67,10 +67,6 @@ FAULTS = {
         test_chosen.test_every_device,
         "sed -i 's/ rmdir$//' usr/lib/systemd/system/marlin.service\n",
         ("the boot of: legacy migration", "ended with signal 31")),
-    "too little time": Fault(
-        lambda: test_slow.test_an_update("rw"),
-        without("TimeoutStartSec") + added("TimeoutStartSec=5s"),
-        (ENDED + "('timeout'",)),
     "starts by hand": Fault(
         test_package_on_a_system.test_a_package_comes_and_goes,
         STARTED, ("['refused to stop'] == ",)),

@@ -43,7 +43,7 @@ def test_from_its_first_boot_on():
         {ASKED}""")
     first = device(zone=DEFAULT_ZONE)
     insist(seen, NEW, first, reader="05:00 PDT")
-
+    assert seen.owners[TIMEZONE] == (0o755, 0, 0) == seen.owners[DOWNLOADS.rstrip("/")]
     assert foretold(seen) == (1, links(device(active=True, announced=True)))
 
     for printed, then in (((), CHANGED),

@@ -6,13 +6,15 @@ from typing import NamedTuple
 
 import pytest
 
+from lab.carriers.building import build
 from lab.debian_systems.machine import message, System, UNIT
 from lab.debian_systems.parts import CHOSEN
 from lab.debian_systems.scene import (announce, device, insist, install_update,
                                       install_update_here, linked, names, NEW)
 from lab.words import lines
 from lab.words.device import Device
-from lab.words.paths import DEFAULT_ZONE
+from lab.words.paths import DEFAULT_ZONE, ICUTZ, ZONEINFO
+from lab.words.places import BUILD
 
 pytestmark = pytest.mark.rest
 # The system once more, beside the disk, with a module that its kernel does not have.
@@ -41,6 +43,10 @@ mkdir -p data
 mv var/db/timezone data
 ln -s /data/timezone var/db/timezone
 """
+MEND = f"""
+mkdir -p etc/systemd/system
+cp -R usr/share/doc/marlin/examples/{UNIT}.d etc/systemd/system
+"""
 # As docs/integration.md has it.
 DROP_IN = f"""
 mkdir -p etc/systemd/system/{UNIT}.d
@@ -68,7 +74,8 @@ class Start(NamedTuple):
 
 
 def starts() -> dict[str, Start]:
-    made = names()
+    made, mixed = names(), device(active=True, announced=True)
+    mixed.drop(ICUTZ)
     unknown = lines.VERSION_GROUPS % (".1.0", 0), lines.VERSION % ".1.0"
     return {
         "an initrd with the unit": Start(INITRD.format(without=""), INITRD_OPTIONS),
@@ -79,6 +86,10 @@ def starts() -> dict[str, Start]:
         "a var in memory": Start(options="systemd.volatile=state"),
         "a link to a data partition": Start(updated() + ELSEWHERE + DROP_IN, "", (),
                                             None, "14:00 CEST"),
+        "the mend": Start(
+            install_update_here() + linked(mixed) + MEND, "",
+            (f" marlin-mend: {ZONEINFO} did not fit {ICUTZ}; marlin makes both anew",
+             *NEW[:2]), device(active=True, announced=True), "14:00 CEST"),
         "no ICU data": Start(
             updated() + "rm -r usr/share/icu\n", "",
             (lines.NOT_NEWER % (made.update, f"{made.system}.1.0"),),
@@ -97,6 +108,18 @@ def test_a_start(name):
     seen = system.boot(options=start.options, more=(
         "-initrd", str(initrd)) * initrd.exists())
     insist(seen, start.printed, start.made, reader=start.reader)
+
+
+def test_a_program_with_libraries():
+    """Of the C++ library the system has none of its own."""
+    folder = build(CHOSEN.preset, "-DMARLIN_STATIC=OFF", "-DMARLIN_TOOLS=OFF",
+                   folder=BUILD / "dynamic")
+    seen = System("libraries", updated() + f"""
+        DESTDIR=$PWD cmake --install {folder}
+        for library in libstdc++.so.6 libgcc_s.so.1; do
+          cp $({CHOSEN.compiler} -print-file-name=$library) usr/lib
+        done""").boot()
+    insist(seen, (), device(active=True, announced=True), reader="14:00 CEST")
 
 
 def test_an_emergency():

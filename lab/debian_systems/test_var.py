@@ -7,9 +7,8 @@ from lab.debian_systems.machine import System, UNIT, message
 from lab.debian_systems.scene import (NEW, device, fail, insist, install_update_here,
                                       linked, names)
 from lab.words import lines
-from lab.words.paths import DEFAULT_ZONE, ICUTZ, SYSTEM_ZONEINFO, ZONEINFO
+from lab.words.paths import DEFAULT_ZONE, SYSTEM_ZONEINFO, ZONEINFO
 
-EXAMPLES = "usr/share/doc/marlin/examples"
 VAR = "/dev/nvme0n3 /var ext4 {} 0 0\n"
 LATE = """[Unit]
 DefaultDependencies=no
@@ -40,25 +39,6 @@ def test_a_read_only_root_without_tmp():
     seen = system.boot("mount", options="ro")
     insist(seen, [lines.NOT_NEWER % (update, update)],
            device(active=True, announced=True), reader="14:00 CEST")
-
-
-@pytest.mark.rest
-def test_a_read_only_root_with_the_mend():
-    """Links of two data sets; the update is announced."""
-    drop_ins = f"etc/systemd/system/{UNIT}.d"
-    made = device(active=True, announced=True)
-    made.drop(ICUTZ)
-    update = names().update
-    system = System("mend", f"""
-        {install_update_here()} {linked(made)}
-        echo '{VAR.format("defaults")}' >etc/fstab
-        rmdir tmp
-        mkdir {drop_ins}
-        cp {EXAMPLES}/{UNIT}.d/mend.conf {drop_ins}""", apart="var")
-    seen = system.boot(options="ro")
-    mended = f" marlin-mend: {ZONEINFO} did not fit {ICUTZ}; marlin makes both anew"
-    insist(seen, [mended, *NEW[:2]], device(active=True, announced=True),
-           reader="14:00 CEST", record=f"{names().system}.1.0_{update}")
 
 
 @pytest.mark.rest

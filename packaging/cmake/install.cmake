@@ -33,7 +33,9 @@ if(MARLIN_UNIT_DIR)
   # the like are.
   set(MARLIN_ROOT ${CMAKE_INSTALL_PREFIX}/lib/marlin)
   if(NOT MARLIN_STATIC)
-    set(MARLIN_LIBRARIES "BindReadOnlyPaths=-/lib -/lib64 -/usr/lib\n")
+    # And the call by which libraries are loaded.
+    string(CONCAT MARLIN_LIBRARIES "BindReadOnlyPaths=-/lib -/lib64 -/usr/lib\n"
+                                   "SystemCallFilter=pread64\n")
     install(DIRECTORY DESTINATION lib/marlin/lib)
     install(DIRECTORY DESTINATION lib/marlin/lib64)
     install(DIRECTORY DESTINATION lib/marlin/usr/lib)
