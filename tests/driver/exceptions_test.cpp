@@ -54,6 +54,12 @@ void* operator new(std::size_t size) {
   if (void* const memory = std::malloc(size)) return memory;
   throw std::bad_alloc();
 }
+// Without it a sanitizer brings its own, which has its own deletion.
+void* operator new(std::size_t size, const std::nothrow_t&) noexcept try {
+  return operator new(size);
+} catch (...) {
+  return nullptr;
+}
 void operator delete(void* memory) noexcept {
   if (memory != nullptr) --live;
   std::free(memory);
