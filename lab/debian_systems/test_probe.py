@@ -18,7 +18,8 @@ DONE = {"write /var/db/entry", "write /var/db/timezone/entry"}
 # What a fleet may set for all services, and the empty places that may come with it.
 FOREIGN = {
     "ProtectSystem=strict": (), "ReadOnlyPaths=/": (), "ReadWritePaths=/": (),
-    "ProtectHome=yes": (), "ProtectHome=tmpfs": ("/home", "/root", "/run/user"),
+    "ProtectHostname=yes": (), "ProtectHome=yes": (),
+    "ProtectHome=tmpfs": ("/home", "/root", "/run/user"),
     "PrivateTmp=yes": ("/tmp", "/var/tmp"), "PrivateDevices=yes": (),
     "PrivateIPC=yes": ("/dev/mqueue",), "ProtectKernelLogs=yes": (),
     "ProtectKernelTunables=yes": (), "ProtectControlGroups=yes": (),

@@ -43,15 +43,20 @@ if(MARLIN_UNIT_DIR)
   foreach(place usr/share/icu usr/share/zoneinfo.default var/db)
     install(DIRECTORY DESTINATION lib/marlin/${place})
   endforeach()
-  foreach(place dev/mqueue dev etc home proc root run/systemd/incoming run/systemd
-                run/user run sys/fs/cgroup sys/fs sys tmp var/tmp)
+  # Two files too, which a drop-in with ProtectHostname expects.
+  file(CONFIGURE OUTPUT packaging/empty CONTENT "")
+  foreach(file usr/libexec/marlin usr/libexec/marlin-mend proc/sys/kernel/domainname
+               proc/sys/kernel/hostname)
+    get_filename_component(directory ${file} DIRECTORY)
+    get_filename_component(name ${file} NAME)
+    install(FILES ${PROJECT_BINARY_DIR}/packaging/empty
+            DESTINATION lib/marlin/${directory} RENAME ${name} PERMISSIONS OWNER_READ)
+  endforeach()
+  foreach(place dev/mqueue dev etc home proc/sys/kernel proc/sys proc root
+                run/systemd/incoming run/systemd run/user run sys/fs/cgroup sys/fs sys
+                tmp var/tmp)
     install(DIRECTORY DESTINATION lib/marlin/${place}
             DIRECTORY_PERMISSIONS OWNER_READ OWNER_EXECUTE)
-  endforeach()
-  file(WRITE ${PROJECT_BINARY_DIR}/packaging/empty "")
-  foreach(program marlin marlin-mend)
-    install(FILES ${PROJECT_BINARY_DIR}/packaging/empty
-            DESTINATION lib/marlin/usr/libexec RENAME ${program})
   endforeach()
   configure_file(packaging/marlin.service.in packaging/marlin.service @ONLY)
   install(FILES ${PROJECT_BINARY_DIR}/packaging/marlin.service
