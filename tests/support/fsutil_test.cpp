@@ -58,7 +58,7 @@ TEST_F(Exists, IsQuietlyFalseForADanglingLinkAndAPathThatCannotBeReached) {
   make_link(path, "/var/db/gone");
   EXPECT_FALSE(quietly([] { return fsutil::exists(path); }));
   for (const auto& [unreached, error] : unreachable_paths())
-    EXPECT_FALSE(quietly([&] { return fsutil::exists(unreached); }));
+    EXPECT_FALSE(quietly([&at = unreached] { return fsutil::exists(at); }));
 }
 
 // Printing comes before the number is read: with no standard error to print to

@@ -24,7 +24,7 @@ TEST(VersionParse, FillsFourFields) {
         std::pair("2016ab.7", "2016|ab|7|-1"),
         std::pair("2147483647a.2147483647.2147483647",
                   "2147483647|a|2147483647|2147483647")})
-    EXPECT_EQ(quietly([&] { return shown(mln_version(text)); }), fields);
+    EXPECT_EQ(quietly([&of = text] { return shown(mln_version(of)); }), fields);
   EXPECT_EQ(shown(mln_version(std::string(5000, '0') + "1a.01.000")),
             "1|a|1|0");
 }
@@ -58,10 +58,10 @@ TEST(VersionParse, ThrowsOutOfRangeWithTheErrorOfTheStandardConversion) {
        {std::pair("2147483648a", in_long), std::pair("1a.2147483648", in_long),
         std::pair("1a.1.4294967296", in_long),
         std::pair("99999999999999999999a", ERANGE)})
-    quietly([&] {
+    quietly([&of = text, &left = error] {
       errno = EXDEV;
-      EXPECT_THROW(mln_version{text}, std::out_of_range);
-      EXPECT_EQ(errno, error) << text;
+      EXPECT_THROW(mln_version{of}, std::out_of_range);
+      EXPECT_EQ(errno, left) << of;
     });
 }
 
