@@ -54,20 +54,6 @@ void write_file(const char* path, const std::string& text) {
   must(::write(file.number(), text.data(), text.size()), path);
 }
 
-// Returns whether this process is a user of no namespace of its own.
-bool enter_namespaces() {
-  const unsigned user = ::geteuid();
-  const unsigned group = ::getegid();
-  if (::unshare(CLONE_NEWNS) == 0) return true;
-  must(errno == EPERM ? 0 : -1, "unshare", ask_outside);
-  must(::unshare(CLONE_NEWUSER | CLONE_NEWNS),
-       "this user may not have namespaces", ask_outside);
-  write_file("/proc/self/setgroups", "deny");
-  write_file("/proc/self/uid_map", "0 " + std::to_string(user) + " 1\n");
-  write_file("/proc/self/gid_map", "0 " + std::to_string(group) + " 1\n");
-  return false;
-}
-
 // Before namespaces, in which all other users look like one.
 bool owner_may_change_links(const std::string& root) {
   sight outside(root);
@@ -151,6 +137,23 @@ class process {
 
   descriptor directory_ = open_directory("/proc");
 };
+
+void enter_namespaces(const std::string& root, const process& self,
+                      place& here) {
+  const unsigned user = ::geteuid();
+  const unsigned group = ::getegid();
+  const bool may_mount = ::unshare(CLONE_NEWNS) == 0;
+  must(may_mount || errno == EPERM ? 0 : -1, "unshare", ask_outside);
+  here.has_all_users = may_mount && self.has_all_users();
+  if (!here.has_all_users)
+    here.owner_may_change_links = owner_may_change_links(root);
+  if (may_mount) return;
+  must(::unshare(CLONE_NEWUSER | CLONE_NEWNS),
+       "this user may not have namespaces", ask_outside);
+  write_file("/proc/self/setgroups", "deny");
+  write_file("/proc/self/uid_map", "0 " + std::to_string(user) + " 1\n");
+  write_file("/proc/self/gid_map", "0 " + std::to_string(group) + " 1\n");
+}
 
 descriptor clone_tree(const descriptor& place, unsigned flags = 0) {
   descriptor tree(
@@ -315,13 +318,11 @@ void note_foreign_parts(place& here, sight& seen) {
 
 place enter_throwaway_device(const std::string& root) {
   place here;
-  here.owner_may_change_links = owner_may_change_links(root);
-  const bool is_as_outside = enter_namespaces();
+  const process self;
+  enter_namespaces(root, self, here);
   must(::mount(nullptr, "/", nullptr, MS_REC | MS_PRIVATE, nullptr), "mount",
        ask_outside);
   const descriptor device = open_directory(root);
-  const process self;
-  here.has_all_users = is_as_outside && self.has_all_users();
   here.is_running_system = self.path_of(device) == "/";
 
   // Taken before anything is covered.
