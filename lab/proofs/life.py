@@ -198,6 +198,7 @@ class Life:
 
     def happen(self, text: str):
         self.story.append(text)
+        self.calls = []  # of a tool that is traced
         before = namespace.look()
         verb, *words = text.split()
         try:
@@ -333,7 +334,6 @@ class Life:
         return found
 
     def run_tool(self, words, trouble: tuple[str, ...]) -> Booted:
-        self.calls = []
         if not trouble:
             return boot.run(PROGRAM, *words)
         kind, *arguments = trouble
@@ -416,7 +416,8 @@ class Life:
             f"an update that is {kind} was installed": done and kind in (
                 "damaged", "incomplete", "misnamed", "refused", "locked"),
             "an update that is not newer was installed":
-                done and kind != "forced" and not is_welcome(before, name),
+                done and kind != "forced" and not trouble
+                and not is_welcome(before, name),
             f"the schema of {name} is not the system's":
                 done and not fits(properties.Sight(after), name),
             f"{name} lacks the zone that the device is set to":
