@@ -56,15 +56,16 @@ def is_due(entries: Entries, name: str) -> bool:
     return is_newer(name, in_use) and fits(sight, name)
 
 
-def is_welcome(entries: Entries, name: str) -> bool:
+def is_welcome(entries: Entries, name: str, troubled=False) -> bool:
     """Whether an update is not refused for its age: what is in use or announced, and is
-    not whole, gives way to itself."""
+    not whole, gives way to itself; and if a call fails, what is announced may look as
+    if no boot could take it."""
     sight, lost = properties.Sight(entries), not whole(entries, name)
     in_use, promised = (set_of(entries, path) for path in (ZONEINFO, TZ_LATEST))
     if lost and name == in_use:
         return True
     than = [in_use] * (update_path(in_use) in entries)
-    if fits(sight, promised) and not (lost and name == promised):
+    if fits(sight, promised) and not troubled and not (lost and name == promised):
         than.append(promised)
     return is_newer(name, sight.data_set("").text, *than)
 
@@ -74,7 +75,8 @@ def mixed(entries: Entries) -> bool:
     tree = properties.data_set_of(link(entries, ZONEINFO))
     icu = entries.get(ICUTZ)
     if not icu and properties.Sight(entries).leads_somewhere(LEGACY_ICUTZ):
-        icu = entries[LEGACY_ICUTZ]
+        # A boot moves a link, and removes all else.
+        icu = entries[LEGACY_ICUTZ] if link(entries, LEGACY_ICUTZ) else None
     if tree is None or icu and icu.kind != "link":
         return False
     return icu is not None if tree == "" else not icu or icu.text != f"{tree}/icutz"

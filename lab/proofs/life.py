@@ -416,8 +416,8 @@ class Life:
             f"an update that is {kind} was installed": done and kind in (
                 "damaged", "incomplete", "misnamed", "refused", "locked"),
             "an update that is not newer was installed":
-                done and kind != "forced" and not trouble
-                and not is_welcome(before, name),
+                done and kind != "forced"
+                and not is_welcome(before, name, troubled=bool(trouble)),
             f"the schema of {name} is not the system's":
                 done and not fits(properties.Sight(after), name),
             f"{name} lacks the zone that the device is set to":
@@ -605,6 +605,11 @@ STORIES = {  # those that were faults, and what an updater does at any time
         for name in ("tz_latest", "zoneinfo", "icutz", "legacy", "localtime")),
     "a set in use is not replaced": "install 2024b; boot; install 2024b forced",
     "what is announced is put back": "install 2024b; damage 2024b; install 2024b",
+    "only a link is moved from the former place":
+        "install 2024b; boot; lose icutz; file legacy; boot mend",
+    "what is in use is named as a boot names it":
+        "install 2024b; boot; bend icutz 2024b; tool --settle",
+    "a version that cannot be read is not older": "install 2022b fail openat 4",
     "an update that waits": "install 2024a; boot; install 2025a; tool --settle; boot",
 }
 

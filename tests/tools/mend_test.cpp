@@ -118,6 +118,15 @@ TEST_F(Mend, ReckonsWithALinkInItsFormerPlace) {
   expect_mended();
 }
 
+// marlin removes it, and then there is no ICU data.
+TEST_F(Mend, TakesAFileForNoLinkInItsFormerPlace) {
+  make_file(legacy_icutz);
+  point_links_at_system();
+  expect_left_alone();
+  point_zoneinfo_at(update("2024a.1.0") + "/zoneinfo");
+  expect_mended();
+}
+
 TEST_F(Mend, GoesOnWithoutALog) {
   for (const auto lose_the_log : {leave_the_log_unread, forbid_files_to_grow}) {
     point_links_at_system();

@@ -70,9 +70,19 @@ std::string announced_set() { return set_in(paths::latest_update_link); }
 
 std::string set_in_use() { return set_in(paths::zoneinfo_link); }
 
-std::string icu_set_in_use() { return set_in(paths::icu_link); }
+bool is_in_use(const std::string& set) {
+  const std::string path = paths::download_root + set;
+  return text_of(paths::zoneinfo_link) == path + "/zoneinfo" &&
+         text_of(paths::icu_link) == path + "/icutz";
+}
 
-std::string system_version() { return mln_zoneinfo().version() + ".1.0"; }
+std::string system_version() {
+  const std::string release = mln_zoneinfo().version();
+  // A call that fails looks like no version, and any update is newer than that.
+  if (release != mln_zoneinfo().version())
+    refuse("the system's version cannot be read");
+  return release + ".1.0";
+}
 
 std::string system_schema() { return mln_icu().schema; }
 

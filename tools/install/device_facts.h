@@ -17,9 +17,12 @@ std::optional<mln_version> version_in(const std::string& text);
 // links leads to, or into; empty if it leads elsewhere.
 std::string announced_set();
 std::string set_in_use();
-std::string icu_set_in_use();
 
-// The version text of the system partition's data, such as 2024a.1.0.
+// Whether both links name the data of a set as a boot writes them.
+bool is_in_use(const std::string& set);
+
+// The version text of the system partition's data, such as 2024a.1.0. Throws if
+// two looks at it differ.
 std::string system_version();
 // The ICU schema of the system; empty where there is none.
 std::string system_schema();

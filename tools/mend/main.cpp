@@ -43,21 +43,20 @@ std::string_view update_of(std::string_view tree) {
   return named ? tree.substr(0, last) : std::string_view();
 }
 
-bool mixed(const link_read& tree, const link_read& icu_data) {
-  if (icu_data.unclear()) return false;
-  if (tree.text() == paths::system_zoneinfo) return !icu_data.missing();
-  const std::string_view set = update_of(tree.text());
-  return !set.empty() && !(icu_data.text().starts_with(set) &&
-                           icu_data.text().substr(set.size()) == "/icutz");
+bool mixed(std::string_view tree, std::string_view icu_data) {
+  if (tree == paths::system_zoneinfo) return !icu_data.empty();
+  const std::string_view set = update_of(tree);
+  return !set.empty() && !(icu_data.starts_with(set) &&
+                           icu_data.substr(set.size()) == "/icutz");
 }
 
 bool mixed(const link_read& tree) {
   const link_read icu_data(paths::icu_link);
-  if (!icu_data.missing()) return mixed(tree, icu_data);
   // marlin is about to move a link from where older systems had it, unless it
-  // leads nowhere.
-  if (::access(paths::legacy_icu_link, F_OK) != 0) return mixed(tree, icu_data);
-  return mixed(tree, link_read(paths::legacy_icu_link));
+  // leads nowhere. What it cannot read there it only removes.
+  if (icu_data.missing() && ::access(paths::legacy_icu_link, F_OK) == 0)
+    return mixed(tree.text(), link_read(paths::legacy_icu_link).text());
+  return !icu_data.unclear() && mixed(tree.text(), icu_data.text());
 }
 
 }  // namespace
