@@ -103,7 +103,7 @@ ln -sfn /var/db/timezone/localtime etc/localtime
 rm -f etc/fstab
 # These take time, and nobody waits for them; some need a "/tmp" or a "/var".
 for unit in apparmor.service dbus.socket dpkg-db-backup.timer \
-  e2scrub_all.timer fstrim.timer systemd-binfmt.service \
+  e2scrub_all.timer fstrim.timer ldconfig.service systemd-binfmt.service \
   systemd-hwdb-update.service systemd-journal-catalog-update.service \
   systemd-pstore.service systemd-random-seed.service \
   systemd-tmpfiles-clean.timer systemd-update-done.service \

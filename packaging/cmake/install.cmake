@@ -43,17 +43,19 @@ if(MARLIN_UNIT_DIR)
   foreach(place usr/share/icu usr/share/zoneinfo.default var/db)
     install(DIRECTORY DESTINATION lib/marlin/${place})
   endforeach()
-  # Two files too, which a drop-in with ProtectHostname expects.
+  # Files too, which drop-ins with ProtectHostname and PrivateDevices expect.
   file(CONFIGURE OUTPUT packaging/empty CONTENT "")
   foreach(file usr/libexec/marlin usr/libexec/marlin-mend proc/sys/kernel/domainname
-               proc/sys/kernel/hostname)
+               proc/sys/kernel/hostname run/systemd/journal/dev-log
+               run/systemd/journal/socket run/systemd/journal/stdout)
     get_filename_component(directory ${file} DIRECTORY)
     get_filename_component(name ${file} NAME)
     install(FILES ${PROJECT_BINARY_DIR}/packaging/empty
             DESTINATION lib/marlin/${directory} RENAME ${name} PERMISSIONS OWNER_READ)
   endforeach()
   foreach(place dev/mqueue dev etc home proc/sys/kernel proc/sys proc root
-                run/systemd/incoming run/systemd run/user run sys/fs/cgroup sys/fs sys
+                run/host/.os-release-stage run/host run/systemd/incoming
+                run/systemd/journal run/systemd run/user run sys/fs/cgroup sys/fs sys
                 tmp var/tmp)
     install(DIRECTORY DESTINATION lib/marlin/${place}
             DIRECTORY_PERMISSIONS OWNER_READ OWNER_EXECUTE)
