@@ -12,9 +12,6 @@ from pathlib import Path
 # lab/proofs/coverage.py, say, or lab/doors/bench.py.
 NAME = next((name for name in reversed(Path(sys.argv[0]).with_suffix("").parts)
              if name != "__main__"), "")
-# An interrupted program just ends, as does one that nobody reads.
-signal.signal(signal.SIGINT, signal.SIG_DFL)
-signal.signal(signal.SIGPIPE, signal.SIG_DFL)
 
 
 def say(text: str):
@@ -31,6 +28,9 @@ class Options(argparse.ArgumentParser):
 
     def __init__(self, usage="", **options):
         super().__init__(**{"prog": f"scripts/{NAME}", "allow_abbrev": False} | options)
+        # An interrupted program just ends, as does one that nobody reads.
+        signal.signal(signal.SIGINT, signal.SIG_DFL)
+        signal.signal(signal.SIGPIPE, signal.SIG_DFL)
         self.text = usage
 
     def format_help(self):
