@@ -355,7 +355,10 @@ class Life:
         done = "".join(letters.get(call.name, "") for call in self.calls
                        if not call.error)
         installs = "w" in done
-        too_early = re.search("w[^s]*r|r[^s]*r|r[^s]*$" if installs else "[ru]$", done)
+        # What is removed before and after an installation may come back.
+        built = done[done.find("w"):done.rfind("s") + 1] if installs else ""
+        too_early = re.search("w[^s]*r|r[^s]*r", built) or re.search(
+            "sr$" if installs else "[ru]$", done)
         return [f"it did not wait for the disk: {done}"] * bool(too_early)
 
     def of_the_tool(self, before, after, told, words, trouble) -> list[str]:
@@ -610,6 +613,7 @@ STORIES = {  # those that were faults, and what an updater does at any time
     "what is in use is named as a boot names it":
         "install 2024b; boot; bend icutz 2024b; tool --settle",
     "a version that cannot be read is not older": "install 2022b fail openat 4",
+    "what is refused": "install 2024b; install 2024a; install 2025a refused; boot",
     "an update that waits": "install 2024a; boot; install 2025a; tool --settle; boot",
 }
 
