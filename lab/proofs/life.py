@@ -611,7 +611,9 @@ STORIES = {  # those that were faults, and what an updater does at any time
     "only a link is moved from the former place":
         "install 2024b; boot; lose icutz; file legacy; boot mend",
     "what is in use is named as a boot names it":
-        "install 2024b; boot; bend icutz 2024b; tool --settle",
+        "install 2024b; boot; bend icutz 2024b; tool --settle; lose icutz; "
+        "boot mend; bend zoneinfo 2024b; tool --settle",
+    "what was left behind goes": "install 2024a kill rename 1; install 2024b",
     "a version that cannot be read is not older": "install 2022b fail openat 4",
     "what is refused": "install 2024b; install 2024a; install 2025a refused; boot",
     "an update that waits": "install 2024a; boot; install 2025a; tool --settle; boot",
