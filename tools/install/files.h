@@ -40,7 +40,8 @@ const char* next_name(DIR* entries, const std::string& path);
 std::string link_text(int directory, const std::string& name,
                       const std::string& path);
 
-// read(2) to the end. Refuses more bytes than `most`.
+// read(2) of a regular file: a read that comes short ends it. Refuses more
+// bytes than `most`.
 std::string read_all(int file, std::size_t most, const std::string& path);
 
 // fsync(2).
