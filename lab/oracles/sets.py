@@ -56,16 +56,15 @@ def is_due(entries: Entries, name: str) -> bool:
     return is_newer(name, in_use) and fits(sight, name)
 
 
-def is_welcome(entries: Entries, name: str, troubled=False) -> bool:
+def is_welcome(entries: Entries, name: str) -> bool:
     """Whether an update is not refused for its age: what is in use or announced, and is
-    not whole, gives way to itself; and if a call fails, what is announced may look as
-    if no boot could take it."""
+    not whole, gives way to itself."""
     sight, lost = properties.Sight(entries), not whole(entries, name)
     in_use, promised = (set_of(entries, path) for path in (ZONEINFO, TZ_LATEST))
     if lost and name == in_use:
         return True
     than = [in_use] * (update_path(in_use) in entries)
-    if fits(sight, promised) and not troubled and not (lost and name == promised):
+    if fits(sight, promised) and not (lost and name == promised):
         than.append(promised)
     return is_newer(name, sight.data_set("").text, *than)
 

@@ -420,7 +420,7 @@ class Life:
                 "damaged", "incomplete", "misnamed", "refused", "locked"),
             "an update that is not newer was installed":
                 done and kind != "forced"
-                and not is_welcome(before, name, troubled=bool(trouble)),
+                and not is_welcome(before, name),
             f"the schema of {name} is not the system's":
                 done and not fits(properties.Sight(after), name),
             f"{name} lacks the zone that the device is set to":
@@ -614,7 +614,9 @@ STORIES = {  # those that were faults, and what an updater does at any time
         "install 2024b; boot; bend icutz 2024b; tool --settle; lose icutz; "
         "boot mend; bend zoneinfo 2024b; tool --settle",
     "what was left behind goes": "install 2024a kill rename 1; install 2024b",
-    "a version that cannot be read is not older": "install 2022b fail openat 4",
+    "what cannot be read makes nothing newer":
+        "install 2022b fail openat 4; install 2024b; install 2024a fail openat 6; "
+        "install 2024a fail openat 8",
     "what is refused": "install 2024b; install 2024a; install 2025a refused; boot",
     "an update that waits": "install 2024a; boot; install 2025a; tool --settle; boot",
 }

@@ -15,6 +15,7 @@
 #include "dataset/zoneinfo.h"
 #include "support/paths.h"
 #include "support/version_grammar.h"
+#include "tools/escaped.h"
 #include "tools/install/failure.h"
 #include "tools/install/files.h"
 
@@ -43,6 +44,18 @@ std::string resolved(const char* path) {
   if (errno != ENOENT && errno != ENOTDIR && errno != ELOOP)
     fail("follow the link", path);
   return {};
+}
+
+// A call that fails looks to the boot's own classes like no text at all, which
+// would let any update pass.
+template <typename Reader>
+std::string read_twice(const std::string& what, Reader reader) {
+  try {
+    const std::string text = reader();
+    if (text == reader()) return text;
+  } catch (int) {
+  }
+  refuse(what + " cannot be read");
 }
 
 }  // namespace
@@ -77,23 +90,21 @@ bool is_in_use(const std::string& set) {
 }
 
 std::string system_version() {
-  const std::string release = mln_zoneinfo().version();
-  // A call that fails looks like no version, and any update is newer than that.
-  if (release != mln_zoneinfo().version())
-    refuse("the system's version cannot be read");
-  return release + ".1.0";
+  return read_twice("the system's version",
+                    [] { return mln_zoneinfo().version(); }) +
+         ".1.0";
 }
 
-std::string system_schema() { return mln_icu().schema; }
+std::string system_schema() {
+  return read_twice("the system's ICU schema", [] { return mln_icu().schema; });
+}
 
 bool fits_system(const std::string& set) {
   const std::string schema = system_schema();
-  try {
-    return is_installed(set) && !schema.empty() &&
-           mln_icu(paths::download_root + set).schema == schema;
-  } catch (int) {
-    return false;
-  }
+  return is_installed(set) && !schema.empty() &&
+         schema == read_twice("the ICU schema of " + escaped(set), [&set] {
+           return mln_icu(paths::download_root + set).schema;
+         });
 }
 
 bool a_boot_could_take(const std::string& set) {

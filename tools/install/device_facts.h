@@ -21,8 +21,9 @@ std::string set_in_use();
 // Whether both links name the data of a set as a boot writes them.
 bool is_in_use(const std::string& set);
 
-// The version text of the system partition's data, such as 2024a.1.0. Throws if
-// two looks at it differ.
+// The three below throw if two looks at what they read differ.
+
+// The version text of the system partition's data, such as 2024a.1.0.
 std::string system_version();
 // The ICU schema of the system; empty where there is none.
 std::string system_schema();
