@@ -77,7 +77,7 @@ std::string link_text(int directory, const std::string& name,
 
 std::string read_all(int file, std::size_t most, const std::string& path) {
   std::string text;
-  char buffer[1 << 16];
+  char buffer[1 << 14];
   for (;;) {
     const ssize_t count = ::read(file, buffer, sizeof buffer);
     if (count < 0 && errno == EINTR) continue;
