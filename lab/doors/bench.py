@@ -2,7 +2,7 @@
 """usage: scripts/bench [--check | --record | --companions]
 
 Measures marlin, as it ships, inside a private device, beside the least that its system
-calls can cost: "the floor", lab/bench/floor.c.
+calls can cost: "the floor", lab/bench/floor.py.
 
   --check       what is done without an option: compares instructions, system calls and
                 size with lab/bench/baseline.json; fails when one has grown by more than
@@ -22,12 +22,13 @@ import subprocess
 import sys
 from pathlib import Path
 
+from lab.bench.floor import compile_floor
 from lab.carriers.building import build, need
 from lab.words.command import Options, stop
 from lab.words.places import BUILD
 
 PLACE = BUILD / "bench/static"
-FLOOR = f"{PLACE}/lab/bench/floor_SCENE"
+FLOOR = f"{PLACE}/floor_SCENE"
 BASELINE = Path("lab/bench/baseline.json")
 
 
@@ -38,8 +39,7 @@ def output(*command: str) -> str:
 
 def built(*targets: str) -> str:
     """The program as it ships, stripped; and what else is measured."""
-    build("release", "-DMARLIN_BENCH=ON", "-DCMAKE_C_COMPILER=gcc", folder=PLACE,
-          targets=("marlin", *targets))
+    build("release", folder=PLACE, targets=("marlin", *targets))
     output("strip", "-o", f"{PLACE}.stripped", f"{PLACE}/marlin")
     return f"{PLACE}.stripped"
 
@@ -52,7 +52,9 @@ def measured(job: str, *arguments: str):
 def all_figures() -> dict:
     """Of each, what marlin takes and what the floor takes; and by what it was built."""
     from lab.bench.measure import SCENES  # It takes pytest, which main() installs.
-    marlin = built(*(f"floor_{scene}" for scene in SCENES))
+    marlin = built()
+    for scene, describe in SCENES.items():
+        compile_floor(describe(), Path(FLOOR.replace("SCENE", scene)))
     figures = {"toolchain": [f"g++ {output('g++', '-dumpfullversion')}",
                              output("getconf", "GNU_LIBC_VERSION"),
                              output("valgrind", "--version")]}
