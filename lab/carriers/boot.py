@@ -91,6 +91,12 @@ def traced(*options: str, command: Sequence[str] = (PROGRAM,)) -> Booted:
     return run("/usr/bin/strace", "-o", TRACE, "-s", "0", *options, *command)
 
 
+def family(name: str) -> str:
+    """What machines call one of the model's calls, of which each makes one, for the
+    options below."""
+    return ",?".join(FAMILIES[name].split())
+
+
 def inject(call: str, what: str, when) -> list[str]:
     """The options that disturb a machine's call: `when` is its number, or "3+" for
     the third and all that follow. Not every machine has every call."""
@@ -102,9 +108,8 @@ def failing(call: str, number: int, when) -> list[str]:
 
 
 def killing(call: str, when: int) -> list[str]:
-    """The options that kill before the call takes effect; `call` may be several names
-    with "?", of which one is counted."""
-    return ["-e", f"trace={call}", "-e", f"inject={call}:signal=KILL:when={when}"]
+    """The options that kill before the call takes effect."""
+    return ["-e", f"trace=?{call}", *inject(call, "signal=KILL", when)]
 
 
 def calls() -> Iterator[Call]:

@@ -55,7 +55,7 @@ class Fails(Condition):
         if for_good:
             self.name += ", as do all of its kind that follow"
             self.when += "+"
-            self.later = SHARED.get(call.call, {boot.NAMES[call.call]})
+            self.later = SHARED.get(call.call, {call.name})
 
     def options(self, outcome):
         return boot.failing(self.call.call, self.error, self.when)

@@ -43,14 +43,13 @@ def single_kills(_):
 
 def kills_at_links(device: Device):
     """One before every change to a link in the next boot of a described device."""
-    families = {"symlink": "?symlink,?symlinkat", "unlink": "?unlink,?unlinkat"}
     counts = collections.Counter()
     for number, (name, _) in enumerate(model.boot(device).calls, start=1):
         if name == "rmdir":  # some machines have no such call and use unlink's
             return
-        if name in families:
+        if name in ("symlink", "unlink"):
             counts[name] += 1
-            yield Killed(families[name], counts[name], number)
+            yield Killed(boot.family(name), counts[name], number)
 
 
 def pairs(_):

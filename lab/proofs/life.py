@@ -12,9 +12,7 @@ asked to foretell it.
 """
 
 import contextlib
-import copy
 import errno
-import fcntl
 import os
 import re
 import struct
@@ -28,17 +26,18 @@ from hypothesis import strategies as st
 from lab.carriers import boot, namespace
 from lab.carriers.boot import Booted
 from lab.oracles import model, properties, status
-from lab.oracles.conditions import Condition
+from lab.oracles.conditions import Fails, Killed
 from lab.oracles.installer import (BUSY, DONE, FAILED, NOT_NEWER, PROGRAM, announced,
                                    below, hidden, put_update)
 from lab.oracles.sets import (fits, is_due, is_welcome, link, mixed, names_of, needed,
                               set_of, whole)
-from lab.oracles.trial import entry_differences, trial
+from lab.oracles.trial import entry_differences, left, trial
+from lab.proofs.kills import killed
 from lab.words.device import Device
 from lab.words.paths import (DOWNLOADS, FORMER_ZONEINFO, ICUTZ, LEGACY_ICUTZ, LOCALTIME,
                              OLD_ICU, RECORD, SYSTEM_ICU, SYSTEM_ZONEINFO, TZ_LATEST,
                              ZONEINFO, update_path)
-from lab.words.seen import Entries, as_device
+from lab.words.seen import Call, Entries, as_device
 
 MEND = os.path.join(os.path.dirname(PROGRAM), "marlin-mend")
 INCOMING = "/var/db/incoming/"
@@ -53,7 +52,7 @@ PLACES = {"zoneinfo": ZONEINFO, "icutz": ICUTZ, "localtime": LOCALTIME,
 
 # --- What can happen -----------------------------------------------------------------
 
-CALLS = "symlink", "unlink", "rename", "mkdir", "openat", "fsync", "write"
+CALLS = "symlink", "unlink", "rename", "mkdir", "open", "fsync", "write"
 TURNS = 1, 2, 3, 4, 6
 TROUBLES = [f"kill {call} {turn}" for call in CALLS for turn in TURNS] + [
     f"fail {call} {turn}" for call in CALLS for turn in TURNS] + [
@@ -157,25 +156,6 @@ def schema_of_system(entries: Entries) -> str:
     return entries[f"{SYSTEM_ICU}/icutzformat.txt"].text.strip()
 
 
-class Troubled(Condition):
-    """Calls of one kind in a boot, told by their turn, fail; or all from then on."""
-
-    def __init__(self, calls: list, kind: str, turn: int, error: int, later=""):
-        numbers = [number for number, (name, _) in enumerate(calls, start=1)
-                   if name == kind]
-        self.number = (numbers[turn - 1:] or [0])[0]  # 0: not so many are made
-        self.kind, self.when, self.error = kind, f"{turn}{later}", error
-        self.name = f"{kind} {self.when} fails with {errno.errorcode[error]}"
-
-    def options(self, outcome):
-        return boot.failing(family(self.kind), self.error, self.when)
-
-    def fault(self, number, name, path):
-        fails = number == self.number or (
-            self.when.endswith("+") and number > self.number > 0 and name == self.kind)
-        return self.error if fails else None
-
-
 class Life:
     """One device. What our programs do are methods, named as the events, that give what
     must not be; the other events are somebody's hand."""
@@ -221,41 +201,33 @@ class Life:
             found = self.mend(before)
             before = namespace.look()
             return found + self.undisturbed(before, mended=True)
-        device = as_device(before)
         if trouble == "deaf":
-            outcome = model.boot(device)
-            null = os.open("/dev/null", os.O_RDWR)
-            ending = boot.ending_of(boot.spawn([boot.PROGRAM],
-                                               {0: null, 1: null, 2: None}))
-            os.close(null)
-            found = entry_differences(device, namespace.look())
-            if ending != outcome.ending:
-                found.append(f"ended with {ending}, not {outcome.ending}")
+            told = boot.run("/bin/sh", "-c", 'exec "$0" 2>&-', boot.PROGRAM)
+            device = as_device(before)
+            found = left(device, told.ending, model.boot(device))
         elif trouble:
-            found = self.disturbed(device, trouble, *words)
+            found = self.disturbed(before, trouble, *words)
         else:
             return self.undisturbed(before)
         return found + properties.data_changes(before, namespace.look())
 
-    def disturbed(self, device, trouble, kind="symlink", turn="1"):
-        calls = model.boot(copy.deepcopy(device)).calls
-        if trouble == "full":
-            trial(device, Troubled(calls, "symlink", int(kind), errno.ENOSPC, "+"),
+    def disturbed(self, before: Entries, trouble, *words: str) -> list[str]:
+        """At the call of one kind that is told by its turn; or from then on."""
+        kind, turn = ("symlink", *words)[-2:]
+        device, made = as_device(before), model.boot(as_device(before)).calls
+        numbers = [number for number, (name, _) in enumerate(made, start=1)
+                   if name == kind][int(turn) - 1:]
+        if not numbers:
+            return self.undisturbed(before)
+        number, names = numbers[0], boot.family(kind)
+        if trouble == "kill":
+            killed(device, Killed(names, turn, number), before)
+        else:
+            error = errno.ENOSPC if trouble == "full" else errno.EIO
+            call = Call(names, int(turn), *made[number - 1], injected=True, error=None)
+            trial(device, Fails(number, call, error, for_good=trouble == "full"),
                   again=True)
-            return []
-        if trouble == "fail":
-            trial(device, Troubled(calls, kind, int(turn), errno.EIO), again=True)
-            return []
-        numbers = [number for number, (name, _) in enumerate(calls, start=1)
-                   if name == kind]
-        if len(numbers) < int(turn):
-            return self.undisturbed(namespace.look())
-        outcome = model.boot(device, killed_before=numbers[int(turn) - 1])
-        told = boot.traced(*boot.killing(f"?{family(kind)}", turn))
-        found = entry_differences(device, namespace.look())
-        if told.ending != outcome.ending:
-            found.append(f"ended with {told.ending}")
-        return found
+        return []
 
     def mend(self, before: Entries) -> list[str]:
         """The mend removes "zoneinfo" where the links are of two sets, only that."""
@@ -333,17 +305,20 @@ class Life:
                 found.append(f"{name} was not pruned")
         return found
 
-    def run_tool(self, words, trouble: tuple[str, ...]) -> Booted:
+    def run_tool(self, words, trouble: tuple[str, ...], locked=False) -> Booted:
         if not trouble:
-            return boot.run(PROGRAM, *words)
+            holder = ["/usr/bin/flock", DOWNLOADS] if os.access(
+                DOWNLOADS, os.R_OK) and locked else []
+            return boot.run(*holder, PROGRAM, *words)
         kind, *arguments = trouble
         if kind == "full":
             options = [word for call in ("write", "mkdir", "symlink") for word in
-                       boot.failing(family(call), errno.ENOSPC, f"{arguments[0]}+")]
+                       boot.failing(boot.family(call), errno.ENOSPC,
+                                    f"{arguments[0]}+")]
         elif kind == "fail":
-            options = boot.failing(family(arguments[0]), errno.EIO, arguments[1])
+            options = boot.failing(boot.family(arguments[0]), errno.EIO, arguments[1])
         else:
-            options = boot.killing(f"?{family(arguments[0])}", int(arguments[1]))
+            options = boot.killing(boot.family(arguments[0]), arguments[1])
         told = boot.traced(*options, command=[PROGRAM, *words])
         self.calls = [] if kind == "kill" else list(boot.calls())
         return told
@@ -394,12 +369,10 @@ class Life:
         words = {"forced": ["--force"], "verified": ["--verify", "/bin/true"],
                  "refused": ["--verify", "/bin/false"]}.get(kind, []) + [source]
         update = below(namespace.look(), source)
-        if kind == "locked":
-            told = self.while_locked(words)
-        elif kind == "twice":
+        if kind == "twice":
             told = self.twice(words)
         else:
-            told = self.run_tool(words, trouble)
+            told = self.run_tool(words, trouble, locked=kind == "locked")
         namespace.empty(source)
         os.rmdir(source)
         after = namespace.look()
@@ -447,30 +420,16 @@ class Life:
                  for name, sign in SIGNS}
         put_update(device, source, release, more=files,
                    schema="45l" if kind == "schema" else "44l")
-        namespace.build_below(source, device.find(source))
         paris = f"{source}/zoneinfo/Europe/Paris"
+        sums = device.find(f"{source}/SHA256SUMS")
         if kind == "damaged":
-            with open(paris, "r+b") as file:
-                file.write(b"XXXX")
+            device.file(paris, "XXXX")
         elif kind in ("incomplete", "lacking"):
-            os.unlink(paris)
+            device.drop(paris)
         if kind == "lacking":
-            with open(f"{source}/SHA256SUMS", "r+") as file:
-                rest = [line for line in file if "Paris" not in line]
-                file.seek(0)
-                file.writelines(rest)
-                file.truncate()
+            sums.text = re.sub(".*Paris\n", "", sums.text)
+        namespace.build_below(source, device.find(source))
         return source
-
-    def while_locked(self, words) -> Booted:
-        try:
-            tz = os.open(DOWNLOADS, os.O_RDONLY)
-        except OSError:
-            return boot.run(PROGRAM, *words)
-        fcntl.flock(tz, fcntl.LOCK_EX)
-        told = boot.run(PROGRAM, *words)
-        os.close(tz)
-        return told
 
     def twice(self, words) -> Booted:
         """Both at once; the answer is that of the one that did it, if any did."""
@@ -504,13 +463,6 @@ class Life:
         if namespace.look() != booted:
             found.append("one more boot changes something")
         return found
-
-
-def family(call: str) -> str:
-    """What a machine may call it; of these it has one."""
-    return {"access": "access,?faccessat,?faccessat2", "fsync": "fsync,?syncfs",
-            "rename": "rename,?renameat,?renameat2", "openat": "openat",
-            "write": "write"}.get(call, f"{call},?{call}at")
 
 
 # --- Hands ---------------------------------------------------------------------------
@@ -615,8 +567,8 @@ STORIES = {  # those that were faults, and what an updater does at any time
         "boot mend; bend zoneinfo 2024b; tool --settle",
     "what was left behind goes": "install 2024a kill rename 1; install 2024b",
     "what cannot be read makes nothing newer":
-        "install 2022b fail openat 4; install 2024b; install 2024a fail openat 6; "
-        "install 2024a fail openat 8",
+        "install 2022b fail open 4; install 2024b; install 2024a fail open 6; "
+        "install 2024a fail open 8",
     "what is refused": "install 2024b; install 2024a; install 2025a refused; boot",
     "an update that waits": "install 2024a; boot; install 2025a; tool --settle; boot",
 }
