@@ -17,6 +17,7 @@ from pathlib import Path
 from lab.arm64_device.parts import COMPANIONS, PROGRAM, WORK, part
 from lab.carriers import image, qemu
 from lab.carriers.boot import Booted, ending_of
+from lab.carriers.namespace import build_below
 from lab.words import lines
 from lab.words.device import Device, Node, decoded
 from lab.words.paths import ICUTZ, LOCALTIME, SYSTEM_ZONEINFO, TZ_LATEST, ZONEINFO
@@ -40,36 +41,33 @@ NO_FILLER = "rm -rf /var/filler*\n"
 LINKS = (ZONEINFO, ICUTZ, LOCALTIME, TZ_LATEST)
 
 
-def first_memory(script: str) -> bytes:
-    """The cpio archive that the kernel unpacks at first: enough to mount the disks, and
-    what the device is to do when it is up."""
-    entries = [
-        *((name, 0o40755, b"") for name in "bin dev device modules proc sys".split()),
-        ("bin/busybox", 0o100755, part("bin/busybox").read_bytes()),
-        ("init", 0o100755, (GUEST / "init").read_bytes()),
-        *((f"modules/{name.rpartition('/')[2]}.ko", 0o100644,
-           part(f"kernel/{name}.ko").read_bytes()) for name in MODULES),
-        ("script", 0o100644, script.encode()), ("TRAILER!!!", 0, b"")]
-    archive = bytearray()
-    for inode, (name, mode, content) in enumerate(entries, 1):
-        encoded = name.encode() + b"\0"
-        fields = (inode, mode, 0, 0, 1, 0, len(content), 0, 0, 0, 0, len(encoded), 0)
-        archive += b"070701" + b"".join(b"%08X" % field for field in fields)
-        for text in (encoded, content):
-            archive += text
-            archive += bytes(-len(archive) % 4)
-    return bytes(archive)
+def with_shell(folders: str, programs: dict[str, Path]) -> Device:
+    """Empty folders, and programs by their places."""
+    made = Device()
+    for name in folders.split():
+        made.directory(f"/{name}")
+    for path, program in {"/bin/busybox": part("bin/busybox"), **programs}.items():
+        made.file(path, decoded(program.read_bytes()), 0o755)
+    return made
+
+
+def make_first_memory(archive: Path, script: str):
+    """What the kernel unpacks at first: enough to mount the disks, and what the device
+    is to do when it is up."""
+    memory = with_shell("dev device proc sys", {"/init": GUEST / "init", **{
+        f"/modules/{name.rpartition('/')[2]}.ko": part(f"kernel/{name}.ko")
+        for name in MODULES}})
+    memory.file("/script", script)
+    with tempfile.TemporaryDirectory() as staging:
+        build_below(staging, memory.root, exists=True)
+        image.run("bsdtar", "-c", "--format", "newc", "-f", archive, "-C", staging, ".")
 
 
 def system_partition(device: Device) -> Node:
     """The program, a shell, and the system's own data."""
-    system = Device()
-    for path in ("/dev", "/proc", "/run", "/sys", "/tmp"):
-        system.directory(path)
-    system.file("/bin/busybox", decoded(part("bin/busybox").read_bytes()), 0o755)
-    for program in (PROGRAM, *COMPANIONS):
-        system.file(f"/sbin/{program.name}", decoded(program.read_bytes()), 0o755)
-    system.file("/sbin/boot", decoded((GUEST / "boot").read_bytes()), 0o755)
+    system = with_shell("dev proc run sys tmp", {
+        "/sbin/boot": GUEST / "boot",
+        **{f"/sbin/{program.name}": program for program in (PROGRAM, *COMPANIONS)}})
     system.file("/etc/passwd", "owner:x:1:1::/:/run/bin/sh\n")
     system.put("/usr/share", device.find("/usr/share"))
     return system.root
@@ -120,8 +118,6 @@ class Console:
         self.lines = [(float(at), text) for at, text in matches]
         self.said = [text.removeprefix("device: ") for _, text in self.lines
                      if text.startswith("device: ")]
-        self.told = [text.removeprefix("told ") for text in self.said
-                     if text.startswith("told ")]  # by a program on the device
 
     def failure(self, what: str) -> RuntimeError:
         return RuntimeError(f"{what}:\n{self.text[-6000:]}")
@@ -187,7 +183,7 @@ class Machine:
                 **image.look(var or self.var, "/db", "/var/db")}
 
     def command(self, script="", options="", disk="", serial="mon:stdio") -> list[str]:
-        self.memory.write_bytes(first_memory(script))
+        make_first_memory(self.memory, script)
         return qemu.command(
             qemu.ARM64, part("vmlinuz-*"), 256,
             f"loglevel=5 printk.devkmsg=on {options}", "-initrd", str(self.memory),

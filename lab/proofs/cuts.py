@@ -17,20 +17,25 @@ import re
 import shutil
 import time
 
-from lab.arm64_device import installing, power_log
-from lab.arm64_device.installing import ACCOUNT, UPDATES
-from lab.arm64_device.machine import Console, Machine, plain, shown_links
+from lab.arm64_device import power_log
+from lab.arm64_device.machine import Console, Machine, plain, shown_links, zones
 from lab.carriers import image
 from lab.oracles import model
-from lab.oracles.installer import HIDDEN, announced, below
+from lab.oracles.installer import HIDDEN, announced, below, put_update
 from lab.oracles.sets import link, mixed, names_of, needed
 from lab.oracles.trial import log_differences
 from lab.proofs import life
 from lab.proofs.life import RELEASES, update_name
+from lab.words.device import sound_device
 from lab.words.paths import (DOWNLOADS, FORMER_ZONEINFO, ICUTZ, LEGACY_ICUTZ, LOCALTIME,
                              OLD_ICU, RECORD, SYSTEM_ZONEINFO, TIMEZONE, TZ_LATEST,
                              ZONEINFO, update_path)
 from lab.words.seen import Entries, as_device
+
+UPDATES = "/usr/share/updates/"  # to copy
+# Owns nothing but "/var/db/timezone/tz" and its own announcement; "owner" in the
+# device's passwd.
+ACCOUNT = 1
 
 # The events of a life that a shell on the device can make happen: how often each
 # comes, and how. Boots that have something to do are the rule, because they are short.
@@ -65,7 +70,8 @@ OTHERS = (("rw", ""), ("rw", "(while :; do sync; usleep 30000; done) &\n"),
 
 LINKS = ZONEINFO, ICUTZ, LOCALTIME, TZ_LATEST, LEGACY_ICUTZ
 LEFT = f"{TIMEZONE}/{HIDDEN}* {DOWNLOADS}{HIDDEN}*"
-WORDS = f"""{installing.AS_OWNER}
+WORDS = f"""
+as_owner() {{ said=$(su owner -c "exec $*" 2>&1); }}
 replace() {{
   ln -sfn "$1" "$2.next" && chown -h {ACCOUNT} "$2.next" && mv -T "$2.next" "$2"
 }}
@@ -143,10 +149,23 @@ class Victim:
         self.seed = random.randrange(10**6) if seed is None else seed
         print(f"seed {self.seed}", flush=True)
         self.random, self.machine = random.Random(self.seed), Machine("power-cuts")
-        installing.build(self.machine, RELEASES, "-N", "2048", "-J", "size=4")
+        self.build()
         self.start = self.found = self.machine.look()
         self.mend, self.allowed = False, {None}
         self.totals = collections.Counter()
+
+    def build(self):
+        device = sound_device()
+        device.directory(DOWNLOADS)
+        device.directory(TIMEZONE, 0o1775)
+        for release in RELEASES:
+            compiled = zones(f"U{release[2:].upper()}")
+            put_update(device, UPDATES + update_name(release), release, more={
+                "icutz/icutz44l.dat": f"ICU data of {release}\n" * 5000,
+                **{f"zoneinfo/{zone}": text for zone, text in compiled.items()}})
+        self.machine.build(device, "-N", "2048", "-J", "size=4", megabytes=32)
+        image.debugfs(self.machine.var, f"sif /db/timezone gid {ACCOUNT}",
+                      f"sif /db/timezone/tz uid {ACCOUNT}", write=True)
 
     @contextlib.contextmanager
     def on_trial(self):
