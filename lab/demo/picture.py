@@ -42,7 +42,10 @@ def picture(text: str) -> str:
     form = re.sub(r" *@font-face \{\{.*?\}\}\n", "", CONSOLE_SVG_FORMAT, flags=re.S)
     form = form.replace("<svg", f'<svg role="img" aria-label="{TITLE}" '
                         'xml:space="preserve"', 1)
-    return screen.export_svg(title=TITLE, code_format=form, unique_id="demo")
+    # A text has its width: no line needs an edge where it is cut.
+    svg = screen.export_svg(title=TITLE, code_format=form.replace("{lines}", ""),
+                            unique_id="demo")
+    return re.sub(r' clip-path="url\(#demo-line-\d+\)"', "", svg)
 
 
 def main():
