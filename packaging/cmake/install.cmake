@@ -1,8 +1,6 @@
 # SPDX-License-Identifier: BSD-2-Clause
 #
-# What a device gets. Under libexec, not sbin: the boot runs the program and
-# nobody types its name; hier(7) keeps libexec for just that, and out of reach
-# of anybody's PATH it is not run by accident while the links have readers.
+# What a device gets; docs/decisions.md says why the program is in libexec.
 include(GNUInstallDirs)
 
 install(TARGETS marlin RUNTIME DESTINATION ${CMAKE_INSTALL_LIBEXECDIR})
@@ -10,17 +8,15 @@ install(FILES docs/marlin.8 DESTINATION ${CMAKE_INSTALL_MANDIR}/man8)
 if(TARGET marlin-install)
   install(TARGETS marlin-mend RUNTIME DESTINATION ${CMAKE_INSTALL_LIBEXECDIR})
   install(TARGETS marlin-install RUNTIME DESTINATION ${CMAKE_INSTALL_SBINDIR})
-  install(FILES docs/marlin-install.8 docs/marlin-mend.8
-          DESTINATION ${CMAKE_INSTALL_MANDIR}/man8)
 endif()
 if(TARGET marlin-status)
   install(TARGETS marlin-status RUNTIME DESTINATION ${CMAKE_INSTALL_BINDIR})
-  install(FILES docs/marlin-status.8 DESTINATION ${CMAKE_INSTALL_MANDIR}/man8)
   install(FILES docs/marlin-status.schema.json
           DESTINATION ${CMAKE_INSTALL_DATADIR}/marlin)
 endif()
 foreach(command marlin-install marlin-mend marlin-status)
   if(TARGET ${command})
+    install(FILES docs/${command}.8 DESTINATION ${CMAKE_INSTALL_MANDIR}/man8)
     install(FILES packaging/completion RENAME ${command}
             DESTINATION ${CMAKE_INSTALL_DATADIR}/bash-completion/completions)
   endif()

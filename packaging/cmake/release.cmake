@@ -7,46 +7,40 @@
 include(CheckCXXCompilerFlag)
 include(CheckLinkerFlag)
 
-# Adds the compiler options that are known.
-function(marlin_compile_options target)
+# Adds the options that are known, to "compile" or to "link".
+function(marlin_options step target)
   foreach(option IN LISTS ARGN)
-    string(MAKE_C_IDENTIFIER "MARLIN_COMPILER_KNOWS${option}" known)
-    check_cxx_compiler_flag(${option} ${known})
-    if(${known})
-      target_compile_options(${target} INTERFACE $<$<CONFIG:Release>:${option}>)
+    string(MAKE_C_IDENTIFIER "MARLIN_${step}_KNOWS${option}" known)
+    if(step STREQUAL compile)
+      check_cxx_compiler_flag(${option} ${known})
+    else()
+      check_linker_flag(CXX ${option} ${known})
     endif()
-  endforeach()
-endfunction()
-
-# The same for the linker's.
-function(marlin_link_options target)
-  foreach(option IN LISTS ARGN)
-    string(MAKE_C_IDENTIFIER "MARLIN_LINKER_KNOWS${option}" known)
-    check_linker_flag(CXX ${option} ${known})
     if(${known})
-      target_link_options(${target} INTERFACE $<$<CONFIG:Release>:${option}>)
+      cmake_language(CALL target_${step}_options ${target}
+                     INTERFACE $<$<CONFIG:Release>:${option}>)
     endif()
   endforeach()
 endfunction()
 
 # Functions that nothing calls are left out.
 add_library(marlin_release INTERFACE)
-marlin_compile_options(marlin_release -ffunction-sections -fdata-sections)
-marlin_link_options(marlin_release -Wl,--gc-sections)
+marlin_options(compile marlin_release -ffunction-sections -fdata-sections)
+marlin_options(link marlin_release -Wl,--gc-sections)
 
 # A static program at a random address would have to relocate itself at every
 # start, for nearly as much as the whole boot costs; see docs/decisions.md. Whether
 # a dynamic one is at a random address is left to the compiler.
 if(MARLIN_STATIC)
-  marlin_compile_options(marlin_release -fno-pie)
-  marlin_link_options(marlin_release -no-pie)
+  marlin_options(compile marlin_release -fno-pie)
+  marlin_options(link marlin_release -no-pie)
 endif()
 
 # What each of these costs is in docs/decisions.md.
 add_library(marlin_hardening INTERFACE)
 if(MARLIN_HARDENING)
-  marlin_compile_options(marlin_hardening -fstack-protector-strong
-                         -fstack-clash-protection)
+  marlin_options(compile marlin_hardening -fstack-protector-strong
+                 -fstack-clash-protection)
   # No -fcf-protection and no -mbranch-protection: a program has either only if
   # every object in it does, and the C library's start files and its static
   # library are built without.
@@ -57,5 +51,5 @@ if(MARLIN_HARDENING)
                                $<$<CONFIG:Release>:-D_FORTIFY_SOURCE=2>)
   # Constants are in no executable page, on processors too whose linkers would
   # put them there.
-  marlin_link_options(marlin_hardening -Wl,-z,relro -Wl,-z,now -Wl,-z,separate-code)
+  marlin_options(link marlin_hardening -Wl,-z,relro -Wl,-z,now -Wl,-z,separate-code)
 endif()
