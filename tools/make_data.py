@@ -473,7 +473,8 @@ def zones_in(tree: Path) -> dict[str, bytes]:
 def differing(old: Path, new: Path, since: int) -> dict[str, list[str]]:
     """Names of zones that differ in the years from a moment on."""
     before, after = zones_in(old), zones_in(new)
-    # Most are the same to the byte, and many have several names.
+    # Most are the same to the byte, and many have several names: zdump takes 16 s for
+    # all of them.
     pairs = {}
     for name in sorted(before.keys() & after.keys()):
         if before[name] != after[name]:

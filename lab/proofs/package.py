@@ -223,7 +223,7 @@ def test_its_programs_are_static_and_hardened(package, name):
     sections = re.findall(r"^ +\d\d +(.*)$", headers, re.M)[:len(flags)]
     assert not [names for names, flag in zip(sections, flags)
                 if flag == "R E" and ".rodata" in names.split()]
-    # docs/decisions.md says that no branch protection is in force.
+    # packaging/cmake/release.cmake says that no branch protection is in force.
     assert not re.search(r"\b(IBT|SHSTK|BTI|PAC)\b", run("readelf", "-nW", program))
 
 
