@@ -55,8 +55,8 @@ def make_first_memory(archive: Path, script: str):
     """What the kernel unpacks at first: enough to mount the disks, and what the device
     is to do when it is up."""
     memory = with_shell("dev device proc sys", {"/init": GUEST / "init", **{
-        f"/modules/{name.rpartition('/')[2]}.ko": part(f"kernel/{name}.ko")
-        for name in MODULES}})
+        f"/modules/{path.name}": path for name in MODULES
+        for path in (WORK / "packages").rglob(f"kernel/{name}.ko")}})
     memory.file("/script", script)
     with tempfile.TemporaryDirectory() as staging:
         build_below(staging, memory.root, exists=True)

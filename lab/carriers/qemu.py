@@ -91,6 +91,8 @@ def fetch(place: Path, architecture: str, *names: str, kernel=False):
     apt("apt-get", "download", *names)
     for package in work.glob("*.deb"):
         run("dpkg-deb", "-x", package, work / "unpacked")
+    # As those of Debian 13 are.
+    run("find", work, "-name", "*.ko.xz", "-exec", "unxz", "{}", "+")
     (work / "unpacked").rename(place)
     shutil.rmtree(work)
 
