@@ -64,7 +64,7 @@ static const char* const secrets[] = {
     "/dev/rtc0",    "/dev/tty1",       "/dev/ttyS0",
     "/etc/shadow",  "/proc/1/environ", "/proc/1/root/etc/shadow",
     "/proc/kcore",  "/proc/kmsg",      "/root/secret",
-    "/run/secret",
+    "/run/secret",  "/var/db/node",
 };
 
 #define EACH(list)                   \
@@ -130,6 +130,9 @@ static void make_calls(void) {
   tell("call", "keyctl", syscall(SYS_keyctl, 0, 0, 0, 0, 0));
   tell("call", "clock_settime", syscall(SYS_clock_settime, 0, 0));
   tell("call", "sethostname", syscall(SYS_sethostname, 0, 4));
+  tell("call", "open of a new set-user-ID file",
+       open("/var/db/entry", O_WRONLY | O_CREAT | O_CLOEXEC, S_ISUID | 0700));
+  unlink("/var/db/entry");
   void* const code = mmap(NULL, 4096, PROT_READ | PROT_WRITE | PROT_EXEC,
                           MAP_PRIVATE | MAP_ANONYMOUS, -1, 0);
   tell("call", "mmap of writable code", code == MAP_FAILED ? -1 : 0);

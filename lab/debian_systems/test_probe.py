@@ -70,7 +70,8 @@ def probed(root="rw") -> Seen:
         cp usr/lib/lab/probe/marlin usr/libexec/marlin
         {linked(device())}
         chmod 640 etc/shadow
-        echo 'f /run/secret 0600 - - - secret' >etc/tmpfiles.d/secret.conf
+        echo 'f /run/secret 0600 - - - secret
+        c /var/db/node 0600 - - - 1:11' >etc/tmpfiles.d/secret.conf
         {"echo '/dev/nvme0n3 /var ext4 defaults 0 0' >etc/fstab" * (root == "ro")}
         """, apart="var" * (root == "ro")).boot(f"""
         cd /run/systemd/system

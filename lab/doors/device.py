@@ -33,11 +33,13 @@ def main() -> int:
                       help="measures the part of a boot that the pass takes")
     mode.add_argument("--systems", nargs="*", metavar="TEST", help="Debian systems "
                       "with the package: the boot unit, other inits; or these tests")
+    mode.add_argument("--unit-cost", action="store_true",
+                      help="measures what each restriction of the boot unit costs")
     parser.add_argument("--quick", action="store_true",
                         help="of the systems only those that scripts/ci boots")
     parser.add_argument("--on", choices=("amd64", "arm64", "debian-11", "debian-13"),
-                        default="amd64", help="of --systems: another system than "
-                        "Debian 12 on amd64; arm64 is half as fast")
+                        default="amd64", help="of --systems and --unit-cost: another "
+                        "system than Debian 12 on amd64; arm64 is half as fast")
     parser.add_argument("--seed", type=int, help="of what chance decides in a life")
     options = parser.parse_args()
     if subprocess.call([PROJECT / "scripts/packages", "pytest"]):
@@ -46,7 +48,7 @@ def main() -> int:
     # After the options are understood: these take pytest.
     import pytest
     from lab.arm64_device import parts, show
-    from lab.bench import boot_cost
+    from lab.bench import boot_cost, unit_cost
     from lab.carriers.qemu import Unavailable
     from lab.debian_systems import parts as systems
     from lab.proofs import cuts
@@ -57,6 +59,9 @@ def main() -> int:
             return pytest.main([*run, "load", "--durations=0", *(
                 ["-m", "not rest"] if options.quick else []),
                 *(options.systems or ["lab/debian_systems"])])
+        if options.unit_cost:
+            unit_cost.measure()
+            return 0
         parts.prepare()
         if options.tests is not None:
             return pytest.main([*run, "loadfile",

@@ -1,8 +1,8 @@
 # SPDX-License-Identifier: BSD-2-Clause
 #
 # What a Release build of the program and its libraries has beyond CMake's own
-# flags, as far as the compiler and the linker know it. Builds for amd64 and arm64
-# are tested; on any other processor the program gets the part of the hardening
+# flags, as far as the compiler and the linker know it. Builds for amd64, arm64 and
+# armhf are tested; on any other processor the program gets the part of the hardening
 # that the compiler offers there.
 include(CheckCXXCompilerFlag)
 include(CheckLinkerFlag)
