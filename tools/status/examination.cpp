@@ -1,18 +1,18 @@
 // SPDX-License-Identifier: BSD-2-Clause
 #include <unistd.h>
 
-#include <algorithm>
-#include <cerrno>
-#include <stdexcept>
+#include <new>
 
 #include "support/paths.h"
 #include "tools/escaped.h"
 #include "tools/status/failure.h"
-#include "tools/status/limits.h"
 #include "tools/status/report.h"
 #include "tools/status/throwaway.h"
 
 namespace {
+
+// How an owner appears whom this user namespace does not have.
+constexpr uid_t nobody = 65534;
 
 std::vector<std::string> unknown(const report& told, bool is_running_system) {
   std::vector<std::string> texts;
@@ -32,28 +32,40 @@ std::vector<std::string> unknown(const report& told, bool is_running_system) {
 
 // A word that is cut costs one refusal, and an update's decides nothing.
 void insist_on_enough_memory(const report& told) {
-  const auto lacks_memory = [](const std::optional<dataset_facts>& set) {
-    return set && set->ends == dataset_facts::state::no_memory;
-  };
   unsigned expected = 0;
   for (const auto* set : {&told.device.current, &told.device.update})
     if (*set && !(*set)->path.empty() && (*set)->word_is_cut) ++expected;
-  if (told.device.system.word_is_cut || told.boot.refusals > expected ||
-      lacks_memory(told.device.current) || lacks_memory(told.device.update) ||
-      std::any_of(told.boot.lines.begin(), told.boot.lines.end(),
-                  [](const line& said) { return said.error == ENOMEM; }))
-    throw cannot_tell("the next boot takes more than " +
-                      std::to_string(most_memory >> 20) + " MB of memory");
+  if (told.device.system.word_is_cut || told.boot.refusals > expected)
+    throw std::bad_alloc();
 }
 
 // In a user namespace this user is the device's root only as far as the device
 // is this user's. What is sound for somebody with the rights of everybody is
 // sound.
-void insist_on_rights(const report& told, const place& here) {
-  const std::string& foreign = told.device.foreign_part;
-  if (!foreign.empty() &&
-      (told.why.is != verdict::sound || told.device.has_closed_part ||
-       !here.owner_may_change_links))
+void insist_on_rights(const report& told, place& here) {
+  std::vector<std::string> parts = {
+      "/var/db/timezone", paths::system_zoneinfo,
+      std::string(paths::system_zoneinfo) + "/+VERSION", paths::system_icu,
+      std::string(paths::system_icu) + "/icutzformat.txt"};
+  const std::string& zone = told.device.links.localtime.text;
+  parts.push_back(zone.substr(0, zone.rfind('/')));
+  for (const auto* set : {&told.device.current, &told.device.update})
+    if (*set && !(*set)->path.empty())
+      for (const char* part : {"", "/zoneinfo", "/zoneinfo/+VERSION", "/icutz"})
+        parts.push_back((*set)->path + part);
+
+  // The boot's user may be any of the three.
+  constexpr mode_t open_to_all = 0555;
+  bool has_closed_part = false;
+  std::string foreign = here.foreign_part;
+  for (const auto& part : parts)
+    if (const auto owner =
+            here.seen.follow(part, open_to_all, open_to_all & 0444).closed) {
+      has_closed_part = true;
+      if (*owner == nobody && foreign.empty()) foreign = part;
+    }
+  if (!foreign.empty() && (told.why.is != verdict::sound || has_closed_part ||
+                           !here.owner_may_change_links))
     throw cannot_tell(escaped(foreign) +
                       " belongs to another user or group, or has an access "
                       "list; run this as root");
@@ -73,20 +85,16 @@ report examine(const std::string& root) {
   place here = enter_throwaway_device(root);
   become_the_boot();
   limit_memory();
-  count_refusals();
   report told;
   told.device = read_device(here.seen);
-  if (!here.has_all_users) {
-    told.device.foreign_part = here.foreign_part;
-    told.device.has_known_owner = !here.has_foreign_links;
-    note_rights(told.device, here.seen);
-  }
-  insist_on_enough_memory(told);
+  // Whether its owner may write there is insisted on below.
+  told.device.links.is_writable |= here.has_foreign_links;
   told.boot = rehearse_boot();
   told.after = read_links();
   insist_on_enough_memory(told);
+  told.after.is_writable |= here.has_foreign_links;
   told.why = explain(told.device, told.boot, told.after);
-  insist_on_rights(told, here);
+  if (!here.has_all_users) insist_on_rights(told, here);
   told.cannot_know = unknown(told, here.is_running_system);
   told.is_mended_by_a_removal = is_mended_by_a_removal(told);
   return told;

@@ -1,6 +1,4 @@
 // SPDX-License-Identifier: BSD-2-Clause
-#include "tools/status/explanation.h"
-
 #include <algorithm>
 #include <cstring>
 #include <stdexcept>
@@ -9,6 +7,7 @@
 
 #include "tools/escaped.h"
 #include "tools/status/failure.h"
+#include "tools/status/report.h"
 
 namespace {
 
@@ -152,21 +151,18 @@ class account {
   void select() {
     const bool failed = has(lines::last_resort);
     const auto [code, text] = failed ? cause_of_failure() : cause{};
-    const bool no_current =
-        code == "system_number_too_large" || code == "announcement_unreadable";
-    const bool no_check = no_current || (failed && failed_at_current());
+    const int steps_reached =
+        code == "system_number_too_large" || code == "announcement_unreadable"
+            ? 0
+        : failed && failed_at_current() ? 1
+        : failed && failed_in_a_reset() ? 2
+                                        : 3;
     name_ = "current";
-    no_current ? skip() : current();
+    steps_reached < 1 ? skip() : current();
     name_ = "usable";
-    no_check ? skip() : usable();
+    steps_reached < 2 ? skip() : usable();
     name_ = "update";
-    if (no_check || (failed && failed_in_a_reset()))
-      skip();
-    else if (failed)
-      add("failed", "last_resort", wrong,
-          escaped(device_.links.tz_latest.text) + " cannot be used");
-    else
-      update();
+    steps_reached < 3 ? skip() : update();
     record();
     name_ = "last_resort";
     if (failed)
@@ -273,6 +269,9 @@ class account {
   }
 
   void update() {
+    if (has(lines::last_resort))
+      return add("failed", "last_resort", wrong,
+                 escaped(device_.links.tz_latest.text) + " cannot be used");
     if (!device_.update && !has(lines::refused))
       return add("nothing", "none", sound, "none is announced");
     const dataset_facts& set = device_.update.value();
@@ -362,7 +361,7 @@ class account {
     if (!after_.pair.fits)
       found(std::string(after_.pair.name),
             "after the boot " + std::string(after_.pair.sentence));
-    if (!after_.is_writable && device_.has_known_owner)
+    if (!after_.is_writable)
       found("not_writable", "no boot can write in /var/db/timezone");
     if (const std::string closed = closed_part(); !closed.empty())
       found("closed", "only root can read what is in use: " + closed +

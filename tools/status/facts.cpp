@@ -12,7 +12,6 @@
 #include <cstring>
 #include <map>
 #include <memory>
-#include <new>
 #include <set>
 #include <stdexcept>
 #include <utility>
@@ -28,28 +27,16 @@
 namespace {
 
 constexpr std::size_t longest_word = 65536;  // of a version or a schema
-// How an owner appears whom this user namespace does not have.
-constexpr uid_t nobody = 65534;
 
-unsigned refused = 0;
-bool walk_was_refused = false;
+// Of what a path leads to; of nothing, all zero.
+struct stat status_of(const std::string& path) {
+  struct stat status {};
+  if (::stat(path.c_str(), &status) != 0) status = {};
+  return status;
+}
 
 bool is_directory(const std::string& path) {
-  struct stat status {};
-  return ::stat(path.c_str(), &status) == 0 && S_ISDIR(status.st_mode);
-}
-
-bool is_same_directory(const std::string& left, const std::string& right) {
-  struct stat one {
-  }, other{};
-  return ::stat(left.c_str(), &one) == 0 &&
-         ::stat(right.c_str(), &other) == 0 && S_ISDIR(one.st_mode) &&
-         one.st_dev == other.st_dev && one.st_ino == other.st_ino;
-}
-
-bool is_regular(const std::string& path) {
-  struct stat status {};
-  return ::stat(path.c_str(), &status) == 0 && S_ISREG(status.st_mode);
+  return S_ISDIR(status_of(path).st_mode);
 }
 
 entry record_at(const char* path) {
@@ -85,7 +72,11 @@ link_pair pair_of(const link_facts& links) {
   if (!has_icu)
     return {"update_without_icu",
             "zoneinfo names an update, but there is no link icutz"};
-  if (links.icutz.text == icu || is_same_directory(paths::icu_link, icu))
+  const struct stat linked = status_of(paths::icu_link);
+  const struct stat ours = status_of(icu);
+  if (links.icutz.text == icu ||
+      (S_ISDIR(linked.st_mode) && linked.st_dev == ours.st_dev &&
+       linked.st_ino == ours.st_ino))
     return one;
   return {"update_with_other_icu",
           "icutz does not name the ICU data of zoneinfo's update"};
@@ -134,7 +125,8 @@ void list_downloads(device_facts& device, sight& seen) {
 
 void expect_file(dataset_facts& facts, const std::string& path) {
   errno = 0;
-  if (is_regular(path) && ::access(path.c_str(), R_OK) == 0) return;
+  if (S_ISREG(status_of(path).st_mode) && ::access(path.c_str(), R_OK) == 0)
+    return;
   facts.unreadable.push_back(
       {path, errno == 0 ? "Not a file" : std::strerror(errno)});
 }
@@ -181,9 +173,9 @@ dataset_facts facts_of(const std::string& path,
                        std::unique_ptr<const mln_dataset>& system) {
   dataset_facts facts;
   facts.path = path;
-  const unsigned before = refused;
+  const unsigned before = refusals();
+  take_lines();
   errno = 0;
-  walk_was_refused = false;
   try {
     auto built = std::make_unique<const mln_dataset>(path);
     facts.version_text = built->version_string.substr(0, longest_word);
@@ -198,11 +190,10 @@ dataset_facts facts_of(const std::string& path,
     facts.ends = dataset_facts::state::number_too_large;
   } catch (int) {
     facts.ends = dataset_facts::state::walk_failed;
-  } catch (const std::bad_alloc&) {
-    facts.ends = dataset_facts::state::no_memory;
   }
-  facts.word_is_cut = refused != before;
-  if (walk_was_refused) facts.ends = dataset_facts::state::no_memory;
+  // A walk that gets no memory looks like one that finds nothing.
+  take_lines();
+  facts.word_is_cut = refusals() != before;
   if (facts.ends != dataset_facts::state::bad_path) note_unreadable(facts);
   return facts;
 }
@@ -240,43 +231,12 @@ int list_directory(const std::string& path, std::vector<std::string>& names) {
   return 0;
 }
 
-void count_refusals() {
-  std::set_new_handler([] {
-    ++refused;
-    throw std::bad_alloc();
-  });
-}
-
-unsigned refusals() { return refused; }
-
 std::string closed_part() {
   sight seen;
   for (const char* path :
        {"/var/db/timezone", paths::localtime_link, paths::icu_link})
     if (seen.follow(path).closed) return path;
   return {};
-}
-
-void note_rights(device_facts& device, sight& seen) {
-  std::vector<std::string> parts = {
-      "/var/db/timezone", paths::system_zoneinfo,
-      std::string(paths::system_zoneinfo) + "/+VERSION", paths::system_icu,
-      std::string(paths::system_icu) + "/icutzformat.txt"};
-  const std::string& zone = device.links.localtime.text;
-  parts.push_back(zone.substr(0, zone.rfind('/')));
-  for (const auto* set : {&device.current, &device.update})
-    if (*set && !(*set)->path.empty())
-      for (const char* part : {"", "/zoneinfo", "/zoneinfo/+VERSION", "/icutz"})
-        parts.push_back((*set)->path + part);
-  // The boot's user may be any of the three.
-  constexpr mode_t open_to_all = 0555;
-  for (const auto& part : parts)
-    if (const auto owner =
-            seen.follow(part, open_to_all, open_to_all & 0444).closed) {
-      device.has_closed_part = true;
-      if (*owner == nobody && device.foreign_part.empty())
-        device.foreign_part = part;
-    }
 }
 
 link_facts read_links() {
@@ -288,13 +248,12 @@ link_facts read_links() {
   links.record = record_at(paths::version_record);
   links.legacy_icutz = entry_at(paths::legacy_icu_link);
   links.old_icu = entry_at(paths::obsolete_icu);
-  struct stat record {};
-  if (links.record.what != entry::kind::none &&
-      ::stat(paths::version_record, &record) == 0 && S_ISREG(record.st_mode))
+  const struct stat record = status_of(paths::version_record);
+  if (S_ISREG(record.st_mode))
     links.recorded =
         record.st_mtim.tv_sec * 1'000'000'000LL + record.st_mtim.tv_nsec;
   links.is_writable = ::access("/var/db/timezone", W_OK | X_OK) == 0;
-  links.zone_is_file = is_regular(paths::localtime_link);
+  links.zone_is_file = S_ISREG(status_of(paths::localtime_link).st_mode);
   try {
     links.current_path = current_dataset_path();
   } catch (int) {
@@ -304,10 +263,6 @@ link_facts read_links() {
 }
 
 device_facts read_device(sight& seen) {
-  // A walk that gets no memory looks like one that finds nothing.
-  take_lines([](const line& said) {
-    if (said.error == ENOMEM) walk_was_refused = true;
-  });
   device_facts device;
   device.links = read_links();
   device.legacy_resolves = fsutil::exists(paths::legacy_icu_link);
@@ -315,11 +270,12 @@ device_facts read_device(sight& seen) {
   std::unique_ptr<const mln_dataset> system;
   device.system = facts_of({}, system);
   if (device.links.current_path)
-    device.current = facts_of(*device.links.current_path, system);
+    device.current = device.links.current_path->empty()
+                         ? device.system
+                         : facts_of(*device.links.current_path, system);
   if (device.links.tz_latest.what == entry::kind::link)
     device.update = facts_of(latest_update_path(), system);
   list_downloads(device, seen);
-  take_lines(nullptr);
   return device;
 }
 
@@ -327,11 +283,6 @@ std::string kind_of(const entry& here) {
   static constexpr std::array names = {"none",      "link",    "file",
                                        "directory", "special", "unknown"};
   return names.at(static_cast<std::size_t>(here.what));
-}
-
-std::string data_in_use(const link_facts& links) {
-  if (!links.current_path) return "none";
-  return links.current_path->empty() ? "system" : "update";
 }
 
 std::string zone_of(const link_facts& links) {

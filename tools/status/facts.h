@@ -40,14 +40,8 @@ struct flaw {
 // One data set as the boot program would build it.
 struct dataset_facts {
   // How building it ends: a path that is refused, a number in the name that
-  // does not fit, a walk that cannot be started, no memory.
-  enum class state {
-    built,
-    bad_path,
-    number_too_large,
-    walk_failed,
-    no_memory
-  };
+  // does not fit, a walk that cannot be started.
+  enum class state { built, bad_path, number_too_large, walk_failed };
   state ends = state::built;
   std::string path{};  // empty: the system partition's
   std::string version_text{};
@@ -103,9 +97,6 @@ struct device_facts {
   std::vector<download> downloads{};  // those that are needed first
   int downloads_error = 0;
   bool has_more_downloads = false;  // perhaps; more entries than are listed
-  std::string foreign_part{};       // the first that is another user's
-  bool has_closed_part = false;     // one that not everybody may read
-  bool has_known_owner = true;      // the links' directory
 };
 
 // The links as they are, also after a boot. Neither throws anything but
@@ -116,22 +107,11 @@ link_facts read_links();
 // What readers need and only root may read, as it is now; empty: nothing.
 std::string closed_part();
 
-// Notes whose the parts are that a boot reads, where not everybody may.
-void note_rights(device_facts& device, sight& seen);
-
-// How often memory was refused to this process from now on is counted.
-void count_refusals();
-unsigned refusals();
-
 // All of it. The data sets are read as a boot reads them.
 device_facts read_device(sight& seen);
 
 // The words in which they are told, the same for people and for programs.
 std::string kind_of(const entry& here);
-
-// Which data is in use: "system", "update", or "none" when "zoneinfo" names no
-// data set.
-std::string data_in_use(const link_facts& links);
 
 // The zone that "localtime" names, below the active tree; empty: none.
 std::string zone_of(const link_facts& links);

@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: BSD-2-Clause
 //
 // marlin-status: which data a device uses, and what its next boot will do.
+#include <getopt.h>
 #include <sys/ioctl.h>
 #include <sys/wait.h>
 #include <unistd.h>
@@ -12,15 +13,97 @@
 #include <cstring>
 #include <new>
 
+#include "tools/escaped.h"
 #include "tools/status/failure.h"
-#include "tools/status/limits.h"
-#include "tools/status/options.h"
+#include "tools/status/rehearsal.h"
 #include "tools/status/report.h"
 
 namespace {
 
+// The exit statuses that no device has; those of devices are verdicts.
+constexpr int bad_use = 64;
+constexpr int not_here = 77;
+
 // In seconds, for storage that never answers.
 constexpr unsigned longest_wait = 30;
+
+enum class form { rows, json, reasons };
+
+struct options {
+  std::string root = "/";
+  form wanted = form::rows;
+};
+
+[[noreturn]] void refuse(int status, const std::string& why) {
+  std::fprintf(stderr, "marlin-status: %s\n", why.c_str());
+  std::exit(status);
+}
+
+constexpr char help[] =
+    R"(usage: marlin-status [--root DIR] [--json | --check]
+
+Tells which time-zone data a device uses, and what its next boot will do.
+Nothing is changed: the boot is run in a throw-away layer over the device.
+
+  --root DIR   the device unpacked or mounted in DIR, not this system
+  --json       one JSON object
+  --check      only the reasons for a status of 1 or 2
+  --version    the version of this program
+
+Exit status: 0 sound, 1 the next boot changes something on purpose,
+2 something is wrong, 64 bad use, 77 it cannot be told here.
+)";
+
+[[noreturn]] void misused(const std::string& why) {
+  refuse(bad_use, why + "; see --help");
+}
+
+[[noreturn]] void print_and_exit(const char* text) {
+  if (std::fputs(text, stdout) < 0 || std::fflush(stdout) != 0)
+    refuse(not_here, std::string("standard output: ") + std::strerror(errno));
+  std::exit(0);
+}
+
+// Numbers that no letter has.
+enum { root = 256, json, check, version };
+const option known[] = {{"root", required_argument, nullptr, root},
+                        {"json", no_argument, nullptr, json},
+                        {"check", no_argument, nullptr, check},
+                        {"help", no_argument, nullptr, 'h'},
+                        {"version", no_argument, nullptr, version},
+                        {}};
+
+options options_in(int count, char** words) {
+  options chosen;
+  opterr = 0;
+  for (;;) {
+    const int at = optind;
+    switch (const int letter =
+                ::getopt_long(count, words, "+:h", known, nullptr)) {
+      case root:
+        chosen.root = optarg;
+        if (chosen.root.empty()) misused("--root needs a directory");
+        break;
+      case json:
+      case check:
+        if (chosen.wanted != form::rows)
+          misused("one of --json and --check is enough");
+        chosen.wanted = letter == json ? form::json : form::reasons;
+        break;
+      case 'h':
+        print_and_exit(help);
+      case version:
+        print_and_exit("marlin-status " MARLIN_VERSION "\n");
+      case -1:
+        if (optind == count) return chosen;
+        misused(escaped(words[optind]) + " is not expected");
+      case ':':
+        misused("--root needs a directory");
+      default:
+        misused(escaped(words[at]) + " is not understood");
+    }
+  }
+}
 
 look of_terminal() {
   winsize size{};
@@ -55,7 +138,8 @@ int tell_or_say_why_not(const options& chosen) {
   } catch (const cannot_tell& reason) {
     why = reason.what();
   } catch (const std::bad_alloc&) {
-    why = "it takes more memory than there is";
+    why = "the next boot takes more than " + std::to_string(most_memory >> 20) +
+          " MB of memory";
   } catch (...) {
     why =
         "what the boot did does not follow from what was read; is the device "

@@ -1,10 +1,29 @@
 // SPDX-License-Identifier: BSD-2-Clause
 //
-// One boot, run by the boot program's own code in this process.
+// One boot, run by the boot program's own code in this process, a child.
 #pragma once
 
 #include <string>
 #include <vector>
+
+// This process ends when its parent does. Throws cannot_tell.
+void end_with_parent();
+
+// Gives this process what the boot unit gives marlin: no capability, no new
+// privileges, no core file. Throws cannot_tell.
+void become_the_boot();
+
+// Bounds for a hostile device: what this process may have of addresses, and
+// from now on of processor time, after which the kernel ends it.
+inline constexpr unsigned long most_memory = 48ul << 20;
+void limit_memory();
+void limit_time();
+
+// How often memory was refused to this process.
+unsigned refusals();
+
+// Why a child that had these bounds was ended, from what wait(2) tells.
+std::string why_ended(int status);
 
 // A warning, taken whole where the program hands it to warn(3): no text inside
 // one can look like another.
@@ -14,11 +33,10 @@ struct line {
   int error = 0;       // the errno whose text the line ends with
 };
 
-// Where the warnings of this process go, instead of to standard error: a
-// function that is called with each, or nullptr for nowhere. This program has
-// its own warn(3) for it, which leaves errno alone.
-using line_sink = void (*)(const line&);
-void take_lines(line_sink sink);
+// The warnings of this process since the last call. This program has its own
+// warn(3) for it, which prints nothing and leaves errno alone. Throws
+// std::bad_alloc if the kernel had no memory for what was warned of.
+std::vector<line> take_lines();
 
 struct rehearsal {
   std::vector<line> lines{};
@@ -27,5 +45,6 @@ struct rehearsal {
   unsigned refusals = 0;  // how often memory was refused to it
 };
 
-// Runs run_startup_pass() on the device that this process sees as "/".
+// Runs run_startup_pass() on the device that this process sees as "/". Throws
+// what take_lines() throws.
 rehearsal rehearse_boot();

@@ -1,4 +1,5 @@
 // SPDX-License-Identifier: BSD-2-Clause
+#include <algorithm>
 #include <cstring>
 #include <utility>
 
@@ -51,9 +52,10 @@ std::string version_and_schema(const dataset_facts& set) {
 }
 
 // Breaks at blanks where it can.
-std::string wrapped(std::string text, std::size_t width) {
+std::string wrapped(std::string text, std::size_t columns) {
+  const std::size_t width = std::max(columns, 2 * label_width) - label_width;
   std::string lines;
-  while (width > 0 && text.size() > width) {
+  while (columns > 0 && text.size() > width) {
     std::size_t end = text.rfind(' ', width);
     if (end == std::string::npos || end == 0) end = width;
     lines += text.substr(0, end) + "\n" + std::string(label_width, ' ');
@@ -64,28 +66,24 @@ std::string wrapped(std::string text, std::size_t width) {
 
 class rows {
  public:
-  explicit rows(const look& wanted) : look_(wanted) {}
-
-  void add(std::string label, const std::string& text) {
-    label.resize(label_width, ' ');
-    const std::size_t width = look_.width == 0 ? 0
-                              : look_.width > 2 * label_width
-                                  ? look_.width - label_width
-                                  : label_width;
-    text_ += bold(label) + wrapped(text, width) + "\n";
+  void add(const std::string& label, const std::string& text) {
+    rows_.emplace_back(label, text);
   }
   void add_all(const char* label, const std::vector<std::string>& texts) {
     for (const auto& text : texts) add(std::exchange(label, ""), text);
   }
-  std::string text() const { return text_; }
-
- private:
-  std::string bold(const std::string& label) const {
-    return look_.has_colour ? "\033[1m" + label + "\033[0m" : label;
+  std::string shown(const look& wanted) const {
+    std::string lines;
+    for (auto [label, text] : rows_) {
+      label.resize(label_width, ' ');
+      if (wanted.has_colour) label = "\033[1m" + label + "\033[0m";
+      lines += label + wrapped(text, wanted.width) + "\n";
+    }
+    return lines;
   }
 
-  look look_;
-  std::string text_{};
+ private:
+  std::vector<std::pair<std::string, std::string>> rows_{};
 };
 
 void add_flaws(rows& shown, const dataset_facts& set) {
@@ -184,7 +182,7 @@ std::string in_reasons(const report& told) {
 }
 
 std::string in_rows(const report& told, const look& wanted) {
-  rows shown(wanted);
+  rows shown;
   add_data(shown, told);
   add_links(shown, told);
   add_downloads(shown, told);
@@ -195,5 +193,5 @@ std::string in_rows(const report& told, const look& wanted) {
                           ? "the next boot changes something"
                           : "something is wrong");
   for (const auto& reason : told.why.reasons) shown.add("", reason.sentence());
-  return shown.text();
+  return shown.shown(wanted);
 }

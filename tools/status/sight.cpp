@@ -13,21 +13,20 @@
 #include "support/paths.h"
 #include "tools/status/facts.h"
 
+const sight::place sight::nothing{.error = ENOENT};
+
 sight::way sight::follow(std::string rest, mode_t of_directories,
                          mode_t of_file) {
-  way found;
+  std::optional<uid_t> closed;
   std::string here;
   for (int links = 0; links <= 40;) {
     const place& at = look(here);
     const auto start = rest.find_first_not_of('/');
     if (!S_ISDIR(at.mode) && !rest.empty()) return {};
     const mode_t needed = S_ISDIR(at.mode) ? of_directories : of_file;
-    if (!here.empty() && !found.closed && (at.mode & needed) != needed)
-      found.closed = at.owner;
-    if (start == std::string::npos) {
-      found.real = here.empty() ? "/" : here;
-      return found;
-    }
+    if (!here.empty() && !closed && (at.mode & needed) != needed)
+      closed = at.owner;
+    if (start == std::string::npos) return {here, at, closed};
     rest.erase(0, start);
     const std::string name = rest.substr(0, rest.find('/'));
     rest.erase(0, name.size());
@@ -35,7 +34,7 @@ sight::way sight::follow(std::string rest, mode_t of_directories,
     if (name == "." || name == "..") continue;
     const place& next = look(here + "/" + name);
     // What this process may not look at is there too.
-    if (next.error == EACCES) return {{}, found.closed.value_or(at.owner)};
+    if (next.error == EACCES) return {{}, nothing, closed.value_or(at.owner)};
     if (next.error != 0) return {};
     if (!S_ISLNK(next.mode)) {
       here += "/" + name;
@@ -48,7 +47,7 @@ sight::way sight::follow(std::string rest, mode_t of_directories,
   return {};
 }
 
-bool sight::place::looks_like(const place& other) const {
+bool sight::place::operator==(const place& other) const {
   return std::tie(mode, size, error, target, names) ==
          std::tie(other.mode, other.size, other.error, other.target,
                   other.names);
@@ -70,9 +69,9 @@ sight::place& sight::look(const std::string& real) {
 }
 
 void sight::look_into(const std::string& directory) {
-  const std::string real = follow(directory).real;
+  const auto& [real, end, closed] = follow(directory);
   std::vector<std::string> names;
-  if (!real.empty() && S_ISDIR(look(real).mode) && look(real).names.empty())
+  if (S_ISDIR(end.mode) && end.names.empty())
     list_directory(root_ + real, names);
   for (const auto& name : names) {
     look(real).names += name + "/";
@@ -82,10 +81,10 @@ void sight::look_into(const std::string& directory) {
 }
 
 const sight::place& sight::at(const std::string& path) {
-  static const place nothing{.error = ENOENT};
   const auto name = path.rfind('/');
-  const std::string parent = follow(path.substr(0, name)).real;
-  return parent.empty() ? nothing : look(parent + path.substr(name));
+  const way parent = follow(path.substr(0, name));
+  return parent.end.error == 0 ? look(parent.real + path.substr(name))
+                               : nothing;
 }
 
 void sight::look_around() {
@@ -114,12 +113,8 @@ void sight::look_around() {
 }
 
 std::optional<std::string> sight::first_difference(const sight& other) const {
-  const auto [one, another] =
-      std::mismatch(seen_.begin(), seen_.end(), other.seen_.begin(),
-                    other.seen_.end(), [](const auto& left, const auto& right) {
-                      return left.first == right.first &&
-                             left.second.looks_like(right.second);
-                    });
+  const auto [one, another] = std::mismatch(
+      seen_.begin(), seen_.end(), other.seen_.begin(), other.seen_.end());
   if (one != seen_.end()) return one->first;
   if (another != other.seen_.end()) return another->first;
   return std::nullopt;

@@ -18,8 +18,22 @@ class sight {
   explicit sight(std::string root = {}) : root_(std::move(root)) {}
   void enter() { root_.clear(); }
 
+  struct place {
+    mode_t mode = 0;
+    off_t size = 0;  // not of a directory
+    int error = 0;
+    std::string target{};
+    std::string names{};  // in a directory whose names count
+    uid_t owner = 0;
+
+    // Whoever the owners are.
+    bool operator==(const place& other) const;
+  };
+  static const place nothing;
+
   struct way {
-    std::string real{};             // where it leads; empty: nowhere
+    std::string real{};             // where it leads; "/" is empty
+    const place& end = nothing;     // what is there
     std::optional<uid_t> closed{};  // whose the first part without a mode is
   };
   // Directories on the way and at its end, except "/", have to have one mode,
@@ -30,23 +44,8 @@ class sight {
   // where it leads.
   void look_around();
 
-  // Of what was seen, without owners.
   std::optional<std::string> first_difference(const sight& other) const;
-  template <typename Condition>
-  void forget(Condition is_it) {
-    std::erase_if(seen_, [&](const auto& one) { return is_it(one.first); });
-  }
 
-  struct place {
-    mode_t mode = 0;
-    off_t size = 0;  // not of a directory
-    int error = 0;
-    std::string target{};
-    std::string names{};  // in a directory whose names count
-    uid_t owner = 0;
-
-    bool looks_like(const place& other) const;
-  };
   const place& at(const std::string& path);  // what stands there itself
 
  private:
