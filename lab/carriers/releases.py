@@ -1,12 +1,10 @@
 # SPDX-License-Identifier: BSD-2-Clause
 """Releases of the time-zone rules and of ICU's data to make data sets from: this
-machine's own, under other names, and with one invention. From 1 January of a year on
-Lisbon has Central European Time, in the rules and in ICU's data alike."""
+machine's own, under other names, and with one invention: in later ones Lisbon has the
+time of another city, in the rules and in ICU's data alike."""
 
 from __future__ import annotations
 
-import calendar
-import datetime
 import json
 import os
 import re
@@ -23,8 +21,7 @@ from lab.words.places import BUILD, PROJECT
 TARGET = BUILD / "releases"
 WITHOUT_ICU = Path(__file__).with_name("without_icu")
 RULES = Path("/usr/share/zoneinfo/tzdata.zi")
-# Lisbon's last line.
-LISBON = r"(?m)^(Z Europe/Lisbon .*\n(?:[^RLZ].*\n)*?0 (\S+) WE%sT)$"
+YEAR = 2027  # in which programs are asked for the time
 RESOURCES = "metaZones.res timezoneTypes.res windowsZones.res zoneinfo64.res".split()
 
 
@@ -94,16 +91,11 @@ def icu_schema() -> str:
 class Names(NamedTuple):
     """Releases, as 2025b, and ICU's schemas, as 72l."""
     system: str
-    update: str  # Lisbon changes in the year after the system's
-    refused: str  # and here a year later; its ICU data gets another schema
+    update: str  # Lisbon has Central European Time
+    refused: str  # and here Eastern; its ICU data gets another schema
     upgrade: str  # the same, of a later system
     icu: str
     other_icu: str
-
-    @property
-    def year(self) -> int:
-        """From its beginning on Lisbon has another time."""
-        return int(self.system[:4]) + 1
 
 
 def names() -> Names:
@@ -130,26 +122,28 @@ def make_all():
     refused = after(update)
     made = Names(system, update, refused, after(refused), icu,
                  f"{int(icu[:-1]) + 1}{icu[-1]}")
-    for release, lisbon_from in ((system, None), (update, made.year),
-                                 (refused, made.year + 1),
-                                 (made.upgrade, made.year + 1)):
-        make(TARGET / release, release, lisbon_from)
+    for release, city in ((system, "Lisbon"), (update, "Paris"), (refused, "Athens"),
+                          (made.upgrade, "Athens")):
+        make(TARGET / release, release, city)
     (TARGET / "names").write_text(json.dumps(made._asdict()))
 
 
-def make(place: Path, release: str, lisbon_from: int | None = None):
-    """A release, as tzdata.zi and as ICU's files in the directory icu."""
+def make(place: Path, release: str, city: str):
+    """A release, as tzdata.zi and as ICU's files in the directory icu, in which Lisbon
+    has this city's time."""
     place.mkdir(parents=True)
     rules = re.sub("^.*", f"# version {release}", RULES.read_text(), count=1)
-    if lisbon_from:
-        find("zone of Lisbon", LISBON, rules)
-        # From Western to Central European Time when a year begins, as in 1992.
-        rules = re.sub(LISBON, rf"\1 {lisbon_from}\n1 \2 CE%sT", rules)
+
+    def zone(city: str) -> str:
+        return find(f"zone of {city}",
+                    rf"^Z Europe/{city} ((?:.*\n)(?:[^RLZ].*\n)*)", rules)[1]
+
+    rules = rules.replace(zone("Lisbon"), zone(city))
     (place / "tzdata.zi").write_text(rules)
     icu, source = place / "icu", place / "zoneinfo64.txt"
     icu.mkdir()
     icu_files(icu)
-    source.write_text(icu_text(icu, release, lisbon_from))
+    source.write_text(icu_text(icu, release, city))
     output("genrb", "-q", "-d", icu, source)
 
 
@@ -162,55 +156,21 @@ def icu_files(folder: Path):
         output("icupkg", "-x", wanted, "-d", folder, package)
 
 
-def icu_text(folder: Path, release: str, lisbon_from: int | None) -> str:
+def icu_text(folder: Path, release: str, city: str) -> str:
     """The source of zoneinfo64.res, with what is different in a release."""
     text = output("derb", "-c", "-s", folder, "zoneinfo64.res").decode("utf-8-sig")
     # What derb does not tell: without it ICU would look for a parent.
     text = re.sub("(?m)^zoneinfo64{", "zoneinfo64:table(nofallback){", text)
     find("release of ICU's data", '^ +TZVersion *{ *"[^"]+"', text)
     text = re.sub('(?m)(^ +TZVersion *{ *")[^"]+', rf"\g<1>{release}", text)
-    if lisbon_from is None:
-        return text
     listed = find("names of zones", r"^ +Names\{([^}]*)\}", text)[1]
     names = re.findall('"([^"]+)"', listed)
     # Each zone is a table, or a number that stands for another.
-    zones = list(re.finditer(r"^        (?:\{\n.*?^        \}|:int \{.*?\})", text,
-                             re.MULTILINE | re.DOTALL))
+    zones = re.findall(r"(?ms)^        (?:\{\n.*?^        \}|:int \{.*?\})", text)
     if len(zones) != len(names):
         stop(1, "this machine's ICU data has zones of another form")
-    lisbon = zones[names.index("Europe/Lisbon")]
-    return (text[:lisbon.start()] + central(lisbon[0], lisbon_from)
-            + text[lisbon.end():])
-
-
-def central(entry: str, year: int) -> str:
-    """An ICU zone that has been at UTC since its last transition, with Europe's summer
-    time by a rule, and has UTC+1 from a year on. The transitions until then, which
-    were by the rule, are written out."""
-    def last_sunday(year: int, month: int) -> int:
-        last = datetime.datetime(year, month, 31, 1, tzinfo=datetime.timezone.utc)
-        return int(last.timestamp()) - 86400 * ((last.weekday() + 1) % 7)
-
-    def field(name: str, kind: str) -> str:
-        return find("zone of Lisbon in ICU's data", rf"\b{name}:{kind} {{ (.*?) }}",
-                    entry)[1]
-
-    offsets = [int(offset) for offset in field("typeOffsets", "intvector").split(", ")]
-    types = list(zip(offsets[::2], offsets[1::2]))
-    summer, winter, final = (types.index(kind) for kind in
-                             ((0, 3600), (0, 0), (3600, 0)))
-    added = []
-    for before in range(int(field("finalYear", "int")), year):
-        added += [(last_sunday(before, 3), summer), (last_sunday(before, 10), winter)]
-    added.append((calendar.timegm((year, 1, 1, 0, 0, 0)), final))
-    known = int(field("trans", "intvector").split(", ")[-1])
-    added = [(moment, kind) for moment, kind in added if moment > known]
-    for name, value in (("finalRaw", 3600), ("finalYear", year)):
-        entry = re.sub(rf"({name}:int {{ )\d+", rf"\g<1>{value}", entry)
-    entry = re.sub(r"(trans:intvector { [^}]*[0-9])", r"\g<1>" + "".join(
-        f", {moment}" for moment, _ in added), entry)
-    return re.sub(r"(typeMap:binary { [0-9a-f]+)", r"\g<1>" + "".join(
-        f"{kind:02x}" for _, kind in added), entry)
+    lisbon, other = (zones[names.index(f"Europe/{name}")] for name in ("Lisbon", city))
+    return text.replace(lisbon, other)
 
 
 def make_system(release: str, schema: str, out: Path):

@@ -20,7 +20,7 @@ import sys
 import zoneinfo
 from pathlib import Path
 
-from lab.carriers import boot, namespace, real_data
+from lab.carriers import boot, namespace, real_data, releases
 from lab.demo import screen
 from lab.words import lines
 from lab.words.device import Device
@@ -36,8 +36,7 @@ FACTS = Path(__file__).with_name("facts").read_text(encoding="ascii").splitlines
 
 
 def tell(story: Story):
-    device, names, year = story.device, story.names, story.year
-    put_off = f"1 January {year + 1}"
+    device, names = story.device, story.names
     screen.rule("marlin, eight boots of one device")
     screen.say(f"""At every boot marlin decides which time-zone data a device uses:
         what its system partition holds, or an update downloaded since. Whoever
@@ -50,20 +49,20 @@ def tell(story: Story):
 
   {screen.paint(screen.DIM, "Shown beside them:")}
   record      the versions before and after the last update
-  clock       what "date" shows at noon UTC on 1 February {year}
+  clock       what "date" shows at noon UTC on a day in winter
   ICU clock   the same of a program with Debian's ICU""")
     screen.say("""Before each boot marlin-status tells what it will do.""")
     screen.say("""The device is private and gone when this ends. Its data is this
         machine's, except for the names of the releases and one invention in the later
-        ones: Lisbon goes from Western European Time, WET, to Central European Time,
-        CET, in the zone files and in the ICU data. One download is made for another
+        ones: Lisbon leaves Western European Time, WET, for Central or Eastern, CET or
+        EET, in the zone files and in the ICU data. One download is made for another
         ICU format.""")
     print(f"""
-  {screen.paint(screen.DIM, " " * 12 + "ICU format   Lisbon changes   what it is")}
-  {names.system:<11} {names.icu:<12} never            system partition, at first
-  {names.update:<11} {names.icu:<12} 1 January {year}   a download
-  {names.refused:<11} {names.other_icu:<12} {put_off}   a later download
-  {names.upgrade:<11} {names.icu:<12} {put_off}   system partition, upgraded""")
+  {screen.paint(screen.DIM, " " * 12 + "ICU format   Lisbon   what it is")}
+  {names.system:<11} {names.icu:<12} WET      system partition, at first
+  {names.update:<11} {names.icu:<12} CET      a download
+  {names.refused:<11} {names.other_icu:<12} EET      a later download
+  {names.upgrade:<11} {names.icu:<12} EET      system partition, upgraded""")
 
     device.directory(DOWNLOADS)
     story.install_system("system")
@@ -80,10 +79,10 @@ def tell(story: Story):
     device.choose_zone("Europe/Lisbon")
     story.install("update")
     story.scene("An update is activated", f"""The user has moved to Lisbon, and
-        {names.update} has been downloaded: Lisbon changes to CET as {year} begins. The
-        update is newer than {names.system} and its ICU data has the system's format, so
-        marlin-install announces it, and marlin links it. On 1 February noon UTC was to
-        be 12:00 in Lisbon; now it is 13:00.""")
+        {names.update} has been downloaded, in which Lisbon has CET. The update is newer
+        than {names.system} and its ICU data has the system's format, so marlin-install
+        announces it, and marlin links it. Noon UTC was 12:00 in Lisbon; now it is
+        13:00.""")
 
     story.scene("The same update again", f"""tz_latest still announces {names.update},
         which is in use by now. Equal is not newer, so marlin says so, as at every
@@ -91,8 +90,8 @@ def tell(story: Story):
 
     story.install("refused")
     story.download_and_announce("refused")
-    story.scene("An update that does not fit is refused", f"""{names.refused} puts
-        Lisbon's change off by a year. marlin-install does not take it, but somebody
+    story.scene("An update that does not fit is refused", f"""In
+        {names.refused} Lisbon has EET. marlin-install does not take it, but somebody
         has announced it by hand. It is newer, but its ICU data has the format
         {names.other_icu} and the system reads {names.icu}, so marlin refuses it and
         stays with {names.update}.""")
@@ -100,9 +99,8 @@ def tell(story: Story):
     story.install_system("upgrade")
     story.scene("A system upgrade overtakes the update", f"""The system partition
         has been upgraded and now holds {names.upgrade}, newer than the update in
-        use. So marlin goes back to the system partition, where Lisbon's change is
-        put off too. The refused update is still announced, and refused
-        again.""")
+        use. So marlin goes back to the system partition, where Lisbon has EET too.
+        The refused update is still announced, and refused again.""")
 
     device.link(ZONEINFO, "/nowhere")
     device.file(LOCALTIME, "damaged\n")
@@ -126,8 +124,8 @@ class Story:
     def __init__(self):
         self.device = Device()  # as it is to be at the next boot
         self.names = real_data.names()
-        self.year = self.names.year
-        self.noon = datetime.datetime(self.year, 2, 1, 12, tzinfo=datetime.timezone.utc)
+        self.noon = datetime.datetime(releases.YEAR, 2, 1, 12,
+                                      tzinfo=datetime.timezone.utc)
         self.scenes = 0
         self.facts = []  # as they were found
         self.told = {}  # by marlin-install, since the last boot

@@ -247,8 +247,7 @@ RULES_OF_THREE_ZONES = f"""# version {NAMES.update}
 R E 1981 ma - Mar lastSu 1u 1 S
 R E 1996 ma - Oct lastSu 1u 0 -
 Z Asia/Tokyo 9 - JST
-Z Europe/Lisbon 0 E WE%sT {NAMES.year}
-1 E CE%sT
+Z Europe/Lisbon 1 E CE%sT
 Z Europe/Paris 1 E CE%sT
 L Europe/Lisbon Portugal
 """
@@ -256,10 +255,11 @@ L Europe/Lisbon Portugal
 
 @pytest.mark.parametrize("release", [NAMES.update, NAMES.refused])
 def test_times_that_icu_tells(place, release):
-    """Lisbon changes a year earlier than in the rules, and nobody but ICU knows."""
+    """In the rules Lisbon changes at last, and nobody but ICU knows."""
     pytest.importorskip("icu")
     (place / "rules/tzdata.zi").write_text(
-        RULES_OF_THREE_ZONES.replace(f"sT {NAMES.year}", f"sT {NAMES.year + 1}")
+        RULES_OF_THREE_ZONES.replace(
+            "Lisbon 1 E CE%sT", f"Lisbon 1 E CE%sT {releases.YEAR + 1}\n0 E WE%sT")
         if release == NAMES.refused else RULES_OF_THREE_ZONES)
     done = ran([*make_update(place)[2:], "--json"])
     if release == NAMES.update:
@@ -316,6 +316,12 @@ def test_a_past_change(place):
     shutil.rmtree(facts["directory"])
     assert made(update(place, "--json", since="1899-01-01"))["changed"][:2] == [
         "Africa/Cairo", "Egypt"]
+
+
+def test_a_change_to_come(place):
+    edit("\n9 JP J%sT\n", f"\n9 JP J%sT {releases.YEAR + 3}\n10 - +10\n")(place)
+    assert made(update(place, "--json"))["changed"] == [
+        "Asia/Tokyo", *LISBON[:1], "Japan", *LISBON[1:]]
 
 
 def test_a_system_compiled_otherwise(place):
@@ -409,7 +415,7 @@ def other_release(place):
 
 
 def no_release_in_icu(place):
-    text = releases.icu_text(place / "icu", NAMES.update, None)
+    text = releases.icu_text(place / "icu", NAMES.update, "Lisbon")
     source = place / "zoneinfo64.txt"
     source.write_text(text.replace("TZVersion", "NoVersion"))
     releases.output("genrb", "-q", "-d", place / "icu", source)

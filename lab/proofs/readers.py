@@ -30,12 +30,9 @@ TABLE = DOCUMENT.partition("<!-- seen -->\n")[2].partition("<!-- end -->")[0]
 ROWS = [line.strip("| ").split(" | ") for line in TABLE.splitlines()[2:]]
 SECONDS = 10
 NAMES = releases.names()
-# Noon in UTC on the 1st of July, in the first and second year of a changed Lisbon.
-MOMENTS = [int(datetime.datetime(NAMES.year + later, 7, 1, 12,
-                                 tzinfo=datetime.timezone.utc).timestamp())
-           for later in (0, 1)]
-CLOCKS = {("13:00", "13:00"): "system", ("14:00", "14:00"): "update",
-          ("13:00", "14:00"): "upgrade", ("12:00", "12:00"): "UTC"}
+NOON = int(datetime.datetime(releases.YEAR, 7, 1, 12,
+                             tzinfo=datetime.timezone.utc).timestamp())
+CLOCKS = {"13:00": "system", "14:00": "update", "15:00": "upgrade", "12:00": "UTC"}
 PLACES = re.compile(r'"(/etc/localtime|/var/db/timezone/[^"]*|'
                     r'/usr/share/(?:zoneinfo|icu|marlin)[^"]*)"')
 ENVIRONMENT = {"PATH": "/usr/bin:/bin:/usr/sbin", "LC_ALL": "C.UTF-8",
@@ -113,23 +110,18 @@ def started(reader: Reader, *before: str) -> Iterator[subprocess.Popen]:
 def answer(reader: Reader, running: subprocess.Popen) -> str:
     """In words: the data from which a program takes its answers, and the zone that it
     takes for the device's if that is another."""
-    answers = []
-    for moment in MOMENTS:
-        with contextlib.suppress(BrokenPipeError):
-            running.stdin.write(reader.question(moment) + "\n")
-            running.stdin.flush()
-            if reader.runs_on:
-                answers.append(line_of(running))
-    if not reader.runs_on:
-        running.stdin.close()
-        answers = [line_of(running) for _ in MOMENTS]
-    if len(answers) < len(MOMENTS) or not all(answers):
+    with contextlib.suppress(BrokenPipeError):
+        running.stdin.write(reader.question(NOON) + "\n")
+        running.stdin.flush()
+        if not reader.runs_on:
+            running.stdin.close()
+    words = line_of(running).split()
+    if not words:
         return "fails"
-    words = [line.split() for line in answers]
-    by_clock = CLOCKS.get(tuple(clock for clock, *_ in words), "fails")
-    if len(words[0]) == 1:
+    by_clock = CLOCKS.get(words[0], "fails")
+    if len(words) == 1:
         return by_clock
-    zone, release = words[0][-2:]
+    zone, release = words[-2:]
     told = {NAMES.system: "system", NAMES.update: "update",
             NAMES.upgrade: "upgrade"}.get(release, "own")
     if zone != ZONE:
