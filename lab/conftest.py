@@ -130,15 +130,6 @@ def pytest_sessionfinish(session):
 
 @pytest.hookimpl(trylast=True)
 def pytest_terminal_summary(terminalreporter):
-    if TALLY.get("events"):
-        from lab.proofs.life import EVENTS
-        terminalreporter.line("\nEvents, and how often each kind came next, in the "
-                              "same order:")
-        for one in EVENTS:
-            followed = [TALLY.get(one + PAIR + other, 0) for other in EVENTS]
-            total = sum(followed) + TALLY.get(one + PAIR + "the end", 0)
-            terminalreporter.line(f"{one:17}{total:7}:" + "".join(
-                f"{number:4}" for number in followed))
     for title in never_seen():
         terminalreporter.line(f"FAILED: never seen: {title}")
     shown = {title: number for title, number in TALLY.items()

@@ -5,7 +5,6 @@ The system partition is read-only and holds the program; "/var" is a disk of its
 The console is a file, in which every line begins with the kernel's time.
 """
 
-import functools
 import os
 import re
 import shutil
@@ -20,7 +19,7 @@ from lab.carriers.boot import Booted, ending_of
 from lab.carriers.namespace import build_below
 from lab.words import lines
 from lab.words.device import Device, Node, decoded
-from lab.words.paths import ICUTZ, LOCALTIME, SYSTEM_ZONEINFO, TZ_LATEST, ZONEINFO
+from lab.words.paths import ICUTZ, LOCALTIME, TZ_LATEST, ZONEINFO
 from lab.words.seen import Entries
 
 GUEST = Path(__file__).parent / "guest"
@@ -71,29 +70,6 @@ def system_partition(device: Device) -> Node:
     system.file("/etc/passwd", "owner:x:1:1::/:/run/bin/sh\n")
     system.put("/usr/share", device.find("/usr/share"))
     return system.root
-
-
-@functools.cache
-def zones(name: str) -> dict[str, str]:
-    """Zone files, by path in a tree, with abbreviations that begin with a name."""
-    with tempfile.TemporaryDirectory() as tree:
-        image.run("zic", "-d", tree, "-", input=(
-            f"Zone America/Los_Angeles -8:00 - {name}L\n"
-            f"Zone Europe/Paris 1:00 - {name}P\n").encode())
-        return {zone: decoded(Path(tree, zone).read_bytes())
-                for zone in ("America/Los_Angeles", "Europe/Paris")}
-
-
-def compile_zones(device: Device):
-    """Has the zones of every tree tell, as their abbreviation, where they come from:
-    U24AP is Paris in an update to 2024a."""
-    for path, node in list(device.everything()):
-        tree, is_version, _ = path.rpartition("/+VERSION")
-        if is_version:
-            letter = "S" if tree == SYSTEM_ZONEINFO else "U"
-            name = f"{letter}{node.text[2:4]}{node.text[4:].strip().upper()}"
-            for zone, text in zones(name).items():
-                device.find(f"{tree}/{zone}").text = text
 
 
 def shown_links(device: Device) -> list[str]:
@@ -168,7 +144,6 @@ class Machine:
         """Makes both disks of a described device, with what is to stand in "/var"
         beside its own; the options are of mke2fs."""
         self.device = device
-        compile_zones(device)
         image.build(self.system, system_partition(device), 14, "-O", "^has_journal")
         self.built = image.digest(self.system)
         root = Node("dir", 0o755, entries={"db": device.find("/var/db"), **beside})
@@ -182,23 +157,18 @@ class Machine:
         return {**image.look(self.system, "/usr/share", "/usr/share"),
                 **image.look(var or self.var, "/db", "/var/db")}
 
-    def command(self, script="", options="", disk="", serial="mon:stdio") -> list[str]:
-        make_first_memory(self.memory, script)
-        return qemu.command(
-            qemu.ARM64, part("vmlinuz-*"), 256,
-            f"loglevel=5 printk.devkmsg=on {options}", "-initrd", str(self.memory),
-            "-blockdev", f"{plain('system', self.system)},read-only=on",
-            "-blockdev", disk or plain("var", self.var),
-            "-device", "virtio-blk-device,drive=var",
-            "-device", "virtio-blk-device,drive=system", serial=serial)
-
     def start(self, script="", options="", disk="", more=()) -> subprocess.Popen:
         """`script` is what the device does when it is up, in its shell's language;
         `options` are the kernel's, or var=OPTIONS of the mount; `disk` is the
         emulator's block device instead of the plain image, `more` are words for it."""
-        self.console.unlink(missing_ok=True)
-        command = self.command(script, options, disk, f"file:{self.console}")
-        return subprocess.Popen([*command, *more], stdin=subprocess.DEVNULL)
+        make_first_memory(self.memory, script)
+        return qemu.start(
+            qemu.ARM64, part("vmlinuz-*"), 256, self.console,
+            f"loglevel=5 printk.devkmsg=on {options}", "-initrd", self.memory,
+            "-blockdev", f"{plain('system', self.system)},read-only=on",
+            "-blockdev", disk or plain("var", self.var),
+            "-device", "virtio-blk-device,drive=var",
+            "-device", "virtio-blk-device,drive=system", *more)
 
     def boot(self, then: Callable[[], object] | None = None, script="", seconds=120,
              **how) -> Console:

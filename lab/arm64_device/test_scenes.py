@@ -20,7 +20,7 @@ from lab.words.paths import (ICUTZ, RECORD, SYSTEM_ZONEINFO, TIMEZONE, ZONEINFO,
                              update_path)
 from lab.words.seen import Seen
 
-UPDATE = "2024a.1.0"
+SYSTEM, UPDATE = "system", "2024a.1.0"
 FIRST_RECORD = "2023c.1.0_2024a.1.0"
 REFUSED = lines.NOT_NEWER % (UPDATE, UPDATE)
 NO_ZONEINFO = (lines.BAD_LINK % "", lines.INVALID_LINKS)
@@ -49,11 +49,11 @@ class Scene:
 
     def boot(self, *printed, ending="exit 0", reader=None, then=None, **how):
         """Boots, and compares. `printed` are texts, or pairs of a text and the error
-        number that ends the line. The reader's zone tells its data; without it nobody
-        looks through the links. `then` and `how` are those of Machine.boot."""
+        number that ends the line. `reader` is whose data the reader sees; without it
+        nobody looks through the links. `then` and `how` are those of Machine.boot."""
         machine, device = self.machine, self.machine.device
         before = machine.look()
-        shown = shown_links(device) + [f"reader sees zone {reader}"]
+        shown = shown_links(device) + [f"reader sees TZif {reader} Paris"]
         console = machine.boot(then=then, **how)
         self.boots += 1
         print(f"--- boot {self.boots}\n{console.text.rstrip()}")
@@ -81,23 +81,23 @@ def scene(machine, request):
 def test_disk_without_a_free_block(scene):
     """Links fit into their inodes; only the record finds no room."""
     device = scene.on(updated())
-    scene.boot(reader="S23CP", then=lambda: device.announce(UPDATE), script=NO_BLOCK)
+    scene.boot(reader=SYSTEM, then=lambda: device.announce(UPDATE), script=NO_BLOCK)
     activate(device)
     device.file(RECORD, "")
-    scene.boot(reader="U24AP", script=NO_FILLER)
-    scene.boot(REFUSED, reader="U24AP")
+    scene.boot(reader=UPDATE, script=NO_FILLER)
+    scene.boot(REFUSED, reader=UPDATE)
 
 
 def test_disk_without_a_free_inode(scene):
     device = scene.on(updated(), "-N", "64")
-    scene.boot(reader="S23CP", then=lambda: device.announce(UPDATE), script=NO_INODE)
+    scene.boot(reader=SYSTEM, then=lambda: device.announce(UPDATE), script=NO_INODE)
     # The old zoneinfo link's inode serves the new one; for icutz there is none.
     device.point_links_at(None)
     scene.boot((lines.CREATE_SYMLINK % (ICUTZ, update_path(UPDATE) + "/icutz"),
                 errno.ENOSPC), (lines.NO_DATA, errno.ENOSPC),
-               reader="S23CP", script=NO_FILLER)
+               reader=SYSTEM, script=NO_FILLER)
     activate(device)
-    scene.boot(reader="U24AP")
+    scene.boot(reader=UPDATE)
 
 
 def link_fails(target, remove, create):
@@ -108,14 +108,14 @@ def link_fails(target, remove, create):
 
 def test_read_only_disk(scene):
     device = scene.on(updated())
-    scene.boot(reader="S23CP", options="var=ro")
-    scene.boot(reader="S23CP", then=lambda: device.announce(UPDATE))
+    scene.boot(reader=SYSTEM, options="var=ro")
+    scene.boot(reader=SYSTEM, then=lambda: device.announce(UPDATE))
     read_only = errno.EROFS, errno.EEXIST
     scene.boot(*link_fails(update_path(UPDATE) + "/zoneinfo", *read_only),
                (lines.NO_DATA, errno.EEXIST), *link_fails(SYSTEM_ZONEINFO, *read_only),
-               ending="abort", reader="S23CP", options="var=ro")
+               ending="abort", reader=SYSTEM, options="var=ro")
     activate(device)
-    scene.boot(reader="U24AP")
+    scene.boot(reader=UPDATE)
 
 
 def test_disk_with_a_bad_sector(scene):
@@ -134,7 +134,7 @@ def test_disk_with_a_bad_sector(scene):
                *link_fails(SYSTEM_ZONEINFO, errno.EIO, errno.EIO),
                ending="abort", disk=bad, options="var=errors=continue")
     image.run("e2fsck", "-fp", var)
-    scene.boot(reader="U24AP")
+    scene.boot(reader=UPDATE)
 
 
 def test_disk_with_a_lost_link(scene):
@@ -153,4 +153,4 @@ def test_disk_with_a_lost_link(scene):
                ending="abort", options="var=errors=remount-ro")
     image.run("e2fsck", "-fy", var, accept=(1,))
     device.point_links_at(None)
-    scene.boot(*NO_ZONEINFO, reader="S23CP")
+    scene.boot(*NO_ZONEINFO, reader=SYSTEM)

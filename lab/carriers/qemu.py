@@ -103,12 +103,15 @@ def part(place: Path, pattern: str) -> Path:
     return path
 
 
-def command(processor: Processor, kernel: Path, megabytes: int, parameters: str,
-            *more: str, serial="mon:stdio") -> list[str]:
+def start(processor: Processor, kernel: Path, megabytes: int, console: Path,
+          parameters: str, *more: str | Path) -> subprocess.Popen:
     """`parameters` are the kernel's, `more` the words for disks and the like."""
-    return [*processor.qemu, "-accel", "tcg", "-m", str(megabytes), "-nodefaults",
-            "-no-reboot", "-display", "none", "-serial", serial, "-kernel", str(kernel),
-            "-append", f"console={processor.console} panic=-1 {parameters}", *more]
+    console.unlink(missing_ok=True)
+    return subprocess.Popen([
+        *processor.qemu, "-accel", "tcg", "-m", str(megabytes), "-nodefaults",
+        "-no-reboot", "-display", "none", "-serial", f"file:{console}", "-kernel",
+        kernel, "-append", f"console={processor.console} panic=-1 {parameters}", *more],
+        stdin=subprocess.DEVNULL)
 
 
 def text_of(console: Path) -> str:

@@ -9,7 +9,6 @@ import io
 import json
 import subprocess
 import tarfile
-import time
 from dataclasses import dataclass
 from pathlib import Path
 
@@ -24,7 +23,6 @@ STARTING = "7d4958e842da4a758f6c1cdc7b36dcc5"  # the journal's message of this k
 @dataclass
 class Seen:
     """One boot of a system."""
-    seconds: float
     files: dict[str, bytes]  # what the system tells, by name
     links: dict[str, str]  # below "/var/db", and of what owner
     owners: dict[str, tuple[int, int, int]]  # mode, user, group
@@ -68,8 +66,9 @@ class System:
 
     def __init__(self, name: str, script="", **how):
         self.directory = room(CHOSEN.place / "scenes" / name)
-        self.root, self.told, self.third = (
-            self.directory / name for name in ("system.img", "told.tar", "third.img"))
+        self.root, self.told, self.third, self.console = (
+            self.directory / name
+            for name in ("system.img", "told.tar", "third.img", "console"))
         make_image(self.root, script, third=self.third, **how)
 
     def replace(self, path: str, text: str):
@@ -79,17 +78,16 @@ class System:
         image.replay_journal(self.root)
         image.debugfs(self.root, f"rm {path}", f"write {file} {path}", write=True)
 
-    def command(self, options: str, more: tuple[str, ...]) -> list[str]:
+    def start(self, options: str, more: tuple[str, ...]) -> subprocess.Popen:
         disks = [self.root, self.told] + [self.third] * self.third.exists()
-        return qemu.command(
-            CHOSEN.processor, qemu.part(CHOSEN.place, "vmlinuz-*"), 1024,
+        return qemu.start(
+            CHOSEN.processor, qemu.part(CHOSEN.place, "vmlinuz-*"), 1024, self.console,
             "root=/dev/nvme0n1 loglevel=4 systemd.unit=lab.target no_timer_check "
             f"{'' if ' ro ' in f' {options} ' else 'rw '}{options}",
             "-device", "nvme,id=nvme,serial=lab",
             *(word for number, disk in enumerate(disks, 1) for word in (
                 "-drive", f"if=none,id=disk{number},format=raw,file={disk}",
-                "-device", f"nvme-ns,drive=disk{number},nsid={number}")), *more,
-            serial=f"file:{self.directory}/console")
+                "-device", f"nvme-ns,drive=disk{number},nsid={number}")), *more)
 
     def boot(self, then="", options="", more: tuple[str, ...] = (),
              seconds=SECONDS) -> Seen:
@@ -101,21 +99,15 @@ class System:
             archive.addfile(entry, io.BytesIO(then.encode()))
         with open(self.told, "r+b") as file:
             file.truncate(48 << 20)
-        console = self.directory / "console"
-        console.unlink(missing_ok=True)
-        started = time.monotonic()
-        emulator = subprocess.Popen(self.command(options, more),
-                                    stdin=subprocess.DEVNULL)
-        qemu.wait(emulator, console, "lab: all is told", seconds)
+        emulator = self.start(options, more)
+        qemu.wait(emulator, self.console, "lab: all is told", seconds)
         status = qemu.end(emulator, 10)
-        took = time.monotonic() - started
-        printed = qemu.text_of(console)
+        printed = qemu.text_of(self.console)
         try:
-            seen = Seen(took, *look(self.told), printed)
+            return Seen(*look(self.told), printed)
         except (KeyError, tarfile.TarError) as reason:
             raise RuntimeError(f"the system told nothing (status {status}; {reason}):\n"
                                + printed[-6000:]) from reason
-        return seen
 
 
 def look(told: Path):

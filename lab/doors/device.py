@@ -1,9 +1,7 @@
 # SPDX-License-Identifier: BSD-2-Clause
 """Builds the program for arm64 and boots it on an emulated device: a real kernel, a
-read-only system partition, an ext4 disk for "/var". Without an option it shows an
-update being announced at one boot and activated at the next: the console, what readers
-of time-zone data see, and the links. With --systems it boots whole Debian systems
-instead, with the package installed.
+read-only system partition, an ext4 disk for "/var". With --systems it boots whole
+Debian systems instead, with the package installed.
 
 What is needed is installed, as root, and a kernel is fetched into the folder "build".
 Exit status: 0 when all is as expected, otherwise 1; 2 for bad use; 77 when a device
@@ -22,9 +20,7 @@ from lab.words.places import PROJECT
 def main() -> int:
     parser = Options(prog="scripts/device", description=__doc__,
                      formatter_class=argparse.RawDescriptionHelpFormatter)
-    mode = parser.add_mutually_exclusive_group()
-    mode.add_argument("--shell", action="store_true", help="a prompt on the device, "
-                      'after the pass; "poweroff -f" ends it')
+    mode = parser.add_mutually_exclusive_group(required=True)
     mode.add_argument("--tests", nargs="*", metavar="TEST", help="every chosen device, "
                       "sequences of boots on one disk, some power cuts; or these tests")
     mode.add_argument("--power-cuts", type=number, metavar="N", help="cuts the "
@@ -47,7 +43,7 @@ def main() -> int:
     os.environ["MARLIN_SYSTEMS"] = options.on
     # After the options are understood: these take pytest.
     import pytest
-    from lab.arm64_device import parts, show
+    from lab.arm64_device import parts
     from lab.bench import boot_cost, unit_cost
     from lab.carriers.qemu import Unavailable
     from lab.debian_systems import parts as systems
@@ -67,14 +63,10 @@ def main() -> int:
             return pytest.main([*run, "loadfile",
                                 *(options.tests or ["lab/arm64_device",
                                                     "lab/proofs/cuts.py"])])
-        if options.shell:
-            return show.shell()
         if options.power_cuts:
             cuts.run(options.power_cuts, options.seed)
-        elif options.boot_cost:
-            boot_cost.measure()
         else:
-            show.show()
+            boot_cost.measure()
     except Unavailable as reason:
         print(f"SKIPPED: {reason}", file=sys.stderr)
         return 77
