@@ -33,7 +33,7 @@ from lab.oracles.sets import (fits, is_due, is_welcome, link, mixed, names_of, n
                               set_of, whole)
 from lab.oracles.trial import entry_differences, left, trial
 from lab.proofs.kills import killed
-from lab.words.device import Device
+from lab.words.device import Device, decoded
 from lab.words.paths import (DOWNLOADS, FORMER_ZONEINFO, ICUTZ, LEGACY_ICUTZ, LOCALTIME,
                              OLD_ICU, RECORD, SYSTEM_ICU, SYSTEM_ZONEINFO, TZ_LATEST,
                              ZONEINFO, update_path)
@@ -44,8 +44,8 @@ INCOMING = "/var/db/incoming/"
 RELEASES = "2022b", "2023c", "2024a", "2024b", "2025a"
 NEWEST = "2031a"  # is installed at the end of each life
 SCHEMAS = "44l", "45l"
-SIGNS = ("Europe/Paris", 1), ("America/Los_Angeles", -1)  # of offsets
-ZONES = "Europe/Paris", "America/Los_Angeles", "Mars/Base"
+EXISTING = "Europe/Paris", "America/Los_Angeles"
+ZONES = *EXISTING, "Mars/Base"
 PLACES = {"zoneinfo": ZONEINFO, "icutz": ICUTZ, "localtime": LOCALTIME,
           "tz_latest": TZ_LATEST, "record": RECORD, "legacy": LEGACY_ICUTZ,
           "tz": DOWNLOADS.rstrip("/")}
@@ -109,20 +109,13 @@ def update_name(release: str) -> str:
     return f"{release}.1.0"
 
 
-def offset(release: str) -> int:
-    """Of Paris from Greenwich, in seconds: other in every release's update."""
-    return 3600 * (1 + (*RELEASES, NEWEST).index(release))
-
-
-def zone(offset: int) -> str:
-    """A zone file with one type of local time, so many seconds from Greenwich."""
-    return (b"TZif" + bytes(16) + struct.pack(">6I", 0, 0, 0, 0, 1, 4)
-            + struct.pack(">iBB", offset, 0, 0) + b"LMT\0").decode("latin-1")
-
-
-OFFSETS = {zone(sign * (offset(release) + system)): sign * (offset(release) + system)
-           for release in (*RELEASES, NEWEST) for sign in (1, -1)
-           for system in (0, 1800)}
+def zone_files(place: str, release: str, whose: str) -> dict[str, str]:
+    """Each with one type of local time, whose name behind a head of 50 bytes tells what
+    it is."""
+    names = {zone: f"{whose}-{release}-{zone[:2]}" for zone in EXISTING}
+    return {f"{place}/{zone}": decoded(
+        b"TZif" + bytes(16) + struct.pack(">6I", 0, 0, 0, 0, 1, len(name) + 1)
+        + bytes(6) + name.encode() + b"\0") for zone, name in names.items()}
 
 
 def is_a_directory(entries: Entries, path: str) -> bool:
@@ -271,14 +264,12 @@ class Life:
         tree = link(entries, ZONEINFO)
         name = link(entries, LOCALTIME).removeprefix(ZONEINFO)
         here = entries.get(tree + name)
-        if not (here and here.text in OFFSETS and os.access(LOCALTIME, os.R_OK)):
+        wanted = here.text[50:-1] if here else ""
+        if not (wanted and os.access(LOCALTIME, os.R_OK)):
             return []
         self.count("clocks read")
-        told = subprocess.run(["/usr/bin/date", "+%:::z"], capture_output=True,
-                              text=True, env={"TZ": f":{LOCALTIME}"}).stdout.strip()
-        hours, minutes = divmod(abs(OFFSETS[here.text]) // 60, 60)
-        wanted = (f"{'-' if OFFSETS[here.text] < 0 else '+'}{hours:02}"
-                  + (f":{minutes:02}" if minutes else ""))
+        told = subprocess.run(["/usr/bin/date", "+%Z"], capture_output=True, text=True,
+                              env={"TZ": f":{LOCALTIME}"}).stdout.strip()
         return [f"date tells {told}, not {wanted}"] if told != wanted else []
 
     # --- The installer ---
@@ -416,9 +407,7 @@ class Life:
         name = update_name(release)
         source = INCOMING + (name.upper() if kind == "misnamed" else name)
         device = Device()
-        files = {f"zoneinfo/{name}": zone(sign * offset(release))
-                 for name, sign in SIGNS}
-        put_update(device, source, release, more=files,
+        put_update(device, source, release, more=zone_files("zoneinfo", release, "U"),
                    schema="45l" if kind == "schema" else "44l")
         paris = f"{source}/zoneinfo/Europe/Paris"
         sums = device.find(f"{source}/SHA256SUMS")
@@ -504,8 +493,8 @@ def install_system(release: str, schema: str):
     """The system partition of another release."""
     device = Device()
     device.file(f"{SYSTEM_ZONEINFO}/+VERSION", f"{release}\n")
-    for name, sign in SIGNS:
-        device.file(f"{SYSTEM_ZONEINFO}/{name}", zone(sign * (offset(release) + 1800)))
+    for path, text in zone_files(SYSTEM_ZONEINFO, release, "S").items():
+        device.file(path, text)
     device.file(f"{SYSTEM_ICU}/icutzformat.txt", f"{schema}\n")
     namespace.empty("/usr/share")
     namespace.build_below("/usr/share", device.find("/usr/share"), exists=True)
