@@ -19,7 +19,6 @@ import subprocess
 import tarfile
 import termios
 from pathlib import Path
-from urllib.parse import unquote
 
 import pytest
 
@@ -28,10 +27,10 @@ from lab.oracles.status import (PAGE, STATUS, Answer, ask, boot_differences,
                                 link_differences, reason_differences,
                                 status_differences, unescaped)
 from lab.oracles.trial import fail
+from lab.words.changes import change
 from lab.words.chosen_devices import CHOSEN
 from lab.words.device import Device, sound_device
-from lab.words.paths import (DOWNLOADS, ICUTZ, LEGACY_ICUTZ, LOCALTIME, OLD_ICU, PLACES,
-                             RECORD, SYSTEM_ICU, SYSTEM_ZONEINFO, TIMEZONE, TZ_LATEST,
+from lab.words.paths import (OLD_ICU, PLACES, RECORD, SYSTEM_ZONEINFO, TIMEZONE,
                              ZONEINFO, update_path)
 from lab.words.places import BUILD
 from lab.words.random_devices import compose
@@ -101,12 +100,6 @@ def test_random_devices(numbers, count):
 
 TREE = "/tmp/device"
 UPDATE = "2024a.1.0"
-# Words for the beginning of a path.
-WORDS = {"ZONEINFO": ZONEINFO, "ICUTZ": ICUTZ, "LOCALTIME": LOCALTIME,
-         "U": update_path(UPDATE),
-         "TZ_LATEST": TZ_LATEST, "RECORD": RECORD, "LEGACY_ICUTZ": LEGACY_ICUTZ,
-         "OLD_ICU": OLD_ICU, "TIMEZONE": TIMEZONE, "TZ": DOWNLOADS.rstrip("/"),
-         "SYSTEM": SYSTEM_ZONEINFO, "SYSTEM_ICU": SYSTEM_ICU}
 AS_ROOT = "/usr/bin/unshare --user --map-root-user --mount /bin/sh -euc".split()
 
 
@@ -147,25 +140,16 @@ class Tree(Device):
                                for number in range(int(count)))
 
 
-def word(text: str):
-    if re.fullmatch("0[0-7]{3}", text):
-        return int(text, 8)
-    text = re.sub("^[A-Z_]+(?=/|$)", lambda match: WORDS.get(match[0], match[0]), text)
-    return unquote(text, "latin-1")
-
-
 def unpack(story: str):
-    """Has a tree below TREE, changed by verbs of Tree with their arguments; there is
-    ";" between changes, and "%20" for a blank."""
+    """Has a tree below TREE, changed by verbs of Tree."""
     namespace.insist_on_private_device()
     tree = Tree()
-    for verb, *words in (change.split() for change in story.split(";") if change):
-        getattr(tree, verb)(*map(word, words))
+    change(tree, story)
     os.makedirs(TREE, exist_ok=True)
     namespace.empty(TREE)
     namespace.build_below(TREE, tree.root, exists=True)
-    for change in tree.afterwards:
-        change()
+    for finish in tree.afterwards:
+        finish()
 
 
 def fact(said, name: str):

@@ -11,19 +11,19 @@ from typing import NamedTuple
 import pytest
 
 from lab.carriers import boot, namespace
-from lab.words import chosen_devices as devices
 from lab.words import lines
+from lab.words.chosen_devices import NORMAL, made
 from lab.words.paths import (DEFAULT_LOCALTIME, DEFAULT_ZONE, ICUTZ, LEGACY_ICUTZ,
-                             LOCALTIME, RECORD, SYSTEM_ZONEINFO, TZ_LATEST, ZONEINFO,
-                             update_path)
+                             LOCALTIME, RECORD, SYSTEM_ZONEINFO, ZONEINFO, update_path)
 from lab.words.seen import as_device
 
 
 class Example(NamedTuple):
-    """A device whose boot is killed before the first call `killed`. After every later
-    boot the links and the record are these, beside those of a device as it is sold;
-    the first of the boots prints `first`, all others `later`."""
-    make: Callable
+    """A device, by how a sound one is changed, whose boot is killed before the first
+    call `killed`. After every later boot the links and the record are these, beside
+    those of a device as it is sold; the first of the boots prints `first`, all others
+    `later`."""
+    changes: str
     killed: tuple
     left: dict
     first: list = []
@@ -48,60 +48,54 @@ OLD_ICU, OLD_RECORD = update_path("2023d.1.0/icutz"), "2023c.1.0_2023d.1.0"
 STAYS = [[lines.NOT_NEWER % ("2024a.1.0", "2024a.1.0")]] * 2
 OLDER = [[lines.NOT_NEWER % ("2023b.1.0", "2023c.1.0")]] * 2
 
-
-def reset_for_the_schema():
-    device = devices.reset_for_the_schema_then_an_update()
-    device.drop(TZ_LATEST)
-    return device
-
-
 # Why each is open, and what stays: docs/decisions.md.
 WINDOWS = {
     "an update's zoneinfo without its ICU data": Window(
         ICUTZ, ("symlink", ZONEINFO), ("symlink", ICUTZ),
         lambda left, usual, _: usual is not None, [
-            Example(devices.first_activation, ("unlink", ICUTZ),
+            Example(NORMAL["first activation"], ("unlink", ICUTZ),
                     {ZONEINFO: TREE}, *STAYS),
-            Example(devices.activation_after_an_update, ("unlink", ICUTZ),
+            Example(NORMAL["activation after an update"], ("unlink", ICUTZ),
                     {ZONEINFO: TREE, ICUTZ: OLD_ICU, RECORD: OLD_RECORD}, *STAYS)]),
     "the system's zoneinfo with an update's ICU data": Window(
         ICUTZ, ("symlink", ZONEINFO), ("unlink", ICUTZ),
         lambda left, usual, _: left is not None and usual is None, [
-            Example(devices.system_overtakes_the_update, ("unlink", ICUTZ),
+            Example(NORMAL["system overtakes the update"], ("unlink", ICUTZ),
                     {ICUTZ: update_path("2023b.1.0/icutz"), LEGACY_ICUTZ: "/nowhere"}),
-            Example(reset_for_the_schema, ("unlink", ICUTZ), {ICUTZ: ICU})]),
+            Example(f"{NORMAL['reset for the schema then an update']}; drop TZ_LATEST",
+                    ("unlink", ICUTZ), {ICUTZ: ICU})]),
     "a legacy link that dangles is kept": Window(
         LEGACY_ICUTZ, ("symlink", ZONEINFO), ("unlink", LEGACY_ICUTZ),
         lambda left, usual, _: usual is None, [
-            Example(devices.system_overtakes_the_update, ("unlink", LEGACY_ICUTZ),
+            Example(NORMAL["system overtakes the update"], ("unlink", LEGACY_ICUTZ),
                     {LEGACY_ICUTZ: "/nowhere"})]),
     "an update older than the system's data is not activated": Window(
         RECORD, ("unlink", ZONEINFO), ("create", RECORD),
         lambda left, usual, calls: left is None and usual == "2023c.1.0_2023b.1.0"
         and calls.count(("symlink", ZONEINFO)) < 2, [
-            Example(devices.reset_then_an_update_older_than_the_system,
+            Example(NORMAL["reset then an update older than the system"],
                     ("unlink", ICUTZ), {ICUTZ: update_path("2023a.1.0/icutz")},
                     *OLDER)]),
     "an activation without a record": Window(
         RECORD, ("symlink", ZONEINFO), ("create", RECORD),
         lambda left, usual, _: left is None or left.endswith("_2023d.1.0"), [
-            Example(devices.activation_after_an_update, ("create", RECORD),
+            Example(NORMAL["activation after an update"], ("create", RECORD),
                     {ZONEINFO: TREE, ICUTZ: ICU, RECORD: OLD_RECORD}, *STAYS)]),
     "an empty record": Window(
         RECORD, ("create", RECORD), ("write", None), lambda left, usual, _: left == "",
-        [Example(devices.activation_after_an_update, ("write", None),
+        [Example(NORMAL["activation after an update"], ("write", None),
                  {ZONEINFO: TREE, ICUTZ: ICU, RECORD: ""}, *STAYS)]),
     "a record that starts from the system's release": Window(
         RECORD, ("unlink", ZONEINFO), ("symlink", ZONEINFO),
         lambda left, usual, _: left is not None and left.startswith("2023c.1.0_") and
         not usual.startswith("2023c"), [
-            Example(devices.activation_after_an_update, ("symlink", ZONEINFO),
+            Example(NORMAL["activation after an update"], ("symlink", ZONEINFO),
                     {ZONEINFO: TREE, ICUTZ: ICU, RECORD: "2023c.1.0_2024a.1.0"},
                     [lines.BAD_LINK % "", lines.INVALID_LINKS], STAYS[0])]),
     "a corrected localtime becomes the default": Window(
         LOCALTIME, ("unlink", LOCALTIME), ("symlink", LOCALTIME),
         lambda left, usual, _: left == DEFAULT_LOCALTIME, [
-            Example(devices.localtime_corrected, ("symlink", LOCALTIME),
+            Example(NORMAL["localtime corrected"], ("symlink", LOCALTIME),
                     {LOCALTIME: DEFAULT_LOCALTIME},
                     [lines.LOCALTIME_INVALID % DEFAULT_ZONE])]),
 }
@@ -124,11 +118,11 @@ def window_of(path, left, usual, carried_out) -> str | None:
     for number, example in enumerate(window.examples, start=1)])
 def test_an_example_of_a_window(example):
     """It ends with the next activation; but what the zone was nobody knows."""
-    namespace.build(example.make())
+    namespace.build(made(example.changes))
     boot.traced()
     call = next(call for call in boot.pass_of(list(boot.calls()))
                 if (call.name, call.path) == example.killed)
-    namespace.build(example.make())
+    namespace.build(made(example.changes))
     assert boot.traced(*boot.killing(call.call, call.number)).ending == "killed"
     for printed in (example.first, example.later, example.later):
         booted = boot.boot()
