@@ -5,15 +5,18 @@ checked, compiled and packed, and only a whole result gets its name."""
 from __future__ import annotations
 
 import argparse
+import bz2
 import collections
 import contextlib
 import datetime
 import errno
 import fcntl
+import gzip
 import hashlib
 import importlib
 import io
 import json
+import lzma
 import os
 import re
 import resource
@@ -30,8 +33,10 @@ from pathlib import Path
 from typing import NamedTuple
 
 NAME = Path(sys.argv[0]).name
-RESOURCES = ("metaZones.res", "timezoneTypes.res", "windowsZones.res",
-             "zoneinfo64.res")
+COMPRESSIONS = {b"BZh": bz2, b"\x1f\x8b": gzip, b"\xfd7zXZ": lzma}  # by first bytes
+# By name a table that is in it.
+RESOURCES = {"metaZones.res": "metazoneInfo", "timezoneTypes.res": "typeMap",
+             "windowsZones.res": "mapTimezones", "zoneinfo64.res": "Zones"}
 SOURCES = ("africa", "antarctica", "asia", "australasia", "europe", "northamerica",
            "southamerica", "etcetera", "factory", "backward")
 # Not compiled, but readers look for them in the tree.
@@ -123,7 +128,8 @@ def need(*tools: str):
 
 
 def output(*command, folder: Path, remedy: str, **environment: str) -> str:
-    """What a tool prints. One that fails is a refusal that quotes its first line."""
+    """What a tool prints. One that fails is a refusal that quotes its first line,
+    except warnings."""
     name = Path(command[0]).name
     with (tempfile.TemporaryFile("w+", errors="replace") as printed,
           tempfile.TemporaryFile("w+", errors="replace") as errors):
@@ -140,9 +146,10 @@ def output(*command, folder: Path, remedy: str, **environment: str) -> str:
                           "limit of memory, time or size; nothing was made")
         if status:
             errors.seek(0)
-            line = errors.read(1000).strip() or f"it ended with status {status}"
-            line = line.splitlines()[0].removeprefix(f"{name}: ")
-            if line.endswith(MACHINE):
+            said = errors.read(10000).strip() or f"it ended with status {status}"
+            line = next((line for line in said.splitlines() if "warning: " not in line),
+                        said.splitlines()[0]).removeprefix(f"{name}: ")
+            if line.endswith(MACHINE) or "unable to write" in line or status == 127:
                 remedy = "nothing was made"
             raise Refused(f"{name}: {line}; {remedy}")
         printed.seek(0)
@@ -238,27 +245,29 @@ def rules_from(path: Path) -> Rules:
 def unpacked(path: Path, wanted: tuple[str, ...]) -> dict[str, bytes]:
     """Files of an archive, by name, whether or not they stand in a directory. Nothing
     else in it is looked at, and nothing is written."""
-    files, packed = {}, io.BytesIO(read(path))
+    files, raw = {}, read(path)
+    too_large = Refused(f"{path} is far too large when it is unpacked; "
+                        "name an archive of a release")
     try:
-        with tarfile.open(fileobj=packed) as archive:
+        for magic, library in COMPRESSIONS.items():
+            if raw.startswith(magic):
+                # To its end, where a checksum may stand.
+                raw = library.open(io.BytesIO(raw)).read(4 * LARGEST + 1)
+                break
+        if len(raw) > 4 * LARGEST:
+            raise too_large
+        # Not by tarfile, which reads what a header promises.
+        with tarfile.open(fileobj=io.BytesIO(raw), mode="r:") as archive:
             for member in archive:
                 name = member.name.rpartition("/")[2]
-                if member.size > LARGEST or archive.offset > 16 * LARGEST:
-                    raise Refused(f"{path} is far too large when it is unpacked; "
-                                  "name an archive of a release")
+                if member.size > LARGEST:
+                    raise too_large
                 if name not in wanted or not member.isreg():
                     continue
                 if name in files:
                     raise Refused(f"{path} holds {name} twice; "
                                   "name an archive of a release")
                 files[name] = archive.extractfile(member).read()
-            # To the end, where a checksum may stand; or to the one that is no end.
-            rest = 0
-            while got := len(archive.fileobj.read(1 << 16)):
-                rest += got
-                if rest > LARGEST:
-                    raise Refused(f"{path} is far too large when it is unpacked; "
-                                  "name an archive of a release")
     except Refused:
         raise
     except Exception as failed:  # of any library of compression
@@ -314,6 +323,8 @@ def release_in(folder: Path, files: dict[str, bytes], letter: str) -> str:
             remedy = f"{folder / name} is damaged: fetch it again"
             text = output("derb", "-c", "-s", work, name, folder=Path(work),
                           remedy=remedy)
+            if not re.search(f"^    {RESOURCES[name]}[:{{ ]", text, re.MULTILINE):
+                raise Refused(f"{folder / name} is another of the four; fetch it again")
         found = re.search(r'^    TZVersion *\{ *"([^"\n]*)" *\}', text, re.MULTILINE)
     if not found:
         raise Refused(f"{folder}/zoneinfo64.res has no TZVersion; fetch it again")
@@ -348,13 +359,13 @@ def new(place: Path) -> Iterator[Path]:
     is left of it."""
     if not place.parent.is_dir():
         raise Refused(f"{place.parent} is not a directory; make it first")
-    if os.path.lexists(place):
-        raise Refused(f"{place} is there already; remove it, or choose another")
     # Tools are run elsewhere and therefore get absolute paths.
-    begun = place.parent.absolute() / f".{place.name}.new"
+    begun = place.parent.absolute() / f".{NAME}.new"
     lock = os.open(begun.parent, os.O_RDONLY)
     try:
         fcntl.flock(lock, fcntl.LOCK_EX)
+        if os.path.lexists(place):
+            raise Refused(f"{place} is there already; remove it, or choose another")
         # Nobody is at it any more.
         shutil.rmtree(begun, ignore_errors=True)
         begun.mkdir(0o700)
@@ -385,7 +396,8 @@ def settle(root: Path):
 
 def refuse_foreign_files(tree: Path):
     """zic gives a link in the rules a target anywhere on this machine, as one more name
-    of that file. Such a file has more names than there are here."""
+    of that file, or a copy. Such a file has more names than there are here, or is not
+    a zone."""
     names = collections.Counter()
     found = {}
     for path in tree.rglob("*"):
@@ -394,9 +406,14 @@ def refuse_foreign_files(tree: Path):
             names[status.st_dev, status.st_ino] += 1
             found[path] = status
     for path, status in sorted(found.items()):
-        if names[status.st_dev, status.st_ino] != status.st_nlink:
+        own = names[status.st_dev, status.st_ino] == status.st_nlink
+        if not own or stat.S_ISREG(status.st_mode) and not is_zone(read(path)):
             raise Refused(f"the rules have a link to a file outside, "
                           f"'{path.relative_to(tree)}'; correct them")
+
+
+def is_zone(content: bytes) -> bool:
+    return content.startswith(b"TZif")
 
 
 def make_tree(rules: Rules, tree: Path):
@@ -465,7 +482,7 @@ def zones_in(tree: Path) -> dict[str, bytes]:
             path = Path(folder, name)
             if path.is_file() and path.stat().st_size <= LARGEST:
                 content = path.read_bytes()
-                if content.startswith(b"TZif"):
+                if is_zone(content):
                     zones[str(inside / name)] = content
     return zones
 

@@ -478,6 +478,9 @@ REFUSALS = [
      with_link_to(lambda secret: secret.touch(0o600))),
     ("'Evil'; correct them",
      with_link_to(lambda secret: secret.symlink_to("/etc/passwd"))),
+    # As where a file cannot have two names.
+    ("a link to a file outside, 'Evil'",
+     fake(zic='/usr/sbin/zic "$@" && echo secret >"$4/Evil"')),
     ("Alias", append("L Missing/Zone Alias\n")),
     ("holds neither", instead("rules/tzdata.zi", os.mkfifo)),
     ("more than 16777216", instead("rules/tzdata.zi", sparse)),
@@ -485,6 +488,8 @@ REFUSALS = [
     ("No such file", lambda place: (place / BIG).unlink()),
     ("is not an ICU", write(BIG, b"zoneinfo64{}\n" * 9)),
     ("is damaged", lambda place: os.truncate(place / BIG, 5000)),
+    ("metaZones.res is another of the four", lambda place: shutil.copy(
+        place / "icu/timezoneTypes.res", place / "icu/metaZones.res")),
     ("is not a regular file", instead(BIG, os.mkfifo)),
     ("more than 16777216", instead(BIG, sparse)),
     ("Too many", instead(BIG, lambda path: path.symlink_to(path))),
@@ -497,7 +502,8 @@ REFUSALS = [
     # Small, and much too large when they are read.
     ("far too large", archive(("README", bytes(17 << 20)))),
     ("far too large", archive(*[("README", bytes(10 << 20))] * 30)),
-    ("far too large", archive(damage=lambda raw: raw + gzip.compress(bytes(40 << 20)))),
+    ("far too large", archive(damage=lambda raw: raw + gzip.compress(bytes(70 << 20)))),
+    ("far too large", archive(("x", bytes(70 << 20), tarfile.GNUTYPE_LONGNAME))),
     (UNREADABLE, archive(damage=lambda raw: raw[:2000])),
     (UNREADABLE, archive(damage=lambda raw: os.urandom(5000))),
     # The checksum stands behind all that is read.
@@ -605,7 +611,7 @@ def test_random_damage(place, seed):
 
 
 def test_what_a_killed_one_left(place):
-    left = place / f"out/.{VERSION}.new/zoneinfo"
+    left = place / "out/.make-update.new/zoneinfo"
     left.mkdir(parents=True)
     made(update(place, "--json"))
     assert os.listdir(place / "out") == [VERSION]

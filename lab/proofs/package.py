@@ -117,7 +117,7 @@ def built(tree: Path, preset: str, umask=-1, **environment) -> Path:
     """The package, built in a copy of this tree."""
     run("bash", "-euo", "pipefail", "-c", """
         (cd "$2" && git ls-files -z | tar -c --null -T -) | tar -x --no-same-permissions
-        cmake --preset "$1"
+        cmake --preset "$1" -DMARLIN_WERROR=ON
         cmake --build --preset "$1"
         cpack --config "build/$1/CPackConfig.cmake" -B "build/$1"
         """, "-", preset, PROJECT, cwd=fresh(tree), umask=umask,

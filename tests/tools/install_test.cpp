@@ -24,7 +24,7 @@ const std::string source = "/var/db/incoming/" + version;
 const std::string paris = source + "/zoneinfo/Europe/Paris";
 const std::string icu = source + "/icutz/icutz44l.dat";
 
-// As docs/integration.md has it for updates that another tool made.
+// As make-update writes it.
 void seal(const std::string& place = source) {
   EXPECT_EQ(run({"/usr/bin/sh", "-c",
                  "cd \"$0\" && find icutz zoneinfo -type f -print0 | LC_ALL=C "
@@ -258,6 +258,19 @@ TEST_F(Installer, PutsBackASetThatIsNotWhole) {
   expect_links_at_update("2024c.1.0");
 }
 
+// Perhaps it is whole, and no set ever changes.
+TEST_F(Installer, ReplacesOnlyByForceWhatCannotBeRead) {
+  EXPECT_EQ(install().exit_status, 0);
+  set_mode(update(version), 0);
+  const std::string why =
+      "a set of this version is in use or announced, and cannot be checked, so "
+      "that only --force replaces it: cannot open "
+      "/var/db/timezone/tz/2024b.1.0: Permission denied";
+  expect_refused(why);
+  expect_end(0, "", {"--force", source});
+  expect_end(0, "", {"--audit"});
+}
+
 TEST_F(Installer, TakesAnUpdateBesideASystemWithoutAVersion) {
   make_file(system_tree + "/+VERSION", "\n");
   EXPECT_EQ(install().log, "");
@@ -408,6 +421,7 @@ TEST_F(Installer, RefusesWhatNoSetCanHave) {
        {".\\x0a does not belong in an update", file(".\n")},
        {"zoneinfo/a\\x0ab has a name that no zone has", file("zoneinfo/a\nb")},
        {"zoneinfo/a b has a name that no zone has", file("zoneinfo/a b")},
+       {"zoneinfo/empty has no file", [] { make_directory(zones + "/empty"); }},
        {"icutz/below is a directory",
         [] { make_directory(source + "/icutz/below"); }},
        {"zoneinfo/a/b/c/d/e/f/g/h is deeper than a zone can be",
@@ -435,9 +449,11 @@ TEST_F(Installer, RefusesWhatIsNotAsItsManifestHasIt) {
   expect_each_refused(
       {{"zoneinfo/Europe/Paris is not as SHA256SUMS has it",
         file("zoneinfo/Europe/Paris", "TZif, East")},
-       {lacks_paris, gone("zoneinfo/Europe/Paris")},
+       {lacks_paris, gone("zoneinfo/Europe")},
        {lacks_paris,
-        [] { ::rename(paris.c_str(), (zones + "/Zulu").c_str()); }},
+        [] {
+          ::rename((zones + "/Europe").c_str(), (zones + "/Zulu").c_str());
+        }},
        {lacks_paris,
         file("SHA256SUMS", whole + whole.substr(whole.size() - 88))},
        {"zoneinfo/Europe/Nice is not in SHA256SUMS",
@@ -583,6 +599,8 @@ TEST_F(Installer, AuditsWithoutAChange) {
   EXPECT_EQ(install().exit_status, 0);
   EXPECT_EQ(told_by({"--audit"}), "2024b.1.0: whole; in use or announced\n");
   install_update("2023d.1.0", "44l");
+  make_directory(update("2023c.1.0"), 0);
+  make_link(update("2023f.1.0"), "2023f.1.0");
   make_file(update("2023e.1.0") + "/SHA256SUMS");
   make_file(update("2023e.1.0") + "/zoneinfo/a");
   make_file(update(version) + "/zoneinfo/Europe/Paris", "TZ");
@@ -591,8 +609,11 @@ TEST_F(Installer, AuditsWithoutAChange) {
     EXPECT_EQ(install({"--audit"}).exit_status, 1);
     EXPECT_EQ(told_by({"--audit"}),
               "2023\"c: lost; in use or announced\n"
+              "2023c.1.0: unreadable, cannot open "
+              "/var/db/timezone/tz/2023c.1.0: Permission denied\n"
               "2023d.1.0: without a manifest\n"
               "2023e.1.0: damaged, icutz is missing, not a directory\n"
+              "2023f.1.0: damaged, it is not a directory\n"
               "2024b.1.0: damaged, zoneinfo/Europe/Paris is not as SHA256SUMS "
               "has it; in use or announced\n");
     EXPECT_THAT(

@@ -48,7 +48,14 @@ bool check_version(const std::string& name, bool any_age) {
   if (!version) refuse("its name is not a version such as 2024a.1.0");
   const std::string announced = announced_set(), in_use = set_in_use();
   const bool needed = needed_sets().contains(name);
-  const bool broken = needed && condition_of(name).is != condition::whole;
+  const verdict found =
+      needed ? condition_of(name) : verdict{condition::whole, {}};
+  if (found.is == condition::unreadable && !any_age)
+    refuse(
+        "a set of this version is in use or announced, and cannot be checked, "
+        "so that only --force replaces it: " +
+        found.why);
+  const bool broken = found.is != condition::whole;
   if (!any_age && !(broken && name == in_use)) {
     check_newer(*version, system_version(), "the system's");
     // What the next boot will refuse is no reason to stay with it.

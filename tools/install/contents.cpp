@@ -106,9 +106,13 @@ class walk {
       set_mode(open_directory(copy_, path, shown(path)).number(), 0755,
                shown(path));
     }
+    const auto files = files_.size();
     for (const auto& name :
          names_in(directory.number(), limits::entries + 1, path))
       entry(directory.number(), name, path + "/" + name, depth);
+    // The manifest does not list it.
+    if (depth > 1 && files_.size() == files)
+      refuse(escaped(path) + " has no file");
   }
 
   void entry(int parent, const std::string& name, const std::string& path,
@@ -224,18 +228,20 @@ void check_manifest(int set, const file_names& files) {
 
 verdict condition_of(const std::string& set) {
   const std::string path = paths::download_root + set;
-  const descriptor opened(
-      ::open(path.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
-  if (opened.number() < 0 && errno == ENOENT) return {condition::lost, {}};
-  if (opened.number() < 0 && errno == ENOTDIR)
-    return {condition::damaged, "it is not a directory"};
-  if (opened.number() < 0) fail("open", path);
-  if (status_of(opened.number(), manifest_name, path).st_mode == 0)
-    return {condition::unlisted, {}};
   try {
+    const descriptor opened(
+        ::open(path.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+    if (opened.number() < 0 && errno == ENOENT) return {condition::lost, {}};
+    if (opened.number() < 0 && (errno == ENOTDIR || errno == ELOOP))
+      refuse("it is not a directory");
+    if (opened.number() < 0) fail("open", path);
+    if (status_of(opened.number(), manifest_name, path).st_mode == 0)
+      return {condition::unlisted, {}};
     check_manifest(opened.number(), files_in(opened.number()));
     return {condition::whole, {}};
   } catch (const refusal& told) {
     return {condition::damaged, told.line};
+  } catch (const failure& told) {
+    return {condition::unreadable, told.line};
   }
 }

@@ -39,8 +39,9 @@ file_names files_in(int set, int copy = -1, const std::string& where = {});
 // sha256sum(1) prints of these files, which it reads.
 void check_manifest(int set, const file_names& files);
 
-// Whether a set on the device is whole. `why` is for a damaged one.
-enum class condition { whole, damaged, unlisted, lost };
+// Whether a set on the device is whole. `why` is for one that is damaged, or
+// that a failed call keeps from being looked at.
+enum class condition { whole, damaged, unlisted, lost, unreadable };
 struct verdict {
   condition is;
   std::string why;

@@ -68,6 +68,13 @@ void lock(int directory) {
 
 }  // namespace
 
+descriptor open_sets() {
+  descriptor opened = open_place(paths::download_root);
+  if (::geteuid() == 0)
+    refuse_others(opened.number(), paths::download_root, false);
+  return opened;
+}
+
 downloads::downloads()
     : links_(open_place(paths::timezone_directory)),
       sets_(open_place(paths::download_root)) {
@@ -157,6 +164,7 @@ void downloads::prune(
     const std::function<void(const std::string&, const removed*)>& tell) {
   if (leftovers_.files != 0) tell("what an earlier one left", &leftovers_);
   const std::set<std::string> needed = needed_sets();
+  std::string foreign;
   const listing sets = open_listing(sets_.number(), paths::download_root);
   while (const char* const found =
              next_name(sets.get(), paths::download_root)) {
@@ -169,13 +177,19 @@ void downloads::prune(
       tell(name, nullptr);
       continue;
     }
-    insist_on_own(name);
+    try {
+      insist_on_own(name);
+    } catch (const refusal&) {
+      foreign = name;
+      continue;
+    }
     // A stop in the middle leaves no half of a set.
     rename_entry(sets_.number(), name, hidden, path_of(name));
     const removed gone = remove_entry(sets_.number(), hidden, path_of(name));
     tell(name, &gone);
   }
   sync(sets_.number(), paths::download_root);
+  if (!foreign.empty()) insist_on_own(foreign);
 }
 
 bool downloads::take_back() noexcept {

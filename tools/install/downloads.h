@@ -11,6 +11,10 @@
 #include "tools/descriptor.h"
 #include "tools/install/removal.h"
 
+// Opens the directory of the sets to look at them. As root refuses one in which
+// another account could exchange a file for what never ends.
+descriptor open_sets();
+
 class downloads {
  public:
   // Opens both directories, refuses those in which another account could
@@ -39,7 +43,8 @@ class downloads {
 
   // Deletes every set that nothing needs, and what an earlier one had left, and
   // tells of each. A set that a later boot could take is kept, with nothing
-  // removed, except by `force`. Stops at one that belongs to another account.
+  // removed, except by `force`. Throws `refusal` at the end for one that
+  // belongs to another account.
   void prune(bool force, const std::function<void(const std::string& name,
                                                   const removed* gone)>& tell);
 

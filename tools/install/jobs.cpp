@@ -50,6 +50,8 @@ const char* word_for(condition is) {
       return "damaged";
     case condition::unlisted:
       return "without a manifest";
+    case condition::unreadable:
+      return "unreadable";
     case condition::lost:
       break;
   }
@@ -105,8 +107,8 @@ int install(const options& wanted) {
     rethrow(told, name,
             place.take_back()
                 ? "; nothing was changed"
-                : "; something is left in /var/db/timezone/tz/, which the next "
-                  "run deletes");
+                : "; something of marlin-install's is left below "
+                  "/var/db/timezone/, which the next run tries to delete");
   } catch (...) {
     place.take_back();
     throw;
@@ -142,8 +144,7 @@ std::string quoted(const std::string& text) {
 int audit(bool json) {
   std::set<std::string> sets = needed_sets();
   const std::set<std::string> needed = sets;
-  const descriptor place =
-      open_directory(AT_FDCWD, paths::download_root, paths::download_root);
+  const descriptor place = open_sets();
   const listing entries = open_listing(place.number(), paths::download_root);
   while (const char* const name =
              next_name(entries.get(), paths::download_root)) {
@@ -187,8 +188,14 @@ void settle(downloads place) {
     std::puts("nothing to settle");
     return;
   }
-  // The announcement goes last: if this is stopped, the next one goes on.
-  place.prune(false, tell_of_removal);
+  // The announcement goes last: if this is stopped, the next one goes on. But
+  // what belongs to another account stays for ever.
+  try {
+    place.prune(false, tell_of_removal);
+  } catch (const refusal&) {
+    place.withdraw();
+    throw;
+  }
   place.withdraw();
   std::printf("%s is in use and no longer announced\n", set.c_str());
 }

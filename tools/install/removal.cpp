@@ -36,8 +36,9 @@ class removal {
   descriptor open_owned(int parent, const std::string& name) const {
     // A directory that its own owner may not read: its mode has to be changed
     // by name. Root reads any directory, so that no link can lead it elsewhere.
-    if (::faccessat(parent, name.c_str(), R_OK, 0) != 0)
-      static_cast<void>(::fchmodat(parent, name.c_str(), 0700, 0));
+    if (::faccessat(parent, name.c_str(), R_OK, 0) != 0 &&
+        ::fchmodat(parent, name.c_str(), 0700, 0) != 0)
+      fail("remove", path_);
     descriptor directory = open_directory(parent, name, path_);
     if (::fchmod(directory.number(), 0700) != 0) fail("remove", path_);
     return directory;
