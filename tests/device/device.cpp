@@ -152,7 +152,7 @@ void make_file(const std::string& path, const std::string& content,
 void make_fifo(const std::string& path) {
   make_room_for(path);
   must(::mkfifo(path.c_str(), 0644) == 0, "make the FIFO " + path);
-  ::alarm(30);
+  ::alarm(240);
 }
 
 void make_socket(const std::string& path) {
