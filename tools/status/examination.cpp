@@ -1,4 +1,5 @@
 // SPDX-License-Identifier: BSD-2-Clause
+#include <sys/xattr.h>
 #include <unistd.h>
 
 #include <new>
@@ -14,15 +15,14 @@ namespace {
 // How an owner appears whom this user namespace does not have.
 constexpr uid_t nobody = 65534;
 
+constexpr char links_directory[] = "/var/db/timezone";
+
 std::vector<std::string> unknown(const report& told, bool is_running_system) {
   std::vector<std::string> texts;
-  const auto has_several = [](const std::optional<dataset_facts>& set) {
-    return set && set->has_several_schemas;
-  };
-  if (!is_running_system &&
-      (has_several(told.device.current) || has_several(told.device.update)))
-    texts.emplace_back(
-        "which ICU data file comes first on the device's own file system");
+  for (const auto* set : {&told.device.current, &told.device.update})
+    if (!is_running_system && *set && (*set)->has_several_schemas)
+      texts = {
+          "which ICU data file comes first on the device's own file system"};
   if (!(told.after == told.device.links))
     texts.emplace_back("whether there is space for the links");
   if (!is_running_system)
@@ -30,21 +30,12 @@ std::vector<std::string> unknown(const report& told, bool is_running_system) {
   return texts;
 }
 
-// A word that is cut costs one refusal, and an update's decides nothing.
-void insist_on_enough_memory(const report& told) {
-  unsigned expected = 0;
-  for (const auto* set : {&told.device.current, &told.device.update})
-    if (*set && !(*set)->path.empty() && (*set)->word_is_cut) ++expected;
-  if (told.device.system.word_is_cut || told.boot.refusals > expected)
-    throw std::bad_alloc();
-}
-
 // In a user namespace this user is the device's root only as far as the device
 // is this user's. What is sound for somebody with the rights of everybody is
 // sound.
 void insist_on_rights(const report& told, place& here) {
   std::vector<std::string> parts = {
-      "/var/db/timezone", paths::system_zoneinfo,
+      links_directory, paths::system_zoneinfo,
       std::string(paths::system_zoneinfo) + "/+VERSION", paths::system_icu,
       std::string(paths::system_icu) + "/icutzformat.txt"};
   const std::string& zone = told.device.links.localtime.text;
@@ -57,7 +48,15 @@ void insist_on_rights(const report& told, place& here) {
   // The boot's user may be any of the three.
   constexpr mode_t open_to_all = 0555;
   bool has_closed_part = false;
-  std::string foreign = here.foreign_part;
+  std::string foreign;
+  for (const char* path :
+       {"/", "/var/db", links_directory, paths::version_record}) {
+    const sight::place& part = here.seen.follow(path).end;
+    if (foreign.empty() && part.error == 0 &&
+        (part.owner != 0 || part.group != 0 ||
+         ::getxattr(path, "system.posix_acl_access", nullptr, 0) > 0))
+      foreign = path;
+  }
   for (const auto& part : parts)
     if (const auto owner =
             here.seen.follow(part, open_to_all, open_to_all & 0444).closed) {
@@ -87,13 +86,14 @@ report examine(const std::string& root) {
   limit_memory();
   report told;
   told.device = read_device(here.seen);
-  // Whether its owner may write there is insisted on below.
-  told.device.links.is_writable |= here.has_foreign_links;
   told.boot = rehearse_boot();
   told.after = read_links();
-  insist_on_enough_memory(told);
-  told.after.is_writable |= here.has_foreign_links;
-  told.why = explain(told.device, told.boot, told.after);
+  // The boot is refused what was refused before, and no more.
+  if (refusals() > 2 * told.device.refusals) throw std::bad_alloc();
+  // Whether another's owner may write there is insisted on below.
+  if (!here.has_all_users && here.seen.follow(links_directory).end.owner != 0)
+    told.boot.may_change_links = true;
+  told.why = explain(told);
   if (!here.has_all_users) insist_on_rights(told, here);
   told.cannot_know = unknown(told, here.is_running_system);
   told.is_mended_by_a_removal = is_mended_by_a_removal(told);

@@ -36,16 +36,16 @@ constexpr std::string_view walk_failed =
     "tz_icu::initialize: fts_open of %s failed, %s";
 }  // namespace lines
 
-constexpr char behind_a_changed_link[] =
+// Only a reset makes this link; an activation makes others.
+constexpr char of_a_reset[] =
+    "marlin: create_symlink: from /var/db/timezone/zoneinfo to "
+    "/usr/share/zoneinfo.default: ";
+
+const std::string behind_a_changed_link =
     " is reached through a link that the boot has just changed";
 
 using enum verdict;
 using kind = entry::kind;
-
-std::string schema_of(const dataset_facts& set) {
-  return set.schema.empty() ? "no ICU schema"
-                            : "ICU schema " + escaped(set.schema);
-}
 
 bool is_too_large(const dataset_facts& set) {
   return set.ends == dataset_facts::state::number_too_large;
@@ -53,18 +53,17 @@ bool is_too_large(const dataset_facts& set) {
 
 class account {
  public:
-  account(const device_facts& device, const rehearsal& boot,
-          const link_facts& after)
-      : device_(device), boot_(boot), after_(after) {}
+  explicit account(const report& of)
+      : device_(of.device), boot_(of.boot), after_(of.after) {}
 
   explanation told() {
     legacy_icu_link();
     old_icu();
     select();
     localtime();
-    name_ = "boot";
     if (!boot_.ends_normally)
-      found("abnormal_end", "it ends abnormally: " + escaped(boot_.thrown));
+      found("boot", "abnormal_end",
+            "it ends abnormally: " + escaped(boot_.thrown));
     state_afterwards();
     if (told_.is == sound && !(after_ == device_.links))
       throw std::logic_error("a change without a reason");
@@ -79,10 +78,10 @@ class account {
   }
   bool has(std::string_view format) const { return find(format) != nullptr; }
 
-  // The line before the one that tells of a decision; nullptr: none.
-  const line* before(std::string_view format) const {
+  // The line before the one that tells of a decision; an empty one: none.
+  line before(std::string_view format) const {
     const line* const said = find(format);
-    return said == nullptr || said == boot_.lines.data() ? nullptr : said - 1;
+    return said == nullptr || said == boot_.lines.data() ? line() : said[-1];
   }
 
   // Of the step `name_`. In texts, those of the device are escaped.
@@ -92,7 +91,8 @@ class account {
     told_.is = std::max(told_.is, is);
     if (is != sound) told_.reasons.push_back(told_.steps.back());
   }
-  void reset(const char* reason, verdict is, const std::string& text) {
+  void reset(const char* reason, const std::string& text,
+             verdict is = verdict::wrong) {
     add("reset", reason, is, text + ": a reset to the system partition");
   }
   void refuse(const char* reason, const std::string& text,
@@ -103,9 +103,10 @@ class account {
   void skip() { add("not_reached", "earlier_failure", sound, "not looked at"); }
 
   // Beside the steps.
-  void found(const std::string& reason, const std::string& text) {
+  void found(const char* subject, std::string_view reason,
+             const std::string& text) {
     told_.is = wrong;
-    told_.reasons.push_back({name_, "found", reason, text});
+    told_.reasons.push_back({subject, "found", std::string(reason), text});
   }
 
   void legacy_icu_link() {
@@ -150,7 +151,8 @@ class account {
   // after it are not reached.
   void select() {
     const bool failed = has(lines::last_resort);
-    const auto [code, text] = failed ? cause_of_failure() : cause{};
+    const auto [code, text] =
+        failed ? cause_of_failure() : cause{"no_failure", "not needed"};
     const int steps_reached =
         code == "system_number_too_large" || code == "announcement_unreadable"
             ? 0
@@ -165,19 +167,11 @@ class account {
     steps_reached < 3 ? skip() : update();
     record();
     name_ = "last_resort";
-    if (failed)
-      add("reset", code, wrong, text);
-    else
-      add("nothing", "no_failure", sound, "not needed");
+    add(failed ? "reset" : "nothing", code, failed ? wrong : sound, text);
   }
 
-  // Only a reset makes this link; an activation makes others.
   bool failed_in_a_reset() const {
-    const line* const last = before(lines::last_resort);
-    return last != nullptr &&
-           last->text.starts_with(
-               "marlin: create_symlink: from /var/db/timezone/zoneinfo to "
-               "/usr/share/zoneinfo.default: ");
+    return before(lines::last_resort).text.starts_with(of_a_reset);
   }
   bool failed_at_current() const {
     if (has(lines::invalid_links))
@@ -191,9 +185,7 @@ class account {
     std::string text{};
   };
   cause cause_of_failure() const {
-    const line none;
-    const line* const last = before(lines::last_resort);
-    const line& said = last == nullptr ? none : *last;
+    const line said = before(lines::last_resort);
     const std::string error = std::strerror(said.error);
     const auto& current = device_.current;
     if (said.format == lines::create_failed)
@@ -211,35 +203,32 @@ class account {
               "a number in the system's version is too large"};
     const bool is_current =
         !has(lines::invalid_links) && current && is_too_large(*current);
-    if (!is_current && !(device_.update && is_too_large(*device_.update)))
+    const auto& set = is_current ? current : device_.update;
+    if (!set || !is_too_large(*set))
       throw std::logic_error("a last resort without a reason");
     return {is_current ? "current_number_too_large" : "update_number_too_large",
-            "a number in the name of " +
-                escaped((is_current ? current : device_.update)->path) +
-                " is too large"};
+            "a number in the name of " + escaped(set->path) + " is too large"};
   }
 
   void current() {
     if (!has(lines::invalid_links)) {
       const std::string& path = device_.links.current_path.value();
-      if (path.empty())
-        return add("read", "system", sound,
-                   "zoneinfo names the system partition");
-      return add("read", "update", sound,
-                 "zoneinfo names the update " + escaped(path));
+      return path.empty() ? add("read", "system", sound,
+                                "zoneinfo names the system partition")
+                          : add("read", "update", sound,
+                                "zoneinfo names the update " + escaped(path));
     }
     const kind what = device_.links.zoneinfo.what;
     if (what == kind::none)
-      reset("no_link", changes, "there is no link zoneinfo");
+      reset("no_link", "there is no link zoneinfo", changes);
     else if (what == kind::unknown)
-      reset("unreadable", wrong, "zoneinfo cannot be read");
+      reset("unreadable", "zoneinfo cannot be read");
     else if (what != kind::link)
-      reset("not_a_link", wrong, "zoneinfo is not a link");
+      reset("not_a_link", "zoneinfo is not a link");
     else if (device_.links.current_path)
-      reset("changed_by_the_boot", wrong,
-            std::string("zoneinfo") + behind_a_changed_link);
+      reset("changed_by_the_boot", "zoneinfo" + behind_a_changed_link);
     else
-      reset("bad_target", wrong, "zoneinfo names no data set");
+      reset("bad_target", "zoneinfo names no data set");
   }
 
   // The data set that the rest of the boot compares with.
@@ -254,18 +243,16 @@ class account {
     if (!has(lines::incompatible))
       add("kept", "fits", sound, "it fits the system");
     else if (!set.fits_system)
-      reset("other_schema", wrong,
-            "it has " + schema_of(set) + ", the system has " +
-                schema_of(device_.system));
+      reset("other_schema", "it has " + schema_of(set) + ", the system has " +
+                                schema_of(device_.system));
     else if (!set.has_version())
-      reset("no_version", wrong, "its name " + version + " is not a version");
+      reset("no_version", "its name " + version + " is not a version");
     else if (!(device_.system.version > set.version))
-      reset("changed_by_the_boot", wrong,
-            std::string("its data") + behind_a_changed_link);
+      reset("changed_by_the_boot", "its data" + behind_a_changed_link);
     else
-      reset("older_than_system", wrong,
-            "it is " + version + ", older than the system's " +
-                escaped(device_.system.version_text));
+      reset("older_than_system", "it is " + version +
+                                     ", older than the system's " +
+                                     escaped(device_.system.version_text));
   }
 
   void update() {
@@ -289,8 +276,7 @@ class account {
     else if (!set.has_version())
       refuse("no_version", "the name is not a version");
     else if (set.version > in_use.version)
-      refuse("changed_by_the_boot",
-             std::string("its data") + behind_a_changed_link);
+      refuse("changed_by_the_boot", "its data" + behind_a_changed_link);
     else if (set.version == in_use.version)
       refuse("same_version", other + " is of the same version");
     else
@@ -333,9 +319,8 @@ class account {
                  std::string("the default link cannot be made: ") +
                      std::strerror(boot_.lines.back().error));
     const kind what = device_.links.localtime.what;
-    const line* const last = before(lines::localtime_invalid);
     const auto [code, text] =
-        last != nullptr && last->format == lines::create_failed
+        before(lines::localtime_invalid).format == lines::create_failed
             ? cause{"not_replaced", "the corrected link cannot be made"}
         : is_corrected
             ? cause{"zone_unreachable",
@@ -351,24 +336,22 @@ class account {
   // What no later boot mends either.
   void state_afterwards() {
     if (is_too_large(device_.system)) return;
-    name_ = "system";
     if (!device_.system.has_version())
-      found("no_version", "its data has no version");
+      found("system", "no_version", "its data has no version");
     if (device_.system.schema.empty())
-      found("no_schema", "its data has no ICU schema");
+      found("system", "no_schema", "its data has no ICU schema");
     if (!boot_.ends_normally) return;
-    name_ = "links";
-    if (!after_.pair.fits)
-      found(std::string(after_.pair.name),
-            "after the boot " + std::string(after_.pair.sentence));
-    if (!after_.is_writable)
-      found("not_writable", "no boot can write in /var/db/timezone");
+    if (const auto& [name, sentence, fits] = after_.pair; !fits)
+      found("links", name, std::string("after the boot ").append(sentence));
+    if (!boot_.may_change_links)
+      found("links", "not_writable", "no boot can write in /var/db/timezone");
     if (const std::string closed = closed_part(); !closed.empty())
-      found("closed", "only root can read what is in use: " + closed +
-                          " is closed to others");
-    name_ = "local_zone";
+      found("links", "closed",
+            "only root can read what is in use: " + closed +
+                " is closed to others");
     if (!after_.zone_is_file)
-      found("missing", "its file cannot be reached after the boot");
+      found("local_zone", "missing",
+            "its file cannot be reached after the boot");
   }
 
   const device_facts& device_;
@@ -386,7 +369,4 @@ std::string step::sentence() const {
   return words + ": " + text;
 }
 
-explanation explain(const device_facts& device, const rehearsal& boot,
-                    const link_facts& after) {
-  return account(device, boot, after).told();
-}
+explanation explain(const report& told) { return account(told).told(); }

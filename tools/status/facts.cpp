@@ -12,6 +12,7 @@
 #include <cstring>
 #include <map>
 #include <memory>
+#include <new>
 #include <set>
 #include <stdexcept>
 #include <utility>
@@ -21,6 +22,8 @@
 #include "driver/dataset_links.h"
 #include "support/fsutil.h"
 #include "support/paths.h"
+#include "tools/descriptor.h"
+#include "tools/escaped.h"
 #include "tools/status/rehearsal.h"
 #include "tools/status/sight.h"
 
@@ -42,42 +45,37 @@ bool is_directory(const std::string& path) {
 entry record_at(const char* path) {
   entry record = entry_at(path);
   if (record.what != entry::kind::file) return record;
-  const int file = ::open(path, O_RDONLY | O_CLOEXEC);
-  if (file < 0) {
-    record.error = errno;
-    return record;
-  }
+  const descriptor file(::open(path, O_RDONLY | O_CLOEXEC));
   char text[longest_text];
-  const ssize_t length = ::read(file, text, sizeof text);
+  const ssize_t length =
+      file.number() < 0 ? -1 : ::read(file.number(), text, sizeof text);
   if (length < 0) record.error = errno;
-  ::close(file);
   if (length > 0) record.text.assign(text, static_cast<std::size_t>(length));
   return record;
 }
 
 link_pair pair_of(const link_facts& links) {
+  static constexpr char one[] = "zoneinfo and icutz name the same data";
   if (!links.current_path) return {};
   const std::string& path = *links.current_path;
   const std::string icu = path + "/icutz";
   const bool has_icu = links.icutz.what != entry::kind::none;
-  const link_pair one{path.empty() ? "system" : "update",
-                      "zoneinfo and icutz name the same data", true};
-  if (path.empty() && has_icu)
+  if (path.empty() && !has_icu) return {"system", one, true};
+  if (path.empty())
     return {"system_with_icu",
             "zoneinfo names the system partition, but there is a link icutz"};
-  if (path.empty()) return one;
   if (links.zoneinfo.text != path + "/zoneinfo")
     return {"not_the_tree",
             "zoneinfo leads into an update, but not to its tree"};
   if (!has_icu)
     return {"update_without_icu",
             "zoneinfo names an update, but there is no link icutz"};
-  const struct stat linked = status_of(paths::icu_link);
+  const struct stat there = status_of(paths::icu_link);
   const struct stat ours = status_of(icu);
   if (links.icutz.text == icu ||
-      (S_ISDIR(linked.st_mode) && linked.st_dev == ours.st_dev &&
-       linked.st_ino == ours.st_ino))
-    return one;
+      (S_ISDIR(ours.st_mode) && there.st_dev == ours.st_dev &&
+       there.st_ino == ours.st_ino))
+    return {"update", one, true};
   return {"update_with_other_icu",
           "icutz does not name the ICU data of zoneinfo's update"};
 }
@@ -90,37 +88,39 @@ constexpr std::pair<const char*, const char*> needing[] = {
     {"/var/db/icutz", paths::legacy_icu_link},
 };
 
+// The name that stands in a path behind a directory; "." if there is none.
+std::string name_behind(const std::string& directory, const std::string& path) {
+  if (!path.starts_with(directory)) return ".";
+  return path.substr(directory.size(),
+                     path.find('/', directory.size()) - directory.size());
+}
+
 void list_downloads(device_facts& device, sight& seen) {
+  const std::string root = paths::download_root;
+  const std::string real_root = seen.follow(root).real + "/";
   std::vector<std::string> names;
-  device.downloads_error = list_directory(paths::download_root, names);
+  device.downloads_error = list_directory(root, names);
   device.has_more_downloads = names.size() > most_names;
   std::map<std::string, std::vector<std::string>> sets;
   for (const auto& name : names)
-    if (is_directory(paths::download_root + name)) sets[name];
+    if (is_directory(root + name)) sets[name];
 
-  const std::string real_root = seen.follow(paths::download_root).real + "/";
   for (const auto& [label, link] : needing) {
-    // By its text, or by where it leads; what is in a directory needs that.
     const std::string text = target_of(link);
-    const std::string real = text.empty() ? text : seen.follow(link).real;
-    for (const auto& [target, root] :
-         {std::pair<std::string, std::string>(text, paths::download_root),
-          {real, real_root}}) {
-      if (!target.starts_with(root)) continue;
-      const std::string name = target.substr(
-          root.size(), target.find('/', root.size()) - root.size());
-      if (name.empty() || name == "." || name == ".." ||
-          (!sets.contains(name) && !is_directory(paths::download_root + name)))
-        continue;
-      auto& needed_by = sets[name];
-      if (needed_by.empty() || needed_by.back() != label)
-        needed_by.emplace_back(label);
-    }
+    if (text.empty()) continue;
+    // By its text, or by where it leads; what is in a directory needs that.
+    const std::set<std::string> needed = {
+        name_behind(root, text),
+        name_behind(real_root, seen.follow(link).real)};
+    for (const auto& name : needed)
+      if (!name.empty() && name != "." && name != ".." &&
+          is_directory(root + name))
+        sets[name].emplace_back(label);
   }
   for (const bool is_needed : {true, false})
     for (const auto& [name, needed_by] : sets)
       if (needed_by.empty() != is_needed)
-        device.downloads.push_back({name, needed_by});
+        device.downloads.emplace_back(name, needed_by);
 }
 
 void expect_file(dataset_facts& facts, const std::string& path) {
@@ -173,7 +173,6 @@ dataset_facts facts_of(const std::string& path,
                        std::unique_ptr<const mln_dataset>& system) {
   dataset_facts facts;
   facts.path = path;
-  const unsigned before = refusals();
   take_lines();
   errno = 0;
   try {
@@ -193,7 +192,6 @@ dataset_facts facts_of(const std::string& path,
   }
   // A walk that gets no memory looks like one that finds nothing.
   take_lines();
-  facts.word_is_cut = refusals() != before;
   if (facts.ends != dataset_facts::state::bad_path) note_unreadable(facts);
   return facts;
 }
@@ -252,7 +250,6 @@ link_facts read_links() {
   if (S_ISREG(record.st_mode))
     links.recorded =
         record.st_mtim.tv_sec * 1'000'000'000LL + record.st_mtim.tv_nsec;
-  links.is_writable = ::access("/var/db/timezone", W_OK | X_OK) == 0;
   links.zone_is_file = S_ISREG(status_of(paths::localtime_link).st_mode);
   try {
     links.current_path = current_dataset_path();
@@ -269,12 +266,14 @@ device_facts read_device(sight& seen) {
   device.icutz_resolves = fsutil::exists(paths::icu_link);
   std::unique_ptr<const mln_dataset> system;
   device.system = facts_of({}, system);
+  if (refusals() != 0) throw std::bad_alloc();
   if (device.links.current_path)
     device.current = device.links.current_path->empty()
                          ? device.system
                          : facts_of(*device.links.current_path, system);
   if (device.links.tz_latest.what == entry::kind::link)
     device.update = facts_of(latest_update_path(), system);
+  device.refusals = refusals();
   list_downloads(device, seen);
   return device;
 }
@@ -283,6 +282,11 @@ std::string kind_of(const entry& here) {
   static constexpr std::array names = {"none",      "link",    "file",
                                        "directory", "special", "unknown"};
   return names.at(static_cast<std::size_t>(here.what));
+}
+
+std::string schema_of(const dataset_facts& set) {
+  return set.schema.empty() ? "no ICU schema"
+                            : "ICU schema " + escaped(set.schema);
 }
 
 std::string zone_of(const link_facts& links) {

@@ -7,6 +7,7 @@
 #include <optional>
 #include <string>
 #include <string_view>
+#include <utility>
 #include <vector>
 
 #include "support/version.h"
@@ -31,12 +32,6 @@ std::string target_of(const char* link);  // empty: it is none
 inline constexpr std::size_t most_names = 10000;
 int list_directory(const std::string& path, std::vector<std::string>& names);
 
-// What should be there, and why it does not count.
-struct flaw {
-  std::string path{};
-  std::string error{};
-};
-
 // One data set as the boot program would build it.
 struct dataset_facts {
   // How building it ends: a path that is refused, a number in the name that
@@ -48,8 +43,8 @@ struct dataset_facts {
   mln_version version{};
   std::string schema{};
   bool fits_system = false;  // every component accepts the system's
-  bool word_is_cut = false;  // memory did not suffice for a first word
-  std::vector<flaw> unreadable{};
+  // What should be there, and why it does not count.
+  std::vector<std::pair<std::string, std::string>> unreadable{};
   bool has_several_schemas = false;
 
   bool has_version() const { return !(version == mln_version()); }
@@ -76,15 +71,8 @@ struct link_facts {
   link_pair pair{};
   bool zone_is_file = false;            // "localtime" leads to a regular file
   std::optional<long long> recorded{};  // when the record's file was written
-  bool is_writable = false;             // the links' directory, by a boot
 
   bool operator==(const link_facts&) const = default;
-};
-
-// A directory among the downloads, and the links that need it.
-struct download {
-  std::string name{};
-  std::vector<std::string> needed_by{};
 };
 
 struct device_facts {
@@ -94,24 +82,29 @@ struct device_facts {
   dataset_facts system{};
   std::optional<dataset_facts> current{};
   std::optional<dataset_facts> update{};
-  std::vector<download> downloads{};  // those that are needed first
+  // Among the downloads, with the links that need each; needed ones first.
+  std::vector<std::pair<std::string, std::vector<std::string>>> downloads{};
   int downloads_error = 0;
   bool has_more_downloads = false;  // perhaps; more entries than are listed
+  // How often memory was refused for the first word in an update, which is then
+  // cut and decides nothing.
+  unsigned refusals = 0;
 };
 
-// The links as they are, also after a boot. Neither throws anything but
-// std::bad_alloc, and neither changes anything. Calls: lstat(2), readlink(2),
-// stat(2), open(2), access(2).
+// The links as they are, also after a boot. Nothing here changes anything, or
+// throws anything but std::bad_alloc.
 link_facts read_links();
 
 // What readers need and only root may read, as it is now; empty: nothing.
 std::string closed_part();
 
-// All of it. The data sets are read as a boot reads them.
+// All of it. The data sets are read as a boot reads them; without memory for
+// the system's throws std::bad_alloc.
 device_facts read_device(sight& seen);
 
 // The words in which they are told, the same for people and for programs.
 std::string kind_of(const entry& here);
+std::string schema_of(const dataset_facts& set);
 
 // The zone that "localtime" names, below the active tree; empty: none.
 std::string zone_of(const link_facts& links);

@@ -24,16 +24,6 @@ namespace {
 constexpr int bad_use = 64;
 constexpr int not_here = 77;
 
-// In seconds, for storage that never answers.
-constexpr unsigned longest_wait = 30;
-
-enum class form { rows, json, reasons };
-
-struct options {
-  std::string root = "/";
-  form wanted = form::rows;
-};
-
 [[noreturn]] void refuse(int status, const std::string& why) {
   std::fprintf(stderr, "marlin-status: %s\n", why.c_str());
   std::exit(status);
@@ -58,11 +48,27 @@ Exit status: 0 sound, 1 the next boot changes something on purpose,
   refuse(bad_use, why + "; see --help");
 }
 
-[[noreturn]] void print_and_exit(const char* text) {
-  if (std::fputs(text, stdout) < 0 || std::fflush(stdout) != 0)
-    refuse(not_here, std::string("standard output: ") + std::strerror(errno));
-  std::exit(0);
+void print(const std::string& text, const std::string& otherwise = {}) {
+  if (std::fwrite(text.data(), 1, text.size(), stdout) != text.size() ||
+      std::fflush(stdout) != 0)
+    refuse(not_here, otherwise + "standard output: " + std::strerror(errno));
 }
+
+std::string in_rows_for_terminal(const report& told) {
+  winsize size{};
+  look wanted;
+  if (::isatty(STDOUT_FILENO) == 0) return in_rows(told, wanted);
+  if (::ioctl(STDOUT_FILENO, TIOCGWINSZ, &size) == 0)
+    wanted.width = size.ws_col;
+  const char* const colourless = std::getenv("NO_COLOR");
+  wanted.has_colour = colourless == nullptr || *colourless == '\0';
+  return in_rows(told, wanted);
+}
+
+struct options {
+  std::string root = "/";
+  std::string (*text_of)(const report&) = in_rows_for_terminal;
+};
 
 // Numbers that no letter has.
 enum { root = 256, json, check, version };
@@ -86,14 +92,16 @@ options options_in(int count, char** words) {
         break;
       case json:
       case check:
-        if (chosen.wanted != form::rows)
+        if (chosen.text_of != in_rows_for_terminal)
           misused("one of --json and --check is enough");
-        chosen.wanted = letter == json ? form::json : form::reasons;
+        chosen.text_of = letter == json ? in_json : in_reasons;
         break;
       case 'h':
-        print_and_exit(help);
+        print(help);
+        std::exit(0);
       case version:
-        print_and_exit("marlin-status " MARLIN_VERSION "\n");
+        print("marlin-status " MARLIN_VERSION "\n");
+        std::exit(0);
       case -1:
         if (optind == count) return chosen;
         misused(escaped(words[optind]) + " is not expected");
@@ -105,36 +113,14 @@ options options_in(int count, char** words) {
   }
 }
 
-look of_terminal() {
-  winsize size{};
-  look wanted;
-  if (::isatty(STDOUT_FILENO) == 0) return wanted;
-  if (::ioctl(STDOUT_FILENO, TIOCGWINSZ, &size) == 0)
-    wanted.width = size.ws_col;
-  const char* const colourless = std::getenv("NO_COLOR");
-  wanted.has_colour = colourless == nullptr || *colourless == '\0';
-  return wanted;
-}
-
-int tell(const options& chosen) {
-  const look wanted = of_terminal();
-  const report told = examine(chosen.root);
-  const std::string text = chosen.wanted == form::json ? in_json(told)
-                           : chosen.wanted == form::reasons
-                               ? in_reasons(told)
-                               : in_rows(told, wanted);
-  if (std::fwrite(text.data(), 1, text.size(), stdout) != text.size() ||
-      std::fflush(stdout) != 0)
-    must(-1, "standard output");
-  return static_cast<int>(told.why.is);
-}
-
 // In a child: whatever a device does to it, there is an answer.
-int tell_or_say_why_not(const options& chosen) {
+int tell_or_refuse(const options& chosen) {
   std::string why;
   try {
     end_with_parent();
-    return tell(chosen);
+    const report told = examine(chosen.root);
+    print(chosen.text_of(told), "cannot tell: ");
+    return static_cast<int>(told.why.is);
   } catch (const cannot_tell& reason) {
     why = reason.what();
   } catch (const std::bad_alloc&) {
@@ -145,8 +131,7 @@ int tell_or_say_why_not(const options& chosen) {
         "what the boot did does not follow from what was read; is the device "
         "being changed?";
   }
-  std::fprintf(stderr, "marlin-status: cannot tell: %s\n", why.c_str());
-  return not_here;
+  refuse(not_here, "cannot tell: " + why);
 }
 
 }  // namespace
@@ -159,7 +144,7 @@ int main(int count, char** words) {
   std::signal(SIGCHLD, SIG_DFL);
   const pid_t child = ::fork();
   if (child < 0) refuse(not_here, std::string("fork: ") + std::strerror(errno));
-  if (child == 0) std::_Exit(tell_or_say_why_not(chosen));
+  if (child == 0) std::_Exit(tell_or_refuse(chosen));
 
   // The default action of the alarm would be silent.
   std::signal(SIGALRM, [](int) {
@@ -168,7 +153,8 @@ int main(int count, char** words) {
     static_cast<void>(!::write(STDERR_FILENO, text, sizeof text - 1));
     std::_Exit(not_here);
   });
-  ::alarm(longest_wait);
+  // In seconds, for storage that never answers.
+  ::alarm(30);
   int status = 0;
   if (::waitpid(child, &status, 0) != child)
     refuse(not_here, std::string("wait: ") + std::strerror(errno));

@@ -41,8 +41,8 @@ std::vector<line> take_lines();
 struct rehearsal {
   std::vector<line> lines{};
   bool ends_normally = false;
-  std::string thrown{};   // otherwise: what was thrown, in words
-  unsigned refusals = 0;  // how often memory was refused to it
+  std::string thrown{};           // otherwise: what was thrown, in words
+  bool may_change_links = false;  // afterwards, in their directory
 };
 
 // Runs run_startup_pass() on the device that this process sees as "/". Throws

@@ -27,9 +27,7 @@ struct step {
 struct explanation {
   std::vector<step> steps{};  // in the order of the boot
   verdict is = verdict::sound;
-  // For a verdict other than sound: of the steps, and what is found beside
-  // them.
-  std::vector<step> reasons{};
+  std::vector<step> reasons{};  // if not sound: steps, and what is found beside
 };
 
 struct report {
@@ -45,12 +43,10 @@ struct report {
 // then sees nothing else. Throws cannot_tell, or what explain() throws.
 report examine(const std::string& root);
 
-// What a rehearsed boot did, and why: its lines and its effect, explained by
-// the facts. Nothing is decided here that the boot has not shown. `after` is
-// what read_links() gives when the boot is over. Throws std::bad_alloc only,
-// and std::logic_error if a boot did what is in no table.
-explanation explain(const device_facts& device, const rehearsal& boot,
-                    const link_facts& after);
+// What the rehearsed boot did, and why: its lines and its effect, explained by
+// the facts. Nothing is decided here that the boot has not shown. Throws
+// std::bad_alloc, and std::logic_error if the boot did what is in no table.
+explanation explain(const report& told);
 
 // How rows are shown: `width` 0 means without wrapping, as into a pipe.
 struct look {

@@ -1,7 +1,6 @@
 // SPDX-License-Identifier: BSD-2-Clause
 #include <algorithm>
 #include <cstring>
-#include <utility>
 
 #include "support/paths.h"
 #include "tools/escaped.h"
@@ -12,26 +11,14 @@ namespace {
 constexpr std::size_t label_width = 12;
 constexpr std::size_t most_downloads = 20;
 
-std::string error_text(int error) {
-  return std::string("(") + std::strerror(error) + ")";
-}
-
 std::string plain(const entry& here) {
-  switch (here.what) {
-    case entry::kind::link:
-      return "-> " + escaped(here.text);
-    case entry::kind::unknown:
-      return error_text(here.error);
-    case entry::kind::none:
-      return "none";
-    case entry::kind::special:
-      return "(a FIFO, a socket or a device)";
-    default:
-      return "(a " + kind_of(here) +
-             (here.error == 0
-                  ? ")"
-                  : ": " + std::string(std::strerror(here.error)) + ")");
-  }
+  const std::string error = std::strerror(here.error);
+  if (here.what == entry::kind::none) return "none";
+  if (here.what == entry::kind::link) return "-> " + escaped(here.text);
+  if (here.what == entry::kind::unknown) return "(" + error + ")";
+  if (here.what == entry::kind::special)
+    return "(a FIFO, a socket or a device)";
+  return "(a " + kind_of(here) + (here.error == 0 ? ")" : ": " + error + ")");
 }
 
 // What is between quotes is a text of the device, and only that.
@@ -47,8 +34,7 @@ std::string version_and_schema(const dataset_facts& set) {
     return "a number in its version is too large";
   return (set.has_version() ? escaped(set.version_text)
                             : std::string("no version")) +
-         (set.schema.empty() ? std::string(", no ICU schema")
-                             : ", ICU schema " + escaped(set.schema));
+         ", " + schema_of(set);
 }
 
 // Breaks at blanks where it can.
@@ -66,68 +52,64 @@ std::string wrapped(std::string text, std::size_t columns) {
 
 class rows {
  public:
+  explicit rows(const look& wanted) : look_(wanted) {}
+
+  // A label stands before the first of its rows.
   void add(const std::string& label, const std::string& text) {
-    rows_.emplace_back(label, text);
+    std::string shown = label == last_ ? "" : label;
+    shown.resize(label_width, ' ');
+    if (look_.has_colour) shown = "\033[1m" + shown + "\033[0m";
+    text_ += shown + wrapped(text, look_.width) + "\n";
+    last_ = label;
   }
-  void add_all(const char* label, const std::vector<std::string>& texts) {
-    for (const auto& text : texts) add(std::exchange(label, ""), text);
+  void add_flaws(const std::string& label, const dataset_facts& set) {
+    for (const auto& [path, error] : set.unreadable)
+      add(label, escaped(path) + ": " + error);
   }
-  std::string shown(const look& wanted) const {
-    std::string lines;
-    for (auto [label, text] : rows_) {
-      label.resize(label_width, ' ');
-      if (wanted.has_colour) label = "\033[1m" + label + "\033[0m";
-      lines += label + wrapped(text, wanted.width) + "\n";
-    }
-    return lines;
-  }
+  std::string text() const { return text_; }
 
  private:
-  std::vector<std::pair<std::string, std::string>> rows_{};
+  look look_;
+  std::string last_{};
+  std::string text_{};
 };
-
-void add_flaws(rows& shown, const dataset_facts& set) {
-  for (const auto& [path, error] : set.unreadable)
-    shown.add("", escaped(path) + ": " + error);
-}
 
 void add_data(rows& shown, const report& told) {
   const link_facts& links = told.device.links;
-  if (!told.device.current)
+  const auto& current = told.device.current;
+  if (!current) {
     shown.add("in use", links.zoneinfo.what == entry::kind::none
                             ? "none: there is no link zoneinfo"
                             : "none: zoneinfo names no data set");
-  else if (links.current_path->empty())
+  } else if (current->path.empty()) {
     shown.add("in use", "the system partition's");
-  else
-    shown.add("in use",
-              "the update " + version_and_schema(*told.device.current));
-  if (told.device.current && !told.device.current->path.empty()) {
-    shown.add("", plain(links.zoneinfo));
-    add_flaws(shown, *told.device.current);
+  } else {
+    shown.add("in use", "the update " + version_and_schema(*current));
+    shown.add("in use", plain(links.zoneinfo));
+    shown.add_flaws("in use", *current);
   }
   shown.add("system", version_and_schema(told.device.system));
-  add_flaws(shown, told.device.system);
+  shown.add_flaws("system", told.device.system);
 }
 
 void add_links(rows& shown, const report& told) {
   const link_facts& links = told.device.links;
   shown.add("links", std::string(links.pair.sentence));
   if (!links.pair.fits) {
-    shown.add("", "zoneinfo " + plain(links.zoneinfo));
-    shown.add("", "icutz " + plain(links.icutz));
+    shown.add("links", "zoneinfo " + plain(links.zoneinfo));
+    shown.add("links", "icutz " + plain(links.icutz));
   }
   if (told.is_mended_by_a_removal)
     shown.add(
-        "",
+        "links",
         "To mend it remove /var/db/timezone/zoneinfo: the next boot then "
         "links the system partition, or the announced update if it fits.");
 
   shown.add("announced", plain(links.tz_latest));
   if (told.device.update &&
       told.device.update->ends != dataset_facts::state::bad_path) {
-    shown.add("", version_and_schema(*told.device.update));
-    add_flaws(shown, *told.device.update);
+    shown.add("announced", version_and_schema(*told.device.update));
+    shown.add_flaws("announced", *told.device.update);
   }
 
   const std::string zone = zone_of(links);
@@ -140,37 +122,26 @@ void add_links(rows& shown, const report& told) {
             is_read ? quoted(links.record.text) : plain(links.record));
 }
 
-void add_downloads(rows& shown, const report& told) {
-  const char* label = "downloads";
-  const auto& found = told.device.downloads;
-  for (std::size_t i = 0; i < found.size() && i < most_downloads; ++i) {
+void add_downloads(rows& shown, const device_facts& device) {
+  const std::size_t count = device.downloads.size();
+  for (std::size_t i = 0; i < std::min(count, most_downloads); ++i) {
+    const auto& [name, needed_by] = device.downloads[i];
     std::string links;
-    for (const auto& link : found[i].needed_by)
+    for (const auto& link : needed_by)
       links += (links.empty() ? ", for " : ", ") + link;
-    shown.add(label, quoted(found[i].name) +
-                         (links.empty() ? ", which no link needs" : links));
-    label = "";
+    shown.add("downloads",
+              quoted(name) + (links.empty() ? ", which no link needs" : links));
   }
-  if (found.size() > most_downloads)
-    shown.add("", std::to_string(found.size() - most_downloads) + " more");
-  if (told.device.has_more_downloads)
-    shown.add(label,
+  if (count > most_downloads)
+    shown.add("downloads", std::to_string(count - most_downloads) + " more");
+  if (device.has_more_downloads)
+    shown.add("downloads",
               "only " + std::to_string(most_names) + " entries were looked at");
-  else if (told.device.downloads_error != 0)
-    shown.add(label, error_text(told.device.downloads_error));
-  else if (found.empty())
-    shown.add(label, "none");
-}
-
-void add_boot(rows& shown, const report& told) {
-  std::vector<std::string> steps;
-  for (const auto& done : told.why.steps)
-    if (done.does != "nothing") steps.push_back(done.sentence());
-  std::vector<std::string> lines;
-  for (const auto& said : told.boot.lines) lines.push_back(escaped(said.text));
-  shown.add_all("next boot", steps);
-  shown.add_all("it prints", lines);
-  shown.add_all("unknown", told.cannot_know);
+  else if (device.downloads_error != 0)
+    shown.add("downloads",
+              plain({entry::kind::unknown, {}, device.downloads_error}));
+  else if (count == 0)
+    shown.add("downloads", "none");
 }
 
 }  // namespace
@@ -182,16 +153,21 @@ std::string in_reasons(const report& told) {
 }
 
 std::string in_rows(const report& told, const look& wanted) {
-  rows shown;
+  rows shown(wanted);
   add_data(shown, told);
   add_links(shown, told);
-  add_downloads(shown, told);
-  add_boot(shown, told);
+  add_downloads(shown, told.device);
+  for (const auto& done : told.why.steps)
+    if (done.does != "nothing") shown.add("next boot", done.sentence());
+  for (const auto& said : told.boot.lines)
+    shown.add("it prints", escaped(said.text));
+  for (const auto& text : told.cannot_know) shown.add("unknown", text);
   shown.add("status", told.why.is == verdict::sound
                           ? "sound: the next boot changes nothing"
                       : told.why.is == verdict::changes
                           ? "the next boot changes something"
                           : "something is wrong");
-  for (const auto& reason : told.why.reasons) shown.add("", reason.sentence());
-  return shown.shown(wanted);
+  for (const auto& reason : told.why.reasons)
+    shown.add("status", reason.sentence());
+  return shown.text();
 }

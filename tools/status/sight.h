@@ -25,6 +25,7 @@ class sight {
     std::string target{};
     std::string names{};  // in a directory whose names count
     uid_t owner = 0;
+    gid_t group = 0;
 
     // Whoever the owners are.
     bool operator==(const place& other) const;

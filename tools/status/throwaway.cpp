@@ -5,7 +5,6 @@
 #include <mntent.h>
 #include <sched.h>
 #include <sys/mount.h>
-#include <sys/sendfile.h>
 #include <sys/stat.h>
 #include <sys/statvfs.h>
 #include <sys/xattr.h>
@@ -16,6 +15,7 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
+#include <filesystem>
 #include <memory>
 #include <set>
 #include <utility>
@@ -30,10 +30,7 @@
 namespace {
 
 constexpr char writable[] = "/var/db";
-constexpr char links[] = "/var/db/timezone";
-constexpr char downloads[] = "/var/db/timezone/tz";
 constexpr char in_base[] = "/root";  // the device, as long as it is not "/"
-constexpr char access_list[] = "system.posix_acl_access";
 constexpr char ask_outside[] =
     "; run this as root, and from outside of a container or chroot, with "
     "--root";
@@ -48,16 +45,10 @@ descriptor place_at(const std::string& path) {
   return descriptor(::open(path.c_str(), O_PATH | O_NOFOLLOW | O_CLOEXEC));
 }
 
-void write_file(const char* path, const std::string& text) {
-  const descriptor file(::open(path, O_WRONLY | O_CLOEXEC));
-  must(file.number(), path);
-  must(::write(file.number(), text.data(), text.size()), path);
-}
-
 // Before namespaces, in which all other users look like one.
 bool owner_may_change_links(const std::string& root) {
   sight outside(root);
-  const sight::place& directory = outside.follow(links).end;
+  const sight::place& directory = outside.follow(paths::timezone_directory).end;
   return directory.owner == outside.follow("/").end.owner &&
          (directory.mode & S_IWUSR) != 0;
 }
@@ -65,16 +56,17 @@ bool owner_may_change_links(const std::string& root) {
 // Attributes and numbers of the device's own mean something to overlayfs, and
 // what is covered loses its access list.
 [[noreturn]] void refuse_layer(const std::string& path) {
-  throw cannot_tell(escaped(path) +
-                    " looks different in an overlay; is it being changed, or "
-                    "has it an access "
-                    "list, an overlay attribute or the device number 0?");
+  throw cannot_tell(
+      escaped(path) +
+      " looks different in an overlay; is it being changed, or has it an "
+      "access list, an overlay attribute or the device number 0?");
 }
 
-void set_attributes(int tree, unsigned flags, unsigned long attributes) {
+void make_read_only(const descriptor& tree, unsigned flags = 0) {
   mount_attr wanted{};
-  wanted.attr_set = attributes;
-  must(::mount_setattr(tree, "", AT_EMPTY_PATH | flags, &wanted, sizeof wanted),
+  wanted.attr_set = MOUNT_ATTR_RDONLY;
+  must(::mount_setattr(tree.number(), "", AT_EMPTY_PATH | flags, &wanted,
+                       sizeof wanted),
        "mount_setattr");
 }
 
@@ -119,9 +111,15 @@ void enter_namespaces(const std::string& root, place& here) {
   if (may_mount) return;
   must(::unshare(CLONE_NEWUSER | CLONE_NEWNS),
        "this user may not have namespaces", ask_outside);
-  write_file("/proc/self/setgroups", "deny");
-  write_file("/proc/self/uid_map", "0 " + std::to_string(user) + " 1\n");
-  write_file("/proc/self/gid_map", "0 " + std::to_string(group) + " 1\n");
+  const std::pair<const char*, std::string> ids[] = {
+      {"/proc/self/setgroups", "deny"},
+      {"/proc/self/uid_map", "0 " + std::to_string(user) + " 1\n"},
+      {"/proc/self/gid_map", "0 " + std::to_string(group) + " 1\n"}};
+  for (const auto& [path, text] : ids) {
+    const descriptor file(::open(path, O_WRONLY | O_CLOEXEC));
+    must(file.number(), path);
+    must(::write(file.number(), text.data(), text.size()), path);
+  }
 }
 
 descriptor clone_tree(const descriptor& place, unsigned flags = 0) {
@@ -141,7 +139,7 @@ void attach(const descriptor& tree, const descriptor& target) {
 // What a boot sees of a cover is what it sees of the device.
 void resemble(const std::string& path, const struct stat& status,
               const place& here) {
-  // Owners whom this user cannot stand in for are in `here`.
+  // Owners whom this user cannot stand in for are in what was seen.
   if (::chown(path.c_str(), status.st_uid, status.st_gid) != 0 &&
       (here.has_all_users || errno != EINVAL))
     must(-1, "chown");
@@ -171,18 +169,12 @@ descriptor layer_over(const descriptor& lower, const std::string& name,
 // Of a file that is mounted by itself, which can have no layer.
 descriptor copy_of(const std::string& path, const std::string& name,
                    const struct stat& status, const place& here) {
-  const descriptor from(::open(path.c_str(), O_RDONLY | O_CLOEXEC));
-  must(from.number(), "a file that is mounted by itself");
-  const descriptor to(
-      ::open(name.c_str(), O_RDWR | O_CREAT | O_EXCL | O_CLOEXEC, 0600));
-  must(to.number(), "open");
-  ssize_t count = 0;
-  while ((count = ::sendfile(to.number(), from.number(), nullptr, 1 << 20)) >
-         0) {
-  }
-  must(count, "a file that is mounted by itself");
+  std::error_code error;
+  std::filesystem::copy_file(path, name, error);
+  errno = error.value();
+  must(error ? -1 : 0, "a file that is mounted by itself");
   resemble(name, status, here);
-  return clone_tree(to);
+  return clone_tree(place_at(name));
 }
 
 // For a place that is a file system of its own, or the topmost.
@@ -190,7 +182,8 @@ descriptor cover_for(const std::string& path, const std::string& name,
                      const place& here) {
   descriptor below = place_at(in_base + path);
   if (below.number() < 0) return below;
-  if (::getxattr((in_base + path).c_str(), access_list, nullptr, 0) > 0)
+  if (::getxattr((in_base + path).c_str(), "system.posix_acl_access", nullptr,
+                 0) > 0)
     refuse_layer(path);
   struct stat status {};
   must(::fstat(below.number(), &status), "stat");
@@ -202,53 +195,36 @@ descriptor cover_for(const std::string& path, const std::string& name,
       S_ISDIR(status.st_mode)   ? layer_over(below, name, status, here)
       : S_ISREG(status.st_mode) ? copy_of(in_base + path, name, status, here)
                                 : clone_tree(below);
-  if ((mounted.f_flag & ST_RDONLY) != 0)
-    set_attributes(cover.number(), 0, MOUNT_ATTR_RDONLY);
+  if ((mounted.f_flag & ST_RDONLY) != 0) make_read_only(cover);
   return cover;
 }
 
 // What is to lie over "/var/db" and over what is mounted below, by real paths
 // of the device, outer ones first. Made before everything becomes read only.
 std::vector<std::pair<std::string, descriptor>> make_covers(
-    const std::set<std::string>& mounts, const place& here, sight& seen) {
+    std::set<std::string> mounts, const place& here, sight& seen) {
   std::vector<std::pair<std::string, descriptor>> covers;
   const auto& [real, top, closed] = seen.follow(writable);
   // Without the directory there is nothing that a boot could write to.
   if (!S_ISDIR(top.mode)) return covers;
-  std::set<std::string> places = {real};
-  for (const auto& path : mounts)
-    if (path.starts_with(real + "/")) places.insert(path);
-  for (const auto& path : places)
-    covers.emplace_back(
-        path,
-        cover_for(path, std::string("/").append(std::to_string(covers.size())),
-                  here));
+  mounts.insert(real);
+  for (const auto& path : mounts) {
+    const std::string name = std::to_string(covers.size());
+    if ((path + "/").starts_with(real + "/"))
+      covers.emplace_back(path, cover_for(path, "/" + name, here));
+  }
 
-  const sight::way updates = seen.follow(downloads);
+  const sight::way updates = seen.follow(paths::download_root);
   const std::string& kept = updates.real;
   // What a unit may write stays so if all around it is only to be read.
-  if (!S_ISDIR(updates.end.mode) || real.starts_with(kept + "/")) return covers;
+  if (!S_ISDIR(updates.end.mode) || kept.empty() ||
+      real.starts_with(kept + "/"))
+    return covers;
   // Without the layer, which shows some files of an update as missing.
   descriptor copy = clone_tree(place_at(in_base + kept), AT_RECURSIVE);
-  set_attributes(copy.number(), AT_RECURSIVE, MOUNT_ATTR_RDONLY);
+  make_read_only(copy, AT_RECURSIVE);
   covers.emplace_back(kept, std::move(copy));
   return covers;
-}
-
-// What this user cannot stand in for: in a layer, it cannot be changed.
-void note_foreign_parts(place& here, sight& seen) {
-  for (const char* path : {"/", writable, links, paths::version_record}) {
-    const sight::way found = seen.follow(path);
-    if (found.end.error != 0) continue;
-    const std::string real = in_base + found.real;
-    struct stat status {};
-    must(::lstat(real.c_str(), &status), "stat");
-    if (here.foreign_part.empty() &&
-        (status.st_uid != 0 || status.st_gid != 0 ||
-         ::getxattr(real.c_str(), access_list, nullptr, 0) > 0))
-      here.foreign_part = path;
-    if (path == links) here.has_foreign_links = status.st_uid != 0;
-  }
 }
 
 }  // namespace
@@ -258,14 +234,13 @@ place enter_throwaway_device(const std::string& root) {
   enter_namespaces(root, here);
   must(::mount(nullptr, "/", nullptr, MS_REC | MS_PRIVATE, nullptr), "mount",
        ask_outside);
-  const descriptor device = open_directory(root);
   char outside[PATH_MAX];
   must(::realpath(root.c_str(), outside) == nullptr ? -1 : 0, escaped(root));
   here.is_running_system = std::strcmp(outside, "/") == 0;
   const auto mounts = mounts_below(here.is_running_system ? "" : outside);
 
   // Taken before anything is covered.
-  const descriptor tree = clone_tree(device, AT_RECURSIVE);
+  const descriptor tree = clone_tree(open_directory(root), AT_RECURSIVE);
   // A base of our own. Where it lies does not matter: this process sees nothing
   // else from then on, and no other process sees it.
   must(::mount("base", "/proc", "tmpfs", 0, "mode=0755,size=64m"), "tmpfs",
@@ -273,23 +248,23 @@ place enter_throwaway_device(const std::string& root) {
   enter(open_directory("/proc"));
   must(::mkdir(in_base, 0700), "mkdir");
   attach(tree, open_directory(in_base));
-  sight before(in_base);
-  const auto covers = make_covers(mounts, here, before);
-  set_attributes(tree.number(), AT_RECURSIVE, MOUNT_ATTR_RDONLY);
+  here.seen = sight(in_base);
+  const auto covers = make_covers(mounts, here, here.seen);
+  make_read_only(tree, AT_RECURSIVE);
 
-  if (before.at(writable).error != 0 &&
-      before.at(paths::system_zoneinfo).error != 0)
+  if (here.seen.at(writable).error != 0 &&
+      here.seen.at(paths::system_zoneinfo).error != 0)
     throw cannot_tell(escaped(root) + " is not a device: it has neither " +
                       writable + " nor " + paths::system_zoneinfo);
-  if (!here.has_all_users) note_foreign_parts(here, before);
-  before.look_around();
+  here.seen.look_around();
   for (const auto& [path, cover] : covers)
     if (const descriptor target = place_at(in_base + path);
         target.number() >= 0)
       attach(cover, target);
-  here.seen = sight(in_base);
-  here.seen.look_around();
-  if (const auto path = before.first_difference(here.seen)) refuse_layer(*path);
+  sight covered(in_base);
+  covered.look_around();
+  if (const auto path = here.seen.first_difference(covered))
+    refuse_layer(*path);
   enter(tree);
   here.seen.enter();
   return here;

@@ -10,12 +10,9 @@
 struct place {
   bool is_running_system = false;
   bool has_all_users = false;  // in no user namespace with fewer
-  // The first part that a boot changes and that is another user's; whether the
-  // links' directory is; whether that is of the owner of "/", who may write it.
-  std::string foreign_part{};
-  bool has_foreign_links = false;
+  // Whether the links' directory is of the owner of "/", who may write there.
   bool owner_may_change_links = false;
-  sight seen{};  // of the device
+  sight seen{};  // of the device, as it is without the layers
 };
 
 // Moves this process, for good, into mount namespaces of its own in which
@@ -24,6 +21,5 @@ struct place {
 // mounted below it, except "/var/db/timezone/tz", as under the boot unit.
 // Without the privileges of root it first enters a user namespace in which this
 // user is root. Throws cannot_tell with the call that failed, or with what the
-// layers do not show as it is. Calls: unshare(2), open_tree(2), move_mount(2),
-// mount_setattr(2), fsopen(2) for overlayfs, chroot(2).
+// layers do not show as it is.
 place enter_throwaway_device(const std::string& root);
