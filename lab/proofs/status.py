@@ -403,13 +403,14 @@ def test_its_end_follows_its_parents():
 
 def test_advice_is_tried_first():
     """Removing "zoneinfo" mends a lost "icutz", except where the boot may not write,
-    or not remove what stands there."""
+    as out of "/var/db" and as its owner, or not remove what stands there."""
     lost = "use 2024a.1.0; drop ICUTZ"
     unpack(lost)
     assert f"To mend it remove {ZONEINFO}:" in ask("--root", TREE).output
     os.unlink(TREE + ZONEINFO)
     assert ask("--root", TREE).status == 1
-    for other in "move TIMEZONE /zones; link TIMEZONE /zones", "directory ICUTZ":
+    for other in ("move TIMEZONE /zones; link TIMEZONE /zones", "directory ICUTZ",
+                  "directory TIMEZONE 0555"):
         unpack(f"{lost}; {other}")
         assert "To mend it" not in ask("--root", TREE).output
 
