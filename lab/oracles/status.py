@@ -5,6 +5,7 @@ what the boot then does. Every answer has to fit the schema and the page."""
 import json
 import os
 import re
+import shlex
 import subprocess
 from errno import ENOENT
 from typing import NamedTuple
@@ -68,9 +69,11 @@ class Answer(NamedTuple):
         return {" ".join(names) for names in steps | found}
 
 
-def ask(*options: str) -> Answer:
+def ask(*options: str, under: str = "", **how) -> Answer:
+    """Under a command that is to run it, if one is given."""
     namespace.insist_on_private_device()
-    done = subprocess.run([STATUS, *options], capture_output=True, timeout=30)
+    done = subprocess.run([*shlex.split(under), STATUS, *options], timeout=30,
+                          capture_output=True, **how)
     return Answer(done.returncode, done.stdout.decode("ascii"),
                   done.stderr.decode("latin-1"))
 

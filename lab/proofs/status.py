@@ -19,6 +19,7 @@ import subprocess
 import tarfile
 import termios
 from pathlib import Path
+from urllib.parse import quote
 
 import pytest
 
@@ -100,7 +101,8 @@ def test_random_devices(numbers, count):
 
 TREE = "/tmp/device"
 UPDATE = "2024a.1.0"
-AS_ROOT = "/usr/bin/unshare --user --map-root-user --mount /bin/sh -euc".split()
+AS_ROOT = "/usr/bin/unshare --user --map-root-user --mount /bin/sh -euc "
+STRACE = "/usr/bin/strace -f -qq -o /tmp/trace "
 
 
 class Tree(Device):
@@ -134,6 +136,10 @@ class Tree(Device):
         """A device with the number 0."""
         self.drop(path)
         self.afterwards.append(lambda: os.mknod(TREE + path, stat.S_IFCHR))
+
+    def mark(self, path, name, value=""):
+        self.afterwards.append(lambda: os.setxattr(TREE + path, name,
+                                                   value.encode("latin-1")))
 
     def fill(self, path, count):
         self.afterwards.extend(functools.partial(os.mknod, f"{TREE}{path}/{number}")
@@ -273,30 +279,13 @@ def test_a_tree(status, story, facts, count):
         for reason in answer.said["reasons"])
 
 
-def cannot_tell(why: str) -> Answer:
-    return Answer(77, "", f"marlin-status: cannot tell: {why}\n")
+def traced(options="") -> str:
+    ask("--root", TREE, under=STRACE + options)
+    return Path("/tmp/trace").read_text()
 
 
-def test_too_much_icu_data_cannot_be_told():
-    """A bound on memory or time is not a guess: a boot, which may have more, activates
-    this."""
-    unpack("announce 2024a.1.0; fill U/icutz 200000")
-    answer = ask("--root", TREE)
-    assert answer.status == 77
-    assert re.fullmatch("marlin-status: cannot tell: .* takes more than .*\n",
-                        answer.errors)
-
-
-def traced(*options: str) -> tuple[subprocess.CompletedProcess, str]:
-    done = subprocess.run(
-        ["/usr/bin/strace", "-f", "-qq", "-o", "/tmp/trace", *options, STATUS, "--root",
-         TREE], capture_output=True, text=True)
-    return done, Path("/tmp/trace").read_text()
-
-
-def disturbed(call: str, error: str, when="1+") -> subprocess.CompletedProcess:
-    return traced("-e", f"trace={call}",
-                  "-e", f"inject={call}:error={error}:when={when}")[0]
+def failing(call: str, error: str, when="1+") -> str:
+    return f"{STRACE} -e trace={call} -e inject={call}:error={error}:when={when}"
 
 
 def test_nothing_outside_is_opened():
@@ -304,7 +293,7 @@ def test_nothing_outside_is_opened():
     unpack("; ".join(f"link {path} /etc/passwd" for path in (
         "SYSTEM/+VERSION", "SYSTEM_ICU/icutzformat.txt", "RECORD", "TZ/x", "OLD_ICU",
         "LEGACY_ICUTZ")))
-    before, _, after = traced("-e", "trace=%file")[1].partition('chroot(".")')
+    before, _, after = traced("-e trace=%file").partition('chroot(".")')
     assert not re.search(r'open\w*\([^"]*"/etc', after)
     opened = set(re.findall(
         r'open\w*\([^"]*"([^"]*)"(?!.*resolve=RESOLVE_NO_MAGICLINKS\|RESOLVE_IN_ROOT)',
@@ -317,57 +306,55 @@ def test_nothing_outside_is_opened():
 def test_what_it_inherits_does_not_count():
     unpack("announce 2024a.1.0")
     asked = "--root", TREE, "--json"
-    done = subprocess.run(["/usr/bin/env", "--ignore-signal=CHLD", STATUS, *asked],
-                          capture_output=True, umask=0o777)
-    assert (done.returncode, done.stdout.decode()) == ask(*asked)[:2]
+    assert ask(*asked, under="/usr/bin/env --ignore-signal=CHLD", umask=0o777) == ask(
+        *asked)
 
 
 # Version 2: the owner, a user, the group, the mask, others; tag, rights and number.
 ACL = struct.pack("<I", 2) + b"".join(
     struct.pack("<HHI", tag, rights, os.geteuid() if tag == 2 else 0xffffffff)
     for tag, rights in ((1, 7), (2, 0), (4, 5), (16, 5), (32, 5)))
+AN_ACL = f"mark /var/db system.posix_acl_access {quote(ACL)}"
+LAYER = (r" looks different in an overlay; is it being changed, or has it an access "
+         r"list, an overlay attribute or the device number 0\?")
+INTO_FULL = """/bin/sh -c 'exec "$0" "$@" >/dev/full'"""
+TOO_LONG = """/usr/bin/prlimit --fsize=0 /bin/sh -c 'exec "$0" "$@" >/tmp/full'"""
 
 
-@pytest.mark.parametrize("path, story, marks", [
-    (ZONEINFO, "null ZONEINFO", []),
-    (OLD_ICU, "null OLD_ICU", []),
-    (TIMEZONE, "null TIMEZONE", []),
-    ("/var/db/x", "link LEGACY_ICUTZ x; null /var/db/x", []),
-    ("/var/db/x", "announce 2024a.1.0; link RECORD /var/db/x; null /var/db/x", []),
-    (f"{OLD_ICU}/x", "directory OLD_ICU; null OLD_ICU/x", []),
-    (OLD_ICU, "file OLD_ICU", [("/var/db", "user.overlay.opaque", b"x"),
-                               (OLD_ICU, "user.overlay.whiteout", b"y")]),
-    (OLD_ICU, "file OLD_ICU", [(OLD_ICU, "user.overlay.metacopy")]),
-    (RECORD, "file RECORD", [(RECORD, "user.overlay.metacopy")]),
-    ("/var/db", "", [("/var/db", "system.posix_acl_access", ACL)]),
+# A bound on memory, time or files is not a guess: a boot may have more.
+@pytest.mark.parametrize("why, story, under", [
+    (".* takes more than .*", "announce 2024a.1.0; fill U/icutz 200000", ""),
+    (".*a limit on the size of files cuts the record", "announce 2024a.1.0",
+     "/usr/bin/prlimit --fsize=5"),
+    (f"{TREE} is not a device: it has neither /var/db nor {SYSTEM_ZONEINFO}",
+     "drop /var; drop /usr", ""),
+    ("standard output: .*", "", INTO_FULL),
+    ("standard output: .*", "", TOO_LONG),
+    *[(".*; run this as root, and from outside of a container or chroot, with --root",
+       "", failing(*call)) for call in (
+           ("unshare", "EPERM"), ("mount", "EINVAL"), ("mount", "ENODEV", "3"),
+           ("open_tree", "EPERM"), ("chroot", "EPERM"))],
+    *[(path + LAYER, story, "") for path, story in (
+        (ZONEINFO, "null ZONEINFO"),
+        (OLD_ICU, "null OLD_ICU"),
+        (TIMEZONE, "null TIMEZONE"),
+        ("/var/db/x", "link LEGACY_ICUTZ x; null /var/db/x"),
+        ("/var/db/x", "announce 2024a.1.0; link RECORD /var/db/x; null /var/db/x"),
+        (f"{OLD_ICU}/x", "directory OLD_ICU; null OLD_ICU/x"),
+        (OLD_ICU, "file OLD_ICU; mark /var/db user.overlay.opaque x;"
+         "mark OLD_ICU user.overlay.whiteout y"),
+        (OLD_ICU, "file OLD_ICU; mark OLD_ICU user.overlay.metacopy"),
+        (RECORD, "file RECORD; mark RECORD user.overlay.metacopy"),
+        ("/var/db", AN_ACL))],
 ])
-def test_what_an_overlay_does_not_show(path, story, marks):
+def test_what_cannot_be_told(why, story, under):
     try:
         unpack(story)
-        for place, *mark in marks:
-            os.setxattr(TREE + place, *mark, *[b""] * (len(mark) == 1))
-    except OSError as failed:
+    except OSError as failed:  # not every file system has marks
         pytest.skip(str(failed))
-    assert ask("--root", TREE) == cannot_tell(
-        f"{path} looks different in an overlay; is it being changed, or has it an "
-        "access list, an overlay attribute or the device number 0?")
-
-
-def test_a_folder_that_is_not_a_device():
-    unpack("drop /var; drop /usr")
-    assert ask("--root", TREE) == cannot_tell(
-        f"{TREE} is not a device: it has neither /var/db nor {SYSTEM_ZONEINFO}")
-
-
-@pytest.mark.parametrize("call, error, when", [
-    ("unshare", "EPERM", "1+"), ("mount", "EINVAL", "1+"), ("mount", "ENODEV", "3"),
-    ("open_tree", "EPERM", "1+"), ("chroot", "EPERM", "1+")])
-def test_where_nothing_can_be_told_it_says_what_to_do(call, error, when):
-    unpack("")
-    done = disturbed(call, error, when)
-    assert (done.returncode, done.stdout) == (77, "")
-    assert done.stderr.endswith("; run this as root, and from outside of a container "
-                                "or chroot, with --root\n")
+    answer = ask("--root", TREE, under=under)
+    assert answer[:2] == (77, "")
+    assert re.fullmatch(f"marlin-status: cannot tell: {why}\n", answer.errors)
 
 
 # Of a process that starts or ends.
@@ -382,19 +369,19 @@ def test_a_failing_call(device, error, count):
     """No failure makes anything look better, or ends in silence."""
     status, story = device
     unpack(story)
-    made = collections.Counter(re.findall(r"^\d+ +(\w+)\(", traced()[1], re.M))
+    made = collections.Counter(re.findall(r"^\d+ +(\w+)\(", traced(), re.M))
     for call in made.keys() - NOT_ITS_OWN:
         for number in range(1, made[call] + 1):
-            done = disturbed(call, error, number)
-            assert done.returncode in (status, 2, 77), (call, number, done)
-            assert done.returncode != 77 or done.stderr or call == "write"
+            answer = ask("--root", TREE, under=failing(call, error, number))
+            assert answer.status in (status, 2, 77), (call, number, answer)
+            assert answer.status != 77 or answer.errors or call == "write"
             count("calls of marlin-status that fail")
 
 
 def test_its_end_follows_its_parents():
     """Whatever changes its rights takes that back."""
     unpack("")
-    trace = traced("-e", "trace=%process,%creds,prctl")[1]
+    trace = traced("-e trace=%process,%creds,prctl")
     process = re.search(r"^(\d+) +setresgid\(", trace, re.M)[1]
     rights = r"setgroups|setresgid|capset|prctl\(PR_SET_PDEATHSIG"
     made = re.findall(rf"^{process} +({rights})", trace, re.M)
@@ -446,27 +433,10 @@ def test_bad_use_is_one_line(words, status, line):
 def test_it_tells_about_itself():
     assert ask("--help").output.startswith("usage: marlin-status ")
     assert re.fullmatch(r"marlin-status \d+\.\d+\.\d+\n", ask("--version").output)
-
-
-@pytest.mark.parametrize("limit", [[], ["/usr/bin/prlimit", "--fsize=0"]])
-@pytest.mark.parametrize("words, failure", [
-    (["--root", TREE], b"cannot tell: standard output: "),
-    (["--help"], b"standard output: ")])
-def test_a_full_standard_output_is_a_failure(words, failure, limit):
-    unpack("")
-    with open("/tmp/full" if limit else "/dev/full", "wb") as full:
-        done = subprocess.run([*limit, STATUS, *words], stdout=full,
-                              stderr=subprocess.PIPE)
-    assert done.returncode == 77
-    assert done.stderr.startswith(b"marlin-status: " + failure)
-
-
-def test_a_record_that_a_limit_on_files_cuts_is_not_told():
-    unpack("announce 2024a.1.0")
-    done = subprocess.run(["/usr/bin/prlimit", "--fsize=5", STATUS, "--root", TREE],
-                          capture_output=True)
-    assert (done.returncode, done.stdout) == (77, b"")
-    assert done.stderr.endswith(b"a limit on the size of files cuts the record\n")
+    for under in INTO_FULL, TOO_LONG:
+        answer = ask("--help", under=under)
+        assert answer[:2] == (77, "")
+        assert answer.errors.startswith("marlin-status: standard output: ")
 
 
 def test_rows_fit_a_terminal():
@@ -513,11 +483,6 @@ def test_an_archive_as_the_page_says():
 # --- As root of the namespace, with mounts of its own -------------------------------
 
 
-def as_root(script: str) -> Answer:
-    done = subprocess.run([*AS_ROOT, script], capture_output=True, text=True)
-    return Answer(done.returncode, done.stdout, done.stderr)
-
-
 def another_users(name: str, otherwise: str) -> str:
     return next(path for path in (f"{BUILD}/prove/another-users{name}", otherwise)
                 if os.path.exists(path) and os.stat(path).st_uid != os.geteuid())
@@ -537,19 +502,20 @@ FOREIGN_FILE = "/file", "/etc/passwd"
 ])
 def test_a_part_of_another_user(part, foreign, story, is_told):
     unpack(story)
-    said = as_root(f"""mount --bind {another_users(*foreign)} {TREE}{part}
-                       exec {STATUS} --root {TREE} --check""")
-    assert said == (Answer(0, "", "") if is_told else cannot_tell(
-        f"{part} belongs to another user or group, or has an access list; run this as "
-        "root"))
+    answer = ask("--root", TREE, "--check", under=AS_ROOT + f"""'
+        mount --bind {another_users(*foreign)} {TREE}{part}; exec "$0" "$@"'""")
+    assert answer == (Answer(0, "", "") if is_told else Answer(
+        77, "", f"marlin-status: cannot tell: {part} belongs to another user or group, "
+        "or has an access list; run this as root\n"))
 
 
 def test_a_record_that_is_mounted():
     unpack("announce 2024a.1.0; file RECORD old")
-    answer = as_root(f"""echo other >/tmp/record
-                         mount --bind /tmp/record {TREE}{RECORD}
-                         {STATUS} --root {TREE} --json || [ $? = 1 ]
-                         echo other | cmp /tmp/record -""")
+    answer = ask("--root", TREE, "--json", under=AS_ROOT + f"""'
+        echo other >/tmp/record
+        mount --bind /tmp/record {TREE}{RECORD}
+        "$0" "$@" || [ $? = 1 ]
+        echo other | cmp /tmp/record -'""")
     assert (answer.status, answer.errors) == (0, "")
     assert fact(answer.said, "record") == "activation"
 
@@ -560,14 +526,14 @@ def test_a_file_system_of_its_own(place):
     """What is mounted inside the device is seen, covered and left alone."""
     unpack("announce 2024a.1.0")
     at, aside = TREE + place, "/tmp/aside"
-    look = f"find {TREE} -printf '%p %i %T@ %C@ %l\\n'"
-    answer = as_root(f"""
+    look = f'find {TREE} -printf "%p %i %T@ %C@ %l\\n"'
+    answer = ask("--root", TREE, "--json", under=AS_ROOT + f"""'
         mkdir {aside} && cp -a {at}/. {aside}
         mount -t tmpfs -o mode=755 own {at} && cp -a {aside}/. {at}
         {look} >/tmp/before
-        {STATUS} --root {TREE} --json || [ $? = 1 ]
+        "$0" "$@" || [ $? = 1 ]
         {look} | cmp /tmp/before -
-        rm -r {aside}""")
+        rm -r {aside}'""")
     assert answer.errors == ""
     assert fact(answer.said, "update") == "newer"
     assert unescaped(fact(answer.said, "next_boot.after.zoneinfo.target")) == (
