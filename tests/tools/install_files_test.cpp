@@ -17,9 +17,8 @@ class Removal : public DeviceTest {
   inline static const std::string place = "/var/db/place";
 };
 
-TEST_F(Removal, OfNothingIsQuiet) { EXPECT_EQ(remove().files, 0u); }
-
 TEST_F(Removal, TellsHowMuchItWas) {
+  EXPECT_EQ(remove().files, 0u);
   make_file(place + "/a/b/one", std::string(5000, 'x'));
   make_file(place + "/two", "x");
   make_link(place + "/link", "/usr/share");
@@ -127,14 +126,13 @@ TEST_F(DeviceFacts, ASetFitsByAFileThatTheBootCounts) {
 }
 
 TEST_F(DeviceFacts, NoTextPrintsALine) {
-  EXPECT_THAT(printed_by([] {
-                for (const char* text : {"", "x", "2024", "2024a.99999999999",
-                                         "99999999999999a", "2024a\n"})
-                  EXPECT_FALSE(version_in(text)) << text;
-                EXPECT_TRUE(version_in("2024a.1.0"));
-                EXPECT_EQ(system_version() + system_schema(), ".1.0");
-              }),
-              no_lines());
+  quietly([] {
+    for (const char* text :
+         {"", "x", "2024", "2024a.99999999999", "99999999999999a", "2024a\n"})
+      EXPECT_FALSE(version_in(text)) << text;
+    EXPECT_TRUE(version_in("2024a.1.0"));
+    EXPECT_EQ(system_version() + system_schema(), ".1.0");
+  });
 }
 
 }  // namespace

@@ -4,7 +4,6 @@
 // why, and that a refused update leaves no trace.
 #include <fcntl.h>
 #include <sys/file.h>
-#include <sys/mman.h>
 #include <sys/resource.h>
 #include <sys/stat.h>
 #include <unistd.h>
@@ -55,15 +54,9 @@ outcome install(words given = {source},
   return result;
 }
 
-// On standard output.
+// All that it prints.
 std::string told_by(const words& given) {
-  const int told = ::memfd_create("told", MFD_CLOEXEC);
-  install(given, [&] { ::dup2(told, STDOUT_FILENO); });
-  std::string text(10'000, '\0');
-  text.resize(
-      static_cast<std::size_t>(::pread(told, text.data(), text.size(), 0)));
-  ::close(told);
-  return text;
+  return install(given, [] { ::dup2(STDERR_FILENO, STDOUT_FILENO); }).log;
 }
 
 std::set<std::string> names_of_sets() {
@@ -331,13 +324,12 @@ TEST_F(Installer, TakesBackASetThatCannotBeAnnounced) {
 TEST_F(Installer, TakesBackACopyThatCannotBeWrittenWhole) {
   make_file(source + "/icutz/large.res", std::string(2000, 'x'));
   seal();
-  expect_no_trace_of([] {
-    EXPECT_EQ(install({source},
-                      [] {
-                        const rlimit limit{1000, 1000};
-                        ::setrlimit(RLIMIT_FSIZE, &limit);
-                      })
-                  .log,
+  const auto limit_files = [] {
+    const rlimit limit{1000, 1000};
+    ::setrlimit(RLIMIT_FSIZE, &limit);
+  };
+  expect_no_trace_of([&] {
+    EXPECT_EQ(install({source}, limit_files).log,
               "marlin-install: 2024b.1.0: cannot write "
               "/var/db/timezone/tz/.marlin-install.new/icutz/large.res: "
               "File too large; nothing was changed\n");
@@ -384,8 +376,7 @@ void expect_each_refused(
 
 TEST_F(Installer, RefusesWhatNoSetCanHave) {
   expect_each_refused(
-      {{"zoneinfo/Europe/Paris is a FIFO", [] { make_fifo(paris); }},
-       {"zoneinfo/Europe/Paris is a socket", [] { make_socket(paris); }},
+      {{"zoneinfo/Europe/Paris is a socket", [] { make_socket(paris); }},
        {"zoneinfo/Europe/Paris is a link",
         link("zoneinfo/Europe/Paris", "/dev/zero")},
        {"zoneinfo/CET is a link", link("zoneinfo/CET", "Europe/Paris")},
@@ -437,7 +428,9 @@ TEST_F(Installer, RefusesWhatNoSetCanHave) {
         [] {
           for (char letter = 'a'; letter < 'i'; ++letter)
             file(std::string("icutz/") + letter, std::string(4 << 20, 'x'))();
-        }}},
+        }},
+       // The last, because a FIFO leaves the test 30 seconds.
+       {"zoneinfo/Europe/Paris is a FIFO", [] { make_fifo(paris); }}},
       [] { seal(); });
 }
 
