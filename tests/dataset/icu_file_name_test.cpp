@@ -8,31 +8,17 @@
 
 namespace {
 
-TEST(IcuFileName, CarriesDigitsAndOneFormatLetter) {
-  for (const std::string schema :
-       {"44l", "44b", "44e", "7l", "044l", "0123456789e"})
-    EXPECT_EQ(icu_schema_in("icutz" + schema + ".dat"), schema);
-}
-
-TEST(IcuFileName, OfANearMissCarriesNothing) {
-  for (const std::string schema : {"", "l", "44", "44L", "44ll", "4l4", " 44l"})
-    EXPECT_EQ(icu_schema_in("icutz" + schema + ".dat"), "") << schema;
-  for (const std::string start : {"", "xicutz", "Icutz", "icut", "icudt"})
-    EXPECT_EQ(icu_schema_in(start + "44l.dat"), "") << start;
-  for (const std::string end : {"", "dat", "xdat", ".da", ".DAT", ".dat.bak"})
-    EXPECT_EQ(icu_schema_in("icutz44l" + end), "") << end;
-  for (const char* name : {"", "icutz", ".dat", "icutzat", "icutz4"})
-    EXPECT_EQ(icu_schema_in(name), "") << name;
-}
-
-TEST(IcuFileName, AgreesWithTheRegularExpressionOnEveryByteAnywhere) {
+// Any byte comes in addition or in place of another; any part is missing.
+TEST(IcuFileName, AgreesWithTheRegularExpressionOnEveryNearMiss) {
   const std::regex grammar(R"(icutz([0-9]+[lbe])\.dat)");
   const std::string valid = "icutz44l.dat";
+  constexpr int none = 256;
   for (std::size_t place = 0; place <= valid.size(); ++place) {
-    for (int byte = 0; byte < 256; ++byte) {
-      for (const std::size_t replaced : {0u, 1u}) {
+    for (int byte = 0; byte <= none; ++byte) {
+      const std::size_t most = byte == none ? valid.size() - place : 1;
+      for (std::size_t missing = 0; missing <= most; ++missing) {
         std::string name = valid;
-        name.replace(place, replaced, 1, static_cast<char>(byte));
+        name.replace(place, missing, byte != none, static_cast<char>(byte));
         std::smatch groups;
         std::regex_match(name, groups, grammar);
         EXPECT_EQ(icu_schema_in(name), groups[1].str())

@@ -365,12 +365,6 @@ outcome boot() {
   return result;
 }
 
-void boot_prints_exactly(const log_lines& expected) {
-  const outcome booted = boot();
-  EXPECT_EQ(booted.exit_status, 0);
-  EXPECT_EQ(booted.lines(), expected);
-}
-
 log_lines printed_by(const std::function<void()>& act) {
   const int standard_error = ::dup(STDERR_FILENO);
   const int log = new_log();

@@ -20,12 +20,19 @@ log_lines lines(const Several&... several) {
   (all.insert(all.end(), several.begin(), several.end()), ...);
   return all;
 }
-inline log_lines no_lines() { return {}; }
 
 // The line of a call that fails, or one that ends in an earlier call's error.
 inline log_lines failure(const std::string& text, int error) {
   return {"marlin: " + text + ": " + std::strerror(error)};
 }
+
+// One without a value in it: a call gives it its error.
+struct fixed_line {
+  const char* text;
+  log_lines operator()(int error = ENOENT) const {
+    return failure(text, error);
+  }
+};
 
 // --- Calls that failed -------------------------------------------------------
 
@@ -59,46 +66,34 @@ inline log_lines bad_zoneinfo_link(const std::string& target,
                                    int error = ENOENT) {
   return failure("Bad zoneinfo link " + target, error);
 }
-inline log_lines invalid_links(int error = ENOENT) {
-  return failure("Invalid current symlinks; resetting to system partition",
-                 error);
-}
-inline log_lines incompatible(int error = ENOENT) {
-  return failure("Symlink points at data incompatible with installed system",
-                 error);
-}
+inline constexpr fixed_line invalid_links{
+    "Invalid current symlinks; resetting to system partition"};
+inline constexpr fixed_line incompatible{
+    "Symlink points at data incompatible with installed system"};
 inline log_lines refused(const std::string& update, const std::string& current,
                          int error = ENOENT) {
   return failure("New update not compatible or older version: " + update +
                      " vs. " + current,
                  error);
 }
-inline log_lines unable_to_locate(int error = ENOENT) {
-  return failure("Unable to locate data; resetting to system partition", error);
-}
+inline constexpr fixed_line unable_to_locate{
+    "Unable to locate data; resetting to system partition"};
 
 // --- The legacy link ---------------------------------------------------------
 
-inline log_lines not_migrated(int error) {
-  return failure("Could not migrate /var/db/icutz to /var/db/timezone/icutz",
-                 error);
-}
-inline log_lines not_removed(int error) {
-  return failure("Could not remove /var/db/icutz", error);
-}
+inline constexpr fixed_line not_migrated{
+    "Could not migrate /var/db/icutz to /var/db/timezone/icutz"};
+inline constexpr fixed_line not_removed{"Could not remove /var/db/icutz"};
 
 // --- Links that are in the way, or made anew ---------------------------------
 
-inline log_lines zoneinfo_not_unlinked(int error) {
-  return failure("Unlink of zoneinfo softlink failed", error);
-}
+inline constexpr fixed_line zoneinfo_not_unlinked{
+    "Unlink of zoneinfo softlink failed"};
 inline log_lines zoneinfo_stays(int error) {
   return lines(cannot_remove("/var/db/timezone/zoneinfo", error),
                zoneinfo_not_unlinked(error));
 }
-inline log_lines icu_not_unlinked(int error) {
-  return failure("unlink of ICU softlink failed", error);
-}
+inline constexpr fixed_line icu_not_unlinked{"unlink of ICU softlink failed"};
 // The link in its present place, or in the legacy one.
 inline log_lines icu_link_stays(const std::string& path, int error) {
   return lines(cannot_remove(path, error), icu_not_unlinked(error));
@@ -106,9 +101,7 @@ inline log_lines icu_link_stays(const std::string& path, int error) {
 inline log_lines correcting_localtime(const std::string& target, int error) {
   return failure("Correcting localtime link to " + target, error);
 }
-inline log_lines resetting_localtime(int error = ENOENT) {
-  return failure("localtime link invalid; resetting to America/Los_Angeles",
-                 error);
-}
+inline constexpr fixed_line resetting_localtime{
+    "localtime link invalid; resetting to America/Los_Angeles"};
 
 }  // namespace device

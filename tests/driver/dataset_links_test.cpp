@@ -9,8 +9,6 @@ using namespace device;
 
 namespace {
 
-class LatestUpdatePath : public DeviceTest {};
-class CurrentDatasetPath : public DeviceTest {};
 class DatasetPathFromLink : public DeviceTest {
  protected:
   static void accepts(const std::string& target, const std::string& path) {
@@ -26,48 +24,9 @@ class DatasetPathFromLink : public DeviceTest {
   }
 };
 
-TEST_F(LatestUpdatePath, IsQuietlyEmptyWithoutAnAnnouncement) {
-  EXPECT_EQ(quietly(latest_update_path), "");
-}
-
-TEST_F(LatestUpdatePath, IsTheUncheckedTargetOfTheAnnouncement) {
-  for (const std::string target :
-       {"/var/db/timezone/tz/2024a.1.0", "/var/db/timezone/tz/2024a.1.0/",
-        "tz/2024a.1.0", "/gone", "../..//"}) {
-    make_link(tz_latest, target);
-    EXPECT_EQ(quietly(latest_update_path), target);
-  }
-}
-
-TEST_F(CurrentDatasetPath, IsThatOfTheSetThatTheZoneinfoLinkNames) {
-  point_zoneinfo_at("/var/db/timezone/tz/2024a.1.0/zoneinfo");
-  EXPECT_EQ(quietly(current_dataset_path), "/var/db/timezone/tz/2024a.1.0");
-  point_zoneinfo_at("/usr/share/zoneinfo.default");
-  EXPECT_EQ(quietly(current_dataset_path), "");
-  wipe(zoneinfo);
-  throws(-1, current_dataset_path, bad_zoneinfo_link(""));
-}
-
-TEST_F(CurrentDatasetPath, AndLatestThrowTheErrorForAFileOrWithoutPermission) {
-  for (const auto& [read, link] :
-       {std::pair(&latest_update_path, tz_latest),
-        std::pair(&current_dataset_path, zoneinfo)}) {
-    make_file(link);
-    throws(EINVAL, read, cannot_read(link, EINVAL));
-    set_mode(timezone_root, 0);
-    throws(EACCES, read, cannot_read(link, EACCES));
-    set_mode(timezone_root, 0755);
-  }
-}
-
 TEST_F(DatasetPathFromLink, IsAllBeforeTheLastSlashOfADownloadAsItStands) {
-  for (const std::string name : {"2024a.1.0", "x", "a/", "/a", "../x"}) {
-    const std::string path = "/var/db/timezone/tz/" + name;
-    accepts(path + "/zoneinfo", path);
-  }
-}
-
-TEST_F(DatasetPathFromLink, IsEmptyForExactlyTheSystemTree) {
+  for (const std::string name : {"2024a.1.0", "x", "a/", "/a", "../x"})
+    accepts(update(name) + "/zoneinfo", update(name));
   accepts("/usr/share/zoneinfo.default", "");
 }
 

@@ -83,8 +83,6 @@ TEST_F(Interface, OfVersionsHasTwoComparisonsOnly) {
 
 TEST_F(Interface, OfComponents) {
   static_assert(std::is_abstract_v<mln_dataset_component>);
-  static_assert(!std::has_virtual_destructor_v<mln_zoneinfo> &&
-                !std::has_virtual_destructor_v<mln_icu>);
   // One pointer, to the table of virtual operations, and the fields.
   static_assert(sizeof(mln_zoneinfo) ==
                 sizeof(void*) + 3 * sizeof(std::string));

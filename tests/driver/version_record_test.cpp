@@ -20,14 +20,6 @@ class VersionRecord : public DeviceTest {
   static void write() { record_version_change("2023c.1.0", "2024a.1.0"); }
 };
 
-TEST_F(VersionRecord, HoldsBothVersionsAndNothingElse) {
-  quietly(write);
-  EXPECT_EQ(file_at(record), both);
-  make_file(record, std::string(1000, 'x'));
-  quietly(write);
-  EXPECT_EQ(file_at(record), both);
-}
-
 TEST_F(VersionRecord, KeepsEveryByteOfBothVersions) {
   const std::string to("\xff\0", 2);
   for (const auto& from :

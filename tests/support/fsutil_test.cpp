@@ -30,13 +30,8 @@ void create_fails(const std::string& at, int error) {
       cannot_link(at, "x", error));
 }
 
-// --- Paths that cannot be reached
-
-struct unreachable {
-  std::string path;
-  int error;
-};
-std::vector<unreachable> unreachable_paths() {
+// Each with the error of reaching it.
+std::vector<std::pair<std::string, int>> unreachable_paths() {
   make_link("/var/db/shut/link", "x");
   set_mode("/var/db/shut", 0);
   make_file("/var/db/file");
@@ -47,18 +42,25 @@ std::vector<unreachable> unreachable_paths() {
           {"/var/db/" + std::string(256, 'x'), ENAMETOOLONG}};
 }
 
-TEST_F(Remove, AndReadingFailWhereAPathCannotBeReached) {
+TEST_F(Remove, ReadingAndCreatingFailWhereAPathCannotBeReached) {
   for (const auto& [unreached, error] : unreachable_paths()) {
     remove_fails(unreached, error);
     read_fails(unreached, error);
+    create_fails(unreached, error);
   }
+  create_fails("/var/db/no/link", ENOENT);
 }
 
-TEST_F(Exists, IsQuietlyFalseForADanglingLinkAndAPathThatCannotBeReached) {
-  make_link(path, "/var/db/gone");
-  EXPECT_FALSE(quietly([] { return fsutil::exists(path); }));
-  for (const auto& [unreached, error] : unreachable_paths())
+TEST_F(Exists, IsQuietlyFalseForAPathThatCannotBeReachedAndLeavesItsError) {
+  make_link("/var/db/dangling", "/var/db/gone");
+  auto paths = unreachable_paths();
+  paths.insert(paths.end(), {{path, ENOENT}, {"/var/db/dangling", ENOENT}});
+  for (const auto& [unreached, error] : paths) {
     EXPECT_FALSE(quietly([&at = unreached] { return fsutil::exists(at); }));
+    errno = EXDEV;
+    fsutil::exists(unreached);
+    EXPECT_EQ(errno, error) << unreached;
+  }
 }
 
 // Printing comes before the number is read: with no standard error to print to
@@ -72,8 +74,6 @@ TEST_F(Remove, ThrowsTheNumberThatStandsAfterItsLineIsPrinted) {
     EXPECT_EQ(thrown_by([] { fsutil::create_symlink("x", path); }), EBADF);
   });
 }
-
-// --- One call after the other
 
 TEST_F(Remove, DeletesALinkAndNotWhatItNames) {
   make_file("/var/db/timezone/target");
@@ -114,13 +114,6 @@ TEST_F(Exists, IsTrueForAFileThatNobodyMayReadADirectoryAndALinkToAFile) {
   make_link(path, "/var/db/file");
   for (const char* reached : {"/var/db/file", "/var/db", path.c_str()})
     EXPECT_TRUE(fsutil::exists(reached)) << reached;
-}
-
-TEST_F(Exists, IsQuietlyFalseForAMissingPathAndLeavesItsError) {
-  errno = EXDEV;
-  EXPECT_FALSE(quietly([] { return fsutil::exists(path); }));
-  fsutil::exists(path);
-  EXPECT_EQ(errno, ENOENT);
 }
 
 TEST_F(ReadSymlink, ReturnsTheTargetAsItIsStored) {
@@ -181,12 +174,6 @@ TEST_F(CreateSymlink, NamesTheLinkFirstAndTheTargetSecondOnFailure) {
       17, [] { fsutil::create_symlink("x", path); },
       failure("create_symlink: from " + path + " to x", EEXIST));
   EXPECT_EQ(link_at(path), "/var/db/other");
-}
-
-TEST_F(CreateSymlink, WithoutADirectoryOrPermissionPrintsAndThrows) {
-  create_fails("/var/db/no/link", ENOENT);
-  set_mode(timezone_root, 0555);
-  create_fails(path, EACCES);
 }
 
 }  // namespace

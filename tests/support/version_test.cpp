@@ -29,8 +29,6 @@ TEST(VersionParse, FillsFourFields) {
             "1|a|1|0");
 }
 
-TEST(VersionParse, StartsUnset) { EXPECT_EQ(shown(mln_version()), unset); }
-
 // The last text is printed up to its NUL.
 TEST(VersionParse, PrintsTwoLinesForAMalformedText) {
   for (const std::string& text :
@@ -75,12 +73,10 @@ TEST(VersionParse, KeepsTheFieldsBeforeANumberThatDoesNotFit) {
   EXPECT_EQ(shown(version), "2018|c|5|2");
 }
 
-void expect_newer(const std::string& newer, const std::string& older) {
-  const mln_version left(newer);
-  const mln_version right(older);
-  EXPECT_TRUE(left > right) << newer << " > " << older;
-  EXPECT_FALSE(right > left) << older << " > " << newer;
-  EXPECT_FALSE(left == right) << newer << " == " << older;
+void expect_newer(const mln_version& newer, const mln_version& older) {
+  EXPECT_TRUE(newer > older) << shown(newer) << " > " << shown(older);
+  EXPECT_FALSE(older > newer) << shown(older) << " > " << shown(newer);
+  EXPECT_FALSE(newer == older) << shown(newer) << " == " << shown(older);
 }
 
 TEST(VersionOrder, GoesByYearThenLettersThenMajorThenMinor) {
@@ -97,7 +93,7 @@ TEST(VersionOrder, GoesByYearThenLettersThenMajorThenMinor) {
       "2016z", "2016z.1.9", "2016za", "2017a", "10000a"};
   for (auto newer = ascending.begin(); newer != ascending.end(); ++newer)
     for (auto older = ascending.begin(); older != newer; ++older)
-      expect_newer(*newer, *older);
+      expect_newer(mln_version(*newer), mln_version(*older));
 }
 
 TEST(VersionOrder, ComparesLettersByUnsignedBytes) {
@@ -105,24 +101,17 @@ TEST(VersionOrder, ComparesLettersByUnsignedBytes) {
   mln_version high;
   low.letters = "z";
   high.letters = "\xe4";
-  EXPECT_TRUE(high > low);
-  EXPECT_FALSE(low > high);
+  expect_newer(high, low);
 }
 
 TEST(VersionOrder, HasTheUnsetValueBelowEveryParsedOne) {
-  EXPECT_TRUE(mln_version("0a") > mln_version());
-  EXPECT_FALSE(mln_version() > mln_version("0a"));
+  expect_newer(mln_version("0a"), mln_version());
   EXPECT_FALSE(mln_version() > mln_version());
   EXPECT_TRUE(mln_version() == mln_version());
 }
 
-TEST(VersionEquality, AsksForAllFourFields) {
-  const mln_version version("2016a.1.2");
-  EXPECT_TRUE(version == mln_version("2016a.1.2"));
-  EXPECT_TRUE(version == mln_version("2016a.01.002"));
-  for (const char* other :
-       {"2017a.1.2", "2016b.1.2", "2016a.2.2", "2016a.1.3", "2016a.1"})
-    EXPECT_FALSE(version == mln_version(other)) << other;
+TEST(VersionOrder, HasNumbersEqualThatAreWrittenInAnotherWay) {
+  EXPECT_TRUE(mln_version("2016a.1.2") == mln_version("2016a.01.002"));
 }
 
 }  // namespace
