@@ -45,9 +45,6 @@ void insist_on_rights(const report& told, place& here) {
       for (const char* part : {"", "/zoneinfo", "/zoneinfo/+VERSION", "/icutz"})
         parts.push_back((*set)->path + part);
 
-  // The boot's user may be any of the three.
-  constexpr mode_t open_to_all = 0555;
-  bool has_closed_part = false;
   std::string foreign;
   for (const char* path :
        {"/", "/var/db", links_directory, paths::version_record}) {
@@ -57,9 +54,10 @@ void insist_on_rights(const report& told, place& here) {
          ::getxattr(path, "system.posix_acl_access", nullptr, 0) > 0))
       foreign = path;
   }
+  // For all three kinds of users, because the boot's may be any.
+  bool has_closed_part = false;
   for (const auto& part : parts)
-    if (const auto owner =
-            here.seen.follow(part, open_to_all, open_to_all & 0444).closed) {
+    if (const auto owner = here.seen.follow(part, 0555, 0444).closed) {
       has_closed_part = true;
       if (*owner == nobody && foreign.empty()) foreign = part;
     }

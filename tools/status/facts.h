@@ -22,8 +22,7 @@ struct entry {
 
   bool operator==(const entry&) const = default;
 };
-// No more of a text is read.
-inline constexpr std::size_t longest_text = 4096;
+inline constexpr std::size_t longest_text = 4096;  // no more of one is read
 entry entry_at(const char* path);
 std::string target_of(const char* link);  // empty: it is none
 

@@ -5,6 +5,7 @@
 #include <mntent.h>
 #include <sched.h>
 #include <sys/mount.h>
+#include <sys/sendfile.h>
 #include <sys/stat.h>
 #include <sys/statvfs.h>
 #include <sys/xattr.h>
@@ -15,7 +16,6 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
-#include <filesystem>
 #include <memory>
 #include <set>
 #include <utility>
@@ -169,12 +169,15 @@ descriptor layer_over(const descriptor& lower, const std::string& name,
 // Of a file that is mounted by itself, which can have no layer.
 descriptor copy_of(const std::string& path, const std::string& name,
                    const struct stat& status, const place& here) {
-  std::error_code error;
-  std::filesystem::copy_file(path, name, error);
-  errno = error.value();
-  must(error ? -1 : 0, "a file that is mounted by itself");
+  const descriptor from(::open(path.c_str(), O_RDONLY | O_CLOEXEC));
+  must(from.number(), "a file that is mounted by itself");
+  const descriptor to(::creat(name.c_str(), 0600));
+  ssize_t count = 1;
+  while (count > 0)
+    count = ::sendfile(to.number(), from.number(), nullptr, 1 << 20);
+  must(count, "a file that is mounted by itself");
   resemble(name, status, here);
-  return clone_tree(place_at(name));
+  return clone_tree(to);
 }
 
 // For a place that is a file system of its own, or the topmost.
