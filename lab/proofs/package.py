@@ -35,6 +35,7 @@ CONTENT = {place + name: mode for mode, place, *names in map(str.split, """
     777 /usr/lib/systemd/system/sysinit.target.wants/ marlin.service->../marlin.service
     644 /usr/lib/tmpfiles.d/ marlin.conf
     444 /usr/lib/marlin/proc/sys/kernel/ domainname hostname
+    777 /usr/lib/marlin/run/host/ os-release->.os-release-stage/os-release
     444 /usr/lib/marlin/run/systemd/journal/ dev-log socket stdout
     444 /usr/lib/marlin/usr/libexec/ marlin marlin-mend
     755 /usr/libexec/ marlin marlin-mend

@@ -56,6 +56,11 @@ if(MARLIN_UNIT_DIR)
     install(DIRECTORY DESTINATION lib/marlin/${place}
             DIRECTORY_PERMISSIONS OWNER_READ OWNER_EXECUTE)
   endforeach()
+  # As systemd 257 makes it itself where a drop-in has MountAPIVFS.
+  file(CREATE_LINK .os-release-stage/os-release ${PROJECT_BINARY_DIR}/packaging/os-release
+       SYMBOLIC)
+  install(FILES ${PROJECT_BINARY_DIR}/packaging/os-release
+          DESTINATION lib/marlin/run/host)
   configure_file(packaging/marlin.service.in packaging/marlin.service @ONLY)
   install(FILES ${PROJECT_BINARY_DIR}/packaging/marlin.service
           DESTINATION ${MARLIN_UNIT_DIR})
