@@ -14,7 +14,6 @@ class LegacyIcuMigration : public DeviceTest {
   void SetUp() override {
     DeviceTest::SetUp();
     make_directory("/var/db/data");
-    make_directory("/var/db/other");
   }
 
   template <typename... Lines>
@@ -43,10 +42,10 @@ TEST_F(LegacyIcuMigration, MovesTheLegacyLinkWithItsTextUnchanged) {
 }
 
 TEST_F(LegacyIcuMigration, HasAPresentLinkThatResolvesOrADirectoryWin) {
-  make_link(icutz, "/var/db/other");
+  make_link(icutz, "/usr/share");
   make_link(legacy_icutz, "/var/db/data");
   removes_the_legacy_link();
-  EXPECT_EQ(link_at(icutz), "/var/db/other");
+  EXPECT_EQ(link_at(icutz), "/usr/share");
   make_directory(icutz);
   make_link(legacy_icutz, "/var/db/data");
   removes_the_legacy_link();

@@ -289,11 +289,8 @@ TEST_F(Installer, RefusesAnUpdateWithoutTheUsersZone) {
 
 // No update would ever fit such a device.
 TEST_F(Installer, TakesNoZoneAwayFromADeviceThatHasNone) {
-  for (const std::string zone : {"Mars/Base", "Europe", "../zoneinfo"}) {
-    wipe(tz_latest);
-    point_localtime_at(zoneinfo + "/" + zone);
-    expect_end(0, "");
-  }
+  point_localtime_at(zoneinfo + "/Mars/Base");
+  expect_end(0, "");
 }
 
 TEST_F(Installer, RefusesADirectoryThatCannotBeItsPlace) {
