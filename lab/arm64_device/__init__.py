@@ -1,4 +1,3 @@
 # SPDX-License-Identifier: BSD-2-Clause
-"""An emulated arm64 device: `parts` are what it is made of, `machine` boots it with
-its own kernel and disks, and the other modules and tests use it. scripts/device opens
-all of this."""
+"""An emulated arm64 device: `machine` boots it with its own kernel and disks, and the
+other modules and tests use it. scripts/device opens all of this."""

@@ -1,5 +1,6 @@
 # SPDX-License-Identifier: BSD-2-Clause
-"""An emulated arm64 device: its disks, its boots, and its console.
+"""An emulated arm64 device: the program, built for it, with Debian's kernel and
+busybox; its disks, its boots, and its console.
 
 The system partition is read-only and holds the program; "/var" is a disk of its own.
 The console is a file, in which every line begins with the kernel's time.
@@ -13,19 +14,21 @@ import tempfile
 from collections.abc import Callable
 from pathlib import Path
 
-from lab.arm64_device.parts import COMPANIONS, PROGRAM, WORK, part
 from lab.carriers import image, qemu
 from lab.carriers.boot import Booted, ending_of
+from lab.carriers.building import build
 from lab.carriers.namespace import build_below
 from lab.words import lines
 from lab.words.device import Device, Node, decoded
 from lab.words.paths import ICUTZ, LOCALTIME, TZ_LATEST, ZONEINFO
+from lab.words.places import BUILD
 from lab.words.seen import Entries
 
+WORK, BUILT = BUILD / "emulator", BUILD / "arm64-release"
+PROGRAMS = "marlin", "tools/marlin-install", "tools/marlin-mend"
 GUEST = Path(__file__).parent / "guest"
 MODULES = ("drivers/virtio/virtio_ring", "drivers/virtio/virtio",
-           "drivers/virtio/virtio_mmio", "drivers/block/virtio_blk",
-           "fs/overlayfs/overlay")
+           "drivers/virtio/virtio_mmio", "drivers/block/virtio_blk")
 # What fills the disk of "/var", in the language of the device's shell.
 NO_BLOCK = """
 dd if=/dev/zero of=/var/filler bs=65536 2>/dev/null
@@ -40,12 +43,19 @@ NO_FILLER = "rm -rf /var/filler*\n"
 LINKS = (ZONEINFO, ICUTZ, LOCALTIME, TZ_LATEST)
 
 
+def prepare():
+    """Builds and fetches what is missing; or raises qemu.Unavailable."""
+    with qemu.preparing(qemu.ARM64, WORK, "build", "arm64", "device"):
+        build("arm64-release")
+
+
 def with_shell(folders: str, programs: dict[str, Path]) -> Device:
     """Empty folders, and programs by their places."""
     made = Device()
     for name in folders.split():
         made.directory(f"/{name}")
-    for path, program in {"/bin/busybox": part("bin/busybox"), **programs}.items():
+    busybox = qemu.part(WORK, "bin/busybox")
+    for path, program in {"/bin/busybox": busybox, **programs}.items():
         made.file(path, decoded(program.read_bytes()), 0o755)
     return made
 
@@ -66,7 +76,7 @@ def system_partition(device: Device) -> Node:
     """The program, a shell, and the system's own data."""
     system = with_shell("dev proc run sys tmp", {
         "/sbin/boot": GUEST / "boot",
-        **{f"/sbin/{program.name}": program for program in (PROGRAM, *COMPANIONS)}})
+        **{f"/sbin/{Path(name).name}": BUILT / name for name in PROGRAMS}})
     system.file("/etc/passwd", "owner:x:1:1::/:/run/bin/sh\n")
     system.put("/usr/share", device.find("/usr/share"))
     return system.root
@@ -163,7 +173,7 @@ class Machine:
         emulator's block device instead of the plain image, `more` are words for it."""
         make_first_memory(self.memory, script)
         return qemu.start(
-            qemu.ARM64, part("vmlinuz-*"), 256, self.console,
+            qemu.ARM64, qemu.part(WORK, "vmlinuz-*"), 256, self.console,
             f"loglevel=5 printk.devkmsg=on {options}", "-initrd", self.memory,
             "-blockdev", f"{plain('system', self.system)},read-only=on",
             "-blockdev", disk or plain("var", self.var),

@@ -6,7 +6,7 @@ scenes."""
 
 import pytest
 
-from lab.arm64_device.machine import ending
+from lab.arm64_device.machine import Machine, ending
 from lab.carriers import image
 from lab.oracles import side_by_side
 from lab.words.chosen_devices import CHOSEN
@@ -18,9 +18,9 @@ BOOT_EACH = side_by_side.each("/var/chosen/*", """
 
 
 @pytest.fixture(scope="module")
-def looks(machine):
+def looks():
     """Two looks at the disk, with a boot of every chosen device in between."""
-    here = machine("chosen")
+    here = Machine("chosen")
     here.build(sound_device(), owner=1, chosen=side_by_side.disk(
         {name: make() for name, make in CHOSEN.items()}))
     before = image.look(here.var, "/chosen", "")

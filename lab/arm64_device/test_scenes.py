@@ -71,8 +71,8 @@ class Scene:
 
 
 @pytest.fixture
-def scene(machine, request):
-    return Scene(machine("scenes/" + request.node.name))
+def scene(request):
+    return Scene(Machine("scenes/" + request.node.name))
 
 
 # --- What only a real disk does -------------------------------------------------------

@@ -15,28 +15,16 @@ import time
 from lab.bench.costs import costs, instructions, peak, run
 from lab.carriers import namespace
 from lab.oracles.installer import SOURCE, put_update
-from lab.words.chosen_devices import activation
-from lab.words.device import Device, sound_device
-from lab.words.paths import DOWNLOADS, LOCALTIME
+from lab.words.chosen_devices import FIRST, made
+from lab.words.device import sound_device
+from lab.words.paths import DOWNLOADS
 from lab.words.seen import as_device
 
 
-def in_use(version: str) -> Device:
-    device = sound_device()
-    device.install_update(version)
-    device.point_links_at(version)
-    return device
-
-
-def bad_localtime() -> Device:
-    device = sound_device()
-    device.link(LOCALTIME, "/nowhere")
-    return device
-
-
-SCENES = {"quiet": sound_device, "update": lambda: in_use("2024a.1.0"),
-          "activation": activation, "reset": lambda: in_use("2022a.1.0"),
-          "localtime": bad_localtime}
+SCENES = {name: functools.partial(made, changes) for name, changes in {
+    "quiet": "", "update": "install_update 2024a.1.0; point_links_at 2024a.1.0",
+    "activation": FIRST, "reset": "install_update 2022a.1.0; point_links_at 2022a.1.0",
+    "localtime": "link LOCALTIME /nowhere"}.items()}
 
 
 def placed(scene: str, programs) -> list[str]:
@@ -85,7 +73,7 @@ def companions(marlin: str, install: str, mend: str) -> dict:
                          if path.startswith(SOURCE)),
             "install": [min(times), peak(install, SOURCE)[0]],
             "quiet": [costs(command, functools.partial(
-                namespace.build, in_use("2024a.1.0")))
+                namespace.build, SCENES["update"]()))
                 for command in placed("quiet", [marlin, mend])]}
 
 

@@ -15,12 +15,6 @@ LOCALTIME_INVALID = lines.LOCALTIME_INVALID % DEFAULT_ZONE
 NEW = (lines.BAD_LINK % "", lines.INVALID_LINKS, LOCALTIME_INVALID)
 ZONE = "Europe/Lisbon"  # the one that an update changes
 
-# In a shell, in the root directory of a system, booted or not.
-INSTALL_UPDATE = f"""
-mkdir -p .{DOWNLOADS}
-cp -R usr/lib/lab/data/update .{DOWNLOADS}{{update}}
-"""
-
 
 def names():
     return real_data.names()
@@ -47,16 +41,20 @@ def links(made: Device) -> dict[str, str]:
     return {path: node.text for path, node in made.everything() if node.kind == "link"}
 
 
-def install_update() -> str:
-    return "cd /\n" + install_update_here()
+def install() -> str:
+    """In the root directory of a system, booted or not."""
+    return (f"mkdir -p .{DOWNLOADS}\n"
+            f"cp -R usr/lib/lab/data/update .{DOWNLOADS}{names().update}\n")
 
 
-def install_update_here() -> str:
-    return INSTALL_UPDATE.format(update=names().update)
+def updated(made: Device | None = None) -> str:
+    """An update is installed there, and announced, or the links are others."""
+    return install() + linked(made or device(announced=True))
 
 
-def announce() -> str:
-    return f"ln -sfn {DOWNLOADS}{names().update} {TZ_LATEST}\n"
+def install_and_announce() -> str:
+    """On a booted system."""
+    return f"cd /\n{install()}ln -sfn {DOWNLOADS}{names().update} {TZ_LATEST}\n"
 
 
 def pattern(text: str) -> str:

@@ -6,17 +6,16 @@ from lab.carriers import image
 from lab.carriers.boot import ending_of
 from lab.debian_systems.machine import System, UNIT
 from lab.oracles import side_by_side
-from lab.words.chosen_devices import CHOSEN, activation
+from lab.words.chosen_devices import CHOSEN, NEXT, made
 from lab.words.device import Device, Node
-from lab.words.paths import ICUTZ, SYSTEM_ZONEINFO, ZONEINFO, update_path
+from lab.words.paths import ICUTZ, ZONEINFO
 from lab.words.seen import Entries
 
 MEND = f"/usr/share/doc/marlin/examples/{UNIT}.d/mend.conf"
-MIXED = {f"mixed {number}": links for number, links in enumerate([
-    (f"{update_path('2024a.1.0')}/zoneinfo", f"{update_path('2023d.1.0')}/icutz"),
-    (f"{update_path('2024a.1.0')}/zoneinfo", None),
-    (SYSTEM_ZONEINFO, f"{update_path('2023d.1.0')}/icutz"),
-    (SYSTEM_ZONEINFO, f"{update_path('gone')}/icutz")])}
+MIXED = {f"mixed {number}": f"{NEXT} drop ICUTZ; {to}" for number, to in enumerate([
+    "link ZONEINFO U/zoneinfo; link ICUTZ OLD/icutz", "link ZONEINFO U/zoneinfo",
+    "link ZONEINFO SYSTEM; link ICUTZ OLD/icutz",
+    "link ZONEINFO SYSTEM; link ICUTZ TZ/gone/icutz"])}
 MENDED = f"marlin-mend: {ZONEINFO} did not fit {ICUTZ}; marlin makes both anew\n"
 
 # Different from the unit, on purpose: a call that it refuses kills here, so that no
@@ -49,15 +48,6 @@ systemctl daemon-reload
 """
 
 
-def mixed(zoneinfo: str, icutz: str | None) -> Device:
-    device = activation("2023d.1.0")
-    device.link(ZONEINFO, zoneinfo)
-    device.drop(ICUTZ)
-    if icutz:
-        device.link(ICUTZ, icutz)
-    return device
-
-
 def ending(status: str) -> str:
     exited, number = map(int, status.split())
     return ending_of(number << 8 if exited == 1 else number)
@@ -65,7 +55,7 @@ def ending(status: str) -> str:
 
 def test_every_device():
     chosen = {name: make() for name, make in CHOSEN.items()}
-    links_of_two = {name: mixed(*links) for name, links in MIXED.items()}
+    links_of_two = {name: made(changes) for name, changes in MIXED.items()}
     system = System("chosen")
     image.build(system.third, Node("dir", 0o755, entries={
         "chosen": side_by_side.disk(chosen), "mixed": side_by_side.disk(links_of_two)}),
@@ -81,8 +71,8 @@ def test_every_device():
     looks, with_the_mend = zip(before, look())
     for name, make in CHOSEN.items():
         side_by_side.judge(name, make(), looks, ending)
-    for name, links in MIXED.items():
-        device = mixed(*links)
+    for name, changes in MIXED.items():
+        device = made(changes)
         as_mended(f"/{side_by_side.directory(name)}", device, *with_the_mend)
         side_by_side.judge(name, device, with_the_mend, ending)
 

@@ -4,8 +4,7 @@
 import pytest
 
 from lab.debian_systems.machine import System, UNIT, message
-from lab.debian_systems.scene import (device, fail, insist, install_update_here, linked,
-                                      names)
+from lab.debian_systems.scene import device, fail, insist, names, updated
 from lab.words.paths import DOWNLOADS
 
 # Nothing of the word that was there: a line end would be the end of this one, too.
@@ -17,7 +16,7 @@ def test_a_terabyte_for_a_word():
     kernel itself would refuse none, and end the program later."""
     update = names().update
     system = System("terabyte", f"""
-        {install_update_here()} {linked(device(announced=True))}
+        {updated()}
         {TERABYTE.format(tree=DOWNLOADS + update)}""")
     seen = system.boot(options="sysctl.vm.overcommit_memory=1")
     insist(seen, (), device(active=True, announced=True), reader="14:00 CEST",
@@ -56,7 +55,7 @@ def test_an_update_on_a_disk_that_never_answers():
     update = names().update
     place = DOWNLOADS + update
     system = System("never-answers", f"""
-        {install_update_here()} {linked(device(announced=True))}
+        {updated()}
         echo '/dev/nvme1n1 {place} ext4 ro 0 0' >etc/fstab
         cat >etc/systemd/system/used-up.service <<'END'
 {USED_UP.format(place=place)}END

@@ -4,8 +4,8 @@
 import json
 
 from lab.debian_systems.machine import System, UNIT
-from lab.debian_systems.scene import (NEW, ZONE, announce, device, insist,
-                                      install_update, links, names)
+from lab.debian_systems.scene import (NEW, ZONE, device, insist, install_and_announce,
+                                      links, names)
 from lab.words import lines
 from lab.words.paths import (DEFAULT_ZONE, DOWNLOADS, ICUTZ, LOCALTIME, RECORD,
                              TIMEZONE, TZ_LATEST, ZONEINFO)
@@ -38,7 +38,7 @@ def test_from_its_first_boot_on():
     system, update = System("life"), names().update
     seen = system.boot(f"""
         ln -sfn {ZONEINFO}/{ZONE} {LOCALTIME}
-        {install_update()} {announce()}
+        {install_and_announce()}
         chown installer: {DOWNLOADS} && chmod 775 {DOWNLOADS}
         {ASKED}""")
     first = device(zone=DEFAULT_ZONE)

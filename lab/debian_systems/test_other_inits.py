@@ -6,7 +6,7 @@ import pytest
 
 from lab.debian_systems.machine import Seen, System
 from lab.debian_systems.parts import CHOSEN
-from lab.debian_systems.scene import device, install_update_here, linked, links, names
+from lab.debian_systems.scene import device, links, names, updated
 from lab.words import lines
 from lab.words.paths import ICUTZ, ZONEINFO
 
@@ -78,7 +78,7 @@ def test_an_update_and_a_forged_line(init):
     through; the boot after that is quiet."""
     update = names().update
     here = System(init, INITS[init] + f"""
-        {install_update_here()} {linked(device(announced=True))}
+        {updated()}
         ln -sfn "$(printf '/x\\033[31m')" .{ZONEINFO}
         echo '/dev/nvme0n3 /var ext4 defaults 0 0' >etc/fstab""", apart="var")
     seen = here.boot("rm /var/db/timezone/tz_latest", DEVICES)
@@ -102,7 +102,7 @@ def test_links_of_two_data_sets(init):
     made = device(active=True, announced=True)
     made.drop(ICUTZ)
     here = System(f"{init}-mend", INITS[init] + f"""
-        {install_update_here()} {linked(made)}
+        {updated(made)}
         sed -i 's,{off},{on},' etc/{file}
         awk 'length > 255 {{ exit 1 }}' etc/{file}
         grep -qF '{on}' etc/{file}

@@ -7,8 +7,7 @@ import re
 import pytest
 
 from lab.debian_systems.machine import Seen, System, UNIT, message
-from lab.debian_systems.scene import (ZONE, device, fail, insist, install_update_here,
-                                      linked, names)
+from lab.debian_systems.scene import ZONE, device, fail, insist, linked, names, updated
 from lab.words import lines
 from lab.words.paths import LOCALTIME, RECORD, SYSTEM_ZONEINFO, ZONEINFO
 
@@ -123,7 +122,7 @@ def test_a_record_that_is_a_link(enforced):
     """Only the profile forbids to write to what it names, and nothing else."""
     other, update = "/var/db/other", names().update
     system = System(f"apparmor-{enforced}", f"""
-        {install_update_here()} {linked(device(announced=True))}
+        {updated()}
         echo kept >.{other}
         ln -s {other} .{RECORD}
         ln -sfn /usr/share/zoneinfo/{ZONE} .{LOCALTIME}

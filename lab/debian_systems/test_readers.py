@@ -5,8 +5,7 @@
 import pytest
 
 from lab.debian_systems.machine import System
-from lab.debian_systems.scene import (ZONE, announce, device, insist, install_update,
-                                      linked)
+from lab.debian_systems.scene import ZONE, device, insist, install_and_announce, linked
 from lab.words.paths import ZONEINFO
 
 pytestmark = pytest.mark.rest
@@ -40,7 +39,7 @@ def noon_and_zone(hour: int, zone: str) -> str:
 def test_an_update():
     system = System("readers", LINKS + linked(device()))
     for links, noon, reader, then in (
-            (device(), 11, "13:00 WEST", f"{install_update()} {announce()}"),
+            (device(), 11, "13:00 WEST", install_and_announce()),
             (device(active=True, announced=True), 10, "14:00 CEST", REPLACED)):
         seen = system.boot(ASKED + then)
         insist(seen, (), links, reader=reader)

@@ -9,8 +9,8 @@ import pytest
 from lab.carriers.building import build
 from lab.debian_systems.machine import message, System, UNIT
 from lab.debian_systems.parts import CHOSEN
-from lab.debian_systems.scene import (announce, device, insist, install_update,
-                                      install_update_here, linked, names, NEW)
+from lab.debian_systems.scene import (NEW, device, insist, install_and_announce, linked,
+                                      names, updated)
 from lab.words import lines
 from lab.words.device import Device
 from lab.words.paths import DEFAULT_ZONE, ICUTZ, ZONEINFO
@@ -61,10 +61,6 @@ END
 """
 
 
-def updated() -> str:
-    return install_update_here() + linked(device(announced=True))
-
-
 class Start(NamedTuple):
     change: str = ""
     options: str = ""
@@ -87,7 +83,7 @@ def starts() -> dict[str, Start]:
         "a link to a data partition": Start(updated() + ELSEWHERE + DROP_IN, "", (),
                                             None, "14:00 CEST"),
         "the mend": Start(
-            install_update_here() + linked(mixed) + MEND, "",
+            updated(mixed) + MEND, "",
             (f" marlin-mend: {ZONEINFO} did not fit {ICUTZ}; marlin makes both anew",
              *NEW[:2]), device(active=True, announced=True), "14:00 CEST"),
         "no ICU data": Start(
@@ -179,7 +175,7 @@ def test_a_soft_reboot():
         sed -i /^FailureAction/d usr/lib/systemd/system/lab.service""").boot(f"""
         [ -e /run/again ] && exit
         touch /run/again
-        {install_update()} {announce()}
+        {install_and_announce()}
         systemctl soft-reboot
         sleep 1000""")
     assert len(seen.started()) == 2 and seen.text("reader") == "14:00 CEST\n"

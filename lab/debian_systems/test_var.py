@@ -4,8 +4,7 @@
 import pytest
 
 from lab.debian_systems.machine import System, UNIT, message
-from lab.debian_systems.scene import (NEW, device, fail, insist, install_update_here,
-                                      linked, names)
+from lab.debian_systems.scene import NEW, device, fail, insist, linked, names, updated
 from lab.words import lines
 from lab.words.paths import DEFAULT_ZONE, SYSTEM_ZONEINFO, ZONEINFO
 
@@ -21,7 +20,7 @@ ExecStart=/bin/sleep 5
 
 def with_update(fstab: str, more="") -> str:
     return f"""
-        {install_update_here()} {linked(device(announced=True))}
+        {updated()}
         echo '{fstab}' >etc/fstab
         {more}"""
 

@@ -43,7 +43,7 @@ def main() -> int:
     os.environ["MARLIN_SYSTEMS"] = options.on
     # After the options are understood: these take pytest.
     import pytest
-    from lab.arm64_device import parts
+    from lab.arm64_device import machine
     from lab.bench import boot_cost, unit_cost
     from lab.carriers.qemu import Unavailable
     from lab.debian_systems import parts as systems
@@ -58,7 +58,7 @@ def main() -> int:
         if options.unit_cost:
             unit_cost.measure()
             return 0
-        parts.prepare()
+        machine.prepare()
         if options.tests is not None:
             return pytest.main([*run, "loadfile",
                                 *(options.tests or ["lab/arm64_device",

@@ -11,24 +11,19 @@ The report is build/coverage/report/index.html. Exit status: 0 when everything i
 covered, 1 when a test fails or something is not, 2 for bad use.
 """
 
-import json
 import os
 import shutil
+import subprocess
 from concurrent.futures import ThreadPoolExecutor
 from pathlib import Path
 
 from lab.carriers.building import build, locked, need, quietly
 from lab.words.command import Options, stop
-from lab.words.places import BUILD, shown
+from lab.words.places import BUILD, PROJECT, shown
 
 FOLDER = BUILD / "coverage"
 REPORT = FOLDER / "report"
 LOG = FOLDER / "log"
-
-
-def gcovr(*options):
-    quietly(LOG, "gcovr", "--root", ".", "--filter", "driver/", "--filter", "dataset/",
-            "--filter", "support/", *options)
 
 
 def run_tests(program: Path):
@@ -39,7 +34,8 @@ def run_tests(program: Path):
             "--gtest_filter=-*CannotBeWrittenWhole*:WholeListOfCalls.*")
 
 
-def measure():
+def measure() -> int:
+    """What gcovr says of it, and how it ended."""
     shutil.rmtree(REPORT, ignore_errors=True)
     build("coverage")
     for counters in FOLDER.rglob("*.gcda"):
@@ -48,32 +44,24 @@ def measure():
         list(together.map(run_tests, FOLDER.glob("tests/*_test")))
     REPORT.mkdir()
     # An object that was built but never ran counts as well: all of it is missing.
-    gcovr("--object-directory", FOLDER, "--exclude-directories", ".*/CompilerIdCXX",
-          "--exclude-throw-branches", "--exclude-unreachable-branches",
-          "--exclude-lines-by-pattern", r"\s*}$",
-          "--exclude-branches-by-pattern", r".*dynamic_cast<[^>]*\*>\(&",
-          "--html-details", REPORT / "index.html", "--json", REPORT / "data.json",
-          "--json-summary", REPORT / "summary.json", FOLDER)
+    return subprocess.call([
+        "gcovr", "--root", PROJECT, "--filter", "driver/", "--filter", "dataset/",
+        "--filter", "support/",
+        "--object-directory", FOLDER, "--exclude-directories", ".*/CompilerIdCXX",
+        "--exclude-throw-branches", "--exclude-unreachable-branches",
+        "--exclude-lines-by-pattern", r"\s*}$",
+        "--exclude-branches-by-pattern", r".*dynamic_cast<[^>]*\*>\(&",
+        "--html-details", REPORT / "index.html", "--txt", "--branches",
+        "--print-summary", "--fail-under-line=100", "--fail-under-branch=100", FOLDER],
+        cwd=PROJECT)
 
 
 def main():
     Options(__doc__).parse_args()
     need("build", "private-device", "test", "coverage")
     with locked(FOLDER):
-        measure()
-        figures = json.loads((REPORT / "summary.json").read_text())
-    told, complete = [], True
-    for kind, name in (("line", "lines"), ("branch", "branches")):
-        covered, total = figures[f"{kind}_covered"], figures[f"{kind}_total"]
-        told.append(f"{covered} of {total} {name}")
-        complete = complete and covered == total > 0
-    if not complete:
-        for option in ([], ["--branches"]):
-            gcovr("--add-tracefile", REPORT / "data.json", *option)
-            print(LOG.read_text(), end="")
-    print("coverage:", ", ".join(told), flush=True)
-    if not complete:
-        stop(1, f"not complete; see {shown(REPORT / 'index.html')}")
+        if measure():
+            stop(1, f"not complete; see {shown(REPORT / 'index.html')}")
 
 
 if __name__ == "__main__":

@@ -22,13 +22,13 @@ from lab.arm64_device.machine import Console, Machine, plain, shown_links
 from lab.carriers import image
 from lab.oracles import model
 from lab.oracles.installer import HIDDEN, announced, below, put_update
-from lab.oracles.sets import link, mixed, names_of, needed
+from lab.oracles.sets import mixed, names_of, needed
 from lab.oracles.trial import log_differences
 from lab.proofs import life
 from lab.proofs.life import RELEASES, update_name
 from lab.words.device import sound_device
 from lab.words.paths import (DOWNLOADS, FORMER_ZONEINFO, ICUTZ, LEGACY_ICUTZ, LOCALTIME,
-                             OLD_ICU, RECORD, SYSTEM_ZONEINFO, TIMEZONE, TZ_LATEST,
+                             OLD_ICU, RECORD, TIMEZONE, TZ_LATEST,
                              ZONEINFO, update_path)
 from lab.words.seen import Entries, as_device
 
@@ -95,15 +95,6 @@ def insist(found: list[str]):
         raise RuntimeError("; ".join(found))
 
 
-def described(entries: Entries) -> str:
-    """The state of the two links in words."""
-    names = {"": "missing", SYSTEM_ZONEINFO: "the system's"} | {
-        f"{update_path(update_name(release))}/{name}": "an update's"
-        for release in RELEASES for name in ("zoneinfo", "icutz")}
-    tree, icu = (names[link(entries, path)] for path in (ZONEINFO, ICUTZ))
-    return f"{tree}, icutz {icu}" + ", MIXED" * mixed(entries)
-
-
 def kind_of_record(entries: Entries) -> str:
     """A record is written and never synced: the disk may know of the file but not
     of its bytes yet; the next activation writes it anew."""
@@ -129,7 +120,7 @@ def check_recovery(console: Console, found: Entries, mend: bool) -> Entries:
             for text in shown_links(device) + [f"reader sees {zone}"]
             if text not in console.said])
     after = dict(device.everything())
-    insist([f"with the mend: {described(after)}"] * (mend and mixed(after)))
+    insist(["links of two sets with the mend"] * (mend and mixed(after)))
     return after
 
 
@@ -277,7 +268,7 @@ def run(count: int, seed: int | None = None):
             for _ in range(count):
                 happening, lost = victim.cut()
                 told = ["power cut", f"during: {happening.split()[0]}",
-                        f"then zoneinfo is {described(victim.found)}",
+                        *["then links of two sets"] * mixed(victim.found),
                         f"then the record is {kind_of_record(victim.found)}",
                         *["lost blocks that had been written"] * (lost > 0)]
                 victim.totals.update(told)

@@ -16,7 +16,7 @@ from lab.bench.costs import instructions, peak
 from lab.carriers import boot, namespace
 from lab.oracles import model
 from lab.oracles.trial import entry_differences, fail, log_differences
-from lab.words.chosen_devices import activation
+from lab.words.chosen_devices import NEXT, announced, in_use, made
 from lab.words.device import Device, Node, decoded
 from lab.words.paths import (ICUTZ, LEGACY_ICUTZ, LOCALTIME, RECORD, SYSTEM_ICU,
                              SYSTEM_ZONEINFO, TZ_LATEST, ZONEINFO, update_path)
@@ -85,7 +85,7 @@ class Load:
 
 
 def with_file(path, text):
-    device = activation("2023d.1.0")
+    device = made(NEXT)
     device.file(path, text)
     return device
 
@@ -105,7 +105,7 @@ def test_a_huge_file(load, path, what, text, bytes_each):
 
 def test_an_icu_directory_with_nothing_that_counts(load):
     def crowded(number):
-        device = activation("2023d.1.0")
+        device = made(NEXT)
         device.drop(f"{UPDATE}/icutz/icutz44l.dat")
         entries = device.directory(f"{UPDATE}/icutz").entries
         for at in range(number):
@@ -119,19 +119,15 @@ def test_an_icu_directory_with_nothing_that_counts(load):
 @pytest.mark.parametrize("data_first", [False, True])
 def test_a_deep_tree(load, data_first):
     """It stands beside the ICU data, before it and after it in the listing."""
-    device = activation("2023d.1.0")
-    icu = f"{UPDATE}/icutz"
-    if not data_first:
-        device.drop(f"{icu}/icutz44l.dat")
-    device.file(icu + "/d" * 1000 + "/icutz45l.dat", "ICU")
-    device.file(f"{icu}/icutz44l.dat", "ICU")
-    load.boot("a tree 1000 levels deep in an ICU directory", device)
+    load.boot("a tree 1000 levels deep in an ICU directory", made(
+        NEXT + "drop U/icutz/icutz44l.dat;" * (not data_first)
+        + f"file U/icutz/{'d/' * 1000}icutz45l.dat ICU; file U/icutz/icutz44l.dat ICU"))
 
 
 def test_a_tree_deeper_than_any_path(load):
     """Its path would be longer than fts(3) can hold. Nothing below counts: it must
     not keep the data beside it from being found."""
-    namespace.build(activation("2023d.1.0"))
+    namespace.build(made(NEXT))
     with contextlib.chdir(f"{UPDATE}/icutz"):
         for _ in range(1000):
             os.mkdir("d" * 100)
@@ -149,7 +145,8 @@ def test_a_tree_deeper_than_any_path(load):
 def test_the_longest_name_of_an_update(load):
     version = "2024" + "a" * 247 + ".1.0"
     assert len(version) == 255
-    load.boot("an update with a name of 255 bytes", activation("2023d.1.0", version))
+    load.boot("an update with a name of 255 bytes",
+              made(in_use("2023d.1.0") + announced(version)))
 
 
 def padded(start, end, length):
@@ -170,7 +167,7 @@ def padded(start, end, length):
     (LEGACY_ICUTZ, SYSTEM_ICU, ".", [ICUTZ, TZ_LATEST]),  # to be migrated
 ])
 def test_a_long_link_target(load, path, start, end, without, length):
-    device = activation("2023d.1.0")
+    device = made(NEXT)
     for other in without:
         device.drop(other)
     device.link(path, padded(start, end, length))
@@ -185,7 +182,7 @@ def test_a_link_to_a_device(load, path, target):
     """It counts as nothing to read, and as nothing to write to."""
     if not stat.S_ISCHR(os.stat(target).st_mode):
         pytest.skip(f"on this machine {target} is not a device")
-    device = activation("2023d.1.0")
+    device = made(NEXT)
     device.link(path, target)
     namespace.build(device)
     device.put(path, Node("device"))

@@ -18,12 +18,6 @@ def announced(version: str) -> str:
     return f"install_update {version}; announce {version};"
 
 
-def activation(current: str | None = None, update="2024a.1.0") -> Device:
-    """An update is announced; `current`, if any, is the one in use."""
-    return change(sound_device(), (in_use(current) if current else "")
-                  + announced(update))
-
-
 FIRST = announced("2024a.1.0")  # the system's data is in use
 NEXT = in_use("2023d.1.0") + FIRST
 STAYS = in_use("2024a.1.0") + FIRST
