@@ -9,28 +9,28 @@ printed but what was found, to be the same as the file.
 
 from __future__ import annotations
 
+import calendar
 import contextlib
-import datetime
 import difflib
 import os
 import shutil
 import signal
 import subprocess
 import sys
-import zoneinfo
 from pathlib import Path
 
 from lab.carriers import boot, namespace, real_data, releases
 from lab.demo import screen
 from lab.words import lines
 from lab.words.device import Device
-from lab.words.paths import (DEFAULT_ZONE, DOWNLOADS, FORMER_ZONEINFO, ICUTZ, LOCALTIME,
+from lab.words.paths import (DOWNLOADS, FORMER_ZONEINFO, ICUTZ, LOCALTIME,
                              RECORD, SYSTEM_ICU, SYSTEM_ZONEINFO, TIMEZONE, TZ_LATEST,
                              ZONEINFO, update_path)
 from lab.words.seen import Entries, Seen, as_device
 
 ROWS = {"zoneinfo": ZONEINFO, "icutz": ICUTZ, "localtime": LOCALTIME,
         "tz_latest": TZ_LATEST, "record": RECORD}
+NOON = str(calendar.timegm((releases.YEAR, 2, 1, 12, 0, 0)))
 COMPANIONS = Path(boot.PROGRAM).parent / "tools"
 FACTS = Path(__file__).with_name("facts").read_text(encoding="ascii").splitlines()
 
@@ -124,8 +124,6 @@ class Story:
     def __init__(self):
         self.device = Device()  # as it is to be at the next boot
         self.names = real_data.names()
-        self.noon = datetime.datetime(releases.YEAR, 2, 1, 12,
-                                      tzinfo=datetime.timezone.utc)
         self.scenes = 0
         self.facts = []  # as they were found
         self.told = {}  # by marlin-install, since the last boot
@@ -205,13 +203,9 @@ class Story:
 
     def note(self, fact: str):
         """Keeps what was found, in the same words for the data of every machine."""
-        with open(real_data.TARGET / "system/zoneinfo" / DEFAULT_ZONE, "rb") as file:
-            noon = self.noon.astimezone(zoneinfo.ZoneInfo.from_file(file))
-        there = "<noon in the default zone>"
-        for found, told in (
-                (self.names.update, "<update>"), (self.names.refused, "<refused>"),
-                (f"{self.names.system}.1.0", "<system>"), (f"{noon:%H:%M %Z}", there),
-                (f"{noon:%H:%M} {noon.isoformat()[-6:]}", there)):
+        for found, told in ((self.names.update, "<update>"),
+                            (self.names.refused, "<refused>"),
+                            (f"{self.names.system}.1.0", "<system>")):
             fact = fact.replace(found, told)
         self.facts.append(fact)
 
@@ -220,15 +214,14 @@ class Story:
         rows = {name: stands(entries, path) for name, path in ROWS.items()}
         if rows["record"] == "(a plain file)":
             rows["record"] = entries[RECORD].text
-        seconds = f"{self.noon.timestamp():.0f}"
-        clock = output("date", "-d", f"@{seconds}", "+%H:%M %Z", TZ=f":{LOCALTIME}")
+        clock = output("date", "-d", f"@{NOON}", "+%H:%M %Z", TZ=f":{LOCALTIME}")
         # Without a zone file there is no name of a zone, and the hour is UTC's.
         rows["clock"] = clock[:-1] + ", no zone" if clock.endswith(" ") else clock
         rows["ICU clock"] = "no zone"
         if rows["localtime"].startswith(f"{ZONEINFO}/"):
             zone = rows["localtime"].removeprefix(f"{ZONEINFO}/")
             rows["ICU clock"] = " ".join(output(
-                str(real_data.ICU_CLOCK), zone, input=seconds, ICU_DATA=SYSTEM_ICU,
+                str(real_data.ICU_CLOCK), zone, input=NOON, ICU_DATA=SYSTEM_ICU,
                 ICU_TIMEZONE_FILES_DIR=ICUTZ).split()[:2])
         return rows
 
