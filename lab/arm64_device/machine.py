@@ -8,7 +8,6 @@ The console is a file, in which every line begins with the kernel's time.
 
 import os
 import re
-import shutil
 import subprocess
 import tempfile
 from collections.abc import Callable
@@ -16,7 +15,7 @@ from pathlib import Path
 
 from lab.carriers import image, qemu
 from lab.carriers.boot import Booted, ending_of
-from lab.carriers.building import build
+from lab.carriers.building import build, room
 from lab.carriers.namespace import build_below
 from lab.words import lines
 from lab.words.device import Device, Node, decoded
@@ -142,9 +141,7 @@ class Machine:
     """One device, in a directory of its own. `device` describes it."""
 
     def __init__(self, name: str):
-        self.directory = WORK / name
-        shutil.rmtree(self.directory, ignore_errors=True)
-        self.directory.mkdir(parents=True)
+        self.directory = room(WORK / name)
         self.system, self.var, self.memory, self.console = (
             self.directory / part for part in
             ("system.img", "var.img", "memory", "console"))

@@ -15,7 +15,8 @@ from lab.arm64_device.machine import Machine, NO_BLOCK, NO_FILLER, NO_INODE, sho
 from lab.carriers import image
 from lab.oracles.trial import differences, fail
 from lab.words import lines
-from lab.words.device import Device, Node, sound_device
+from lab.words.chosen_devices import made
+from lab.words.device import Device, Node
 from lab.words.paths import (ICUTZ, RECORD, SYSTEM_ZONEINFO, TIMEZONE, ZONEINFO,
                              update_path)
 from lab.words.seen import Seen
@@ -26,11 +27,8 @@ REFUSED = lines.NOT_NEWER % (UPDATE, UPDATE)
 NO_ZONEINFO = (lines.BAD_LINK % "", lines.INVALID_LINKS)
 
 
-def updated() -> Device:
-    """An update has been downloaded."""
-    device = sound_device()
-    device.install_update(UPDATE)
-    return device
+DOWNLOADED = f"install_update {UPDATE};"
+IN_USE = f"{DOWNLOADED} point_links_at {UPDATE}"
 
 
 def activate(device: Device):
@@ -43,9 +41,9 @@ class Scene:
     def __init__(self, machine: Machine):
         self.machine, self.boots = machine, 0
 
-    def on(self, device: Device, *options: str) -> Device:
-        self.machine.build(device, *options)
-        return device
+    def on(self, changes: str, *options: str) -> Device:
+        self.machine.build(made(changes), *options)
+        return self.machine.device
 
     def boot(self, *printed, ending="exit 0", reader=None, then=None, **how):
         """Boots, and compares. `printed` are texts, or pairs of a text and the error
@@ -80,7 +78,7 @@ def scene(request):
 
 def test_disk_without_a_free_block(scene):
     """Links fit into their inodes; only the record finds no room."""
-    device = scene.on(updated())
+    device = scene.on(DOWNLOADED)
     scene.boot(reader=SYSTEM, then=lambda: device.announce(UPDATE), script=NO_BLOCK)
     activate(device)
     device.file(RECORD, "")
@@ -89,7 +87,7 @@ def test_disk_without_a_free_block(scene):
 
 
 def test_disk_without_a_free_inode(scene):
-    device = scene.on(updated(), "-N", "64")
+    device = scene.on(DOWNLOADED, "-N", "64")
     scene.boot(reader=SYSTEM, then=lambda: device.announce(UPDATE), script=NO_INODE)
     # The old zoneinfo link's inode serves the new one; for icutz there is none.
     device.point_links_at(None)
@@ -107,7 +105,7 @@ def link_fails(target, remove, create):
 
 
 def test_read_only_disk(scene):
-    device = scene.on(updated())
+    device = scene.on(DOWNLOADED)
     scene.boot(reader=SYSTEM, options="var=ro")
     scene.boot(reader=SYSTEM, then=lambda: device.announce(UPDATE))
     read_only = errno.EROFS, errno.EEXIST
@@ -120,9 +118,7 @@ def test_read_only_disk(scene):
 
 def test_disk_with_a_bad_sector(scene):
     """Where the directory of the links should be there is only an I/O error."""
-    device = updated()
-    device.point_links_at(UPDATE)
-    scene.on(device)
+    scene.on(IN_USE)
     var = scene.machine.var
     [blocks] = image.debugfs(var, f'blocks "{TIMEZONE.removeprefix("/var")}"')
     bad = ("driver=raw,node-name=var,file.driver=blkdebug,"
@@ -140,9 +136,7 @@ def test_disk_with_a_bad_sector(scene):
 def test_disk_with_a_lost_link(scene):
     """The name of the zoneinfo link leads to an inode that is gone; the disk goes
     read-only on the first error, until it is repaired."""
-    device = updated()
-    device.point_links_at(UPDATE)
-    scene.on(device)
+    device = scene.on(IN_USE)
     device.put(ZONEINFO, Node("something else"))
     var = scene.machine.var
     image.debugfs(var, f'clri "{ZONEINFO.removeprefix("/var")}"', write=True)

@@ -6,6 +6,7 @@ import contextlib
 import fcntl
 import os
 import re
+import shutil
 import subprocess
 import sys
 from collections.abc import Iterator
@@ -52,6 +53,13 @@ def locked(folder: Path) -> Iterator[None]:
             say(f"Waiting: {shown(folder)} is in use")
             fcntl.flock(lock, fcntl.LOCK_EX)
         yield
+
+
+def room(place: Path) -> Path:
+    """An empty directory."""
+    shutil.rmtree(place, ignore_errors=True)
+    place.mkdir(parents=True)
+    return place
 
 
 def quietly(log: Path, *command, check=True, **options) -> int:

@@ -4,7 +4,6 @@ that are unpacked in the folder "build" and never installed; its command; its co
 file; and the wait until it has ended."""
 
 import contextlib
-import fcntl
 import re
 import shutil
 import subprocess
@@ -13,6 +12,7 @@ from collections.abc import Iterator
 from pathlib import Path
 from typing import NamedTuple
 
+from lab.carriers.building import locked, room
 from lab.carriers.image import run
 from lab.words.command import say
 from lab.words.places import PROJECT
@@ -48,9 +48,7 @@ def preparing(processor: Processor, place: Path, *purposes: str) -> Iterator[Non
         raise Unavailable("packages are missing")
     if not shutil.which(processor.qemu[0]):
         raise Unavailable(f"{processor.qemu[0]} is installed and not on the PATH")
-    place.mkdir(parents=True, exist_ok=True)
-    with open(place / "lock", "w", encoding="ascii") as lock:
-        fcntl.flock(lock, fcntl.LOCK_EX)
+    with locked(place):
         try:
             fetch(parts, processor.architecture, "busybox-static", kernel=True)
             yield
@@ -67,8 +65,7 @@ def fetch(place: Path, architecture: str, *names: str, kernel=False):
     if place.is_dir():
         return
     say(f"Fetching packages: {', '.join(names)}")
-    work = place.with_name("fetched")
-    shutil.rmtree(work, ignore_errors=True)
+    work = room(place.with_name("fetched"))
     for directory in ("lists/partial", "cache/archives/partial", "unpacked"):
         (work / directory).mkdir(parents=True)
     (work / "status").touch()

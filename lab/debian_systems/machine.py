@@ -13,7 +13,8 @@ from dataclasses import dataclass
 from pathlib import Path
 
 from lab.carriers import image, qemu
-from lab.debian_systems.parts import CHOSEN, make_image, room
+from lab.carriers.building import room
+from lab.debian_systems.parts import CHOSEN, make_image
 
 SECONDS = 600  # a boot that takes longer hangs
 UNIT = "marlin.service"

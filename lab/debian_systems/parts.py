@@ -4,7 +4,6 @@ as it ships, and the demonstration's real data. The first two are fetched once, 
 folder "build"; each system has a disk of its own."""
 
 import os
-import shutil
 from pathlib import Path
 from typing import NamedTuple
 
@@ -137,10 +136,3 @@ def make_image(image: Path, script="", apart="",
     run("bwrap", "--unshare-user", "--uid", 0, "--gid", 0, "--dev-bind", "/", "/",
         "sh", "-euc", IMAGE, "-", CHOSEN.place, GUEST, real_data.TARGET, package, image,
         script, apart, third or "", megabytes)
-
-
-def room(place: Path) -> Path:
-    """An empty directory."""
-    shutil.rmtree(place, ignore_errors=True)
-    place.mkdir(parents=True)
-    return place

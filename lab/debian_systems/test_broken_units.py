@@ -8,6 +8,7 @@ from typing import NamedTuple
 
 import pytest
 
+from lab.carriers.building import room
 from lab.debian_systems import (machine, parts, test_chosen, test_limits, test_ordinary,
                                 test_other_inits, test_package_on_a_system, test_probe,
                                 test_starts, test_var)
@@ -97,7 +98,7 @@ FAULTS = {
 def test_a_fault_is_seen(name, monkeypatch):
     scene, change, reported = FAULTS[name]
     place = parts.CHOSEN.place / "scenes" / f"broken {name}".replace(" ", "-")
-    monkeypatch.setattr(machine, "room", lambda _: parts.room(place))
+    monkeypatch.setattr(machine, "room", lambda _: room(place))
     monkeypatch.setattr(
         machine, "make_image", lambda image, script="", **how:
         parts.make_image(image, change + script, **how))

@@ -7,17 +7,14 @@ from lab.debian_systems.machine import System, UNIT, message
 from lab.debian_systems.scene import device, fail, insist, names, updated
 from lab.words.paths import DOWNLOADS
 
-# Nothing of the word that was there: a line end would be the end of this one, too.
-TERABYTE = "rm .{tree}/zoneinfo/+VERSION; truncate -s 1T .{tree}/zoneinfo/+VERSION"
-
 
 def test_a_terabyte_for_a_word():
     """The word of an update is cut where the unit's memory ends; the boot goes on. The
     kernel itself would refuse none, and end the program later."""
     update = names().update
-    system = System("terabyte", f"""
-        {updated()}
-        {TERABYTE.format(tree=DOWNLOADS + update)}""")
+    word = f".{DOWNLOADS}{update}/zoneinfo/+VERSION"
+    # Nothing of the one that was there: its line end would be the end of this, too.
+    system = System("terabyte", f"{updated()} rm {word}; truncate -s 1T {word}")
     seen = system.boot(options="sysctl.vm.overcommit_memory=1")
     insist(seen, (), device(active=True, announced=True), reader="14:00 CEST",
            record=f"{names().system}.1.0_{update}")

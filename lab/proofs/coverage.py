@@ -12,12 +12,11 @@ covered, 1 when a test fails or something is not, 2 for bad use.
 """
 
 import os
-import shutil
 import subprocess
 from concurrent.futures import ThreadPoolExecutor
 from pathlib import Path
 
-from lab.carriers.building import build, locked, need, quietly
+from lab.carriers.building import build, locked, need, quietly, room
 from lab.words.command import Options, stop
 from lab.words.places import BUILD, PROJECT, shown
 
@@ -36,13 +35,12 @@ def run_tests(program: Path):
 
 def measure() -> int:
     """What gcovr says of it, and how it ended."""
-    shutil.rmtree(REPORT, ignore_errors=True)
     build("coverage")
     for counters in FOLDER.rglob("*.gcda"):
         counters.unlink()
     with ThreadPoolExecutor(os.cpu_count()) as together:
         list(together.map(run_tests, FOLDER.glob("tests/*_test")))
-    REPORT.mkdir()
+    room(REPORT)
     # An object that was built but never ran counts as well: all of it is missing.
     return subprocess.call([
         "gcovr", "--root", PROJECT, "--filter", "driver/", "--filter", "dataset/",

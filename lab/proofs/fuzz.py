@@ -11,11 +11,10 @@ Exit status: 0 without a finding, 1 with one, 2 for bad use.
 """
 
 import re
-import shutil
 from concurrent.futures import ThreadPoolExecutor
 from pathlib import Path
 
-from lab.carriers.building import build, need, quietly, show_end
+from lab.carriers.building import build, need, quietly, room, show_end
 from lab.words.command import Options, number, say
 from lab.words.places import BUILD, PROJECT
 
@@ -33,9 +32,7 @@ def unescaped(line: str) -> bytes:
 
 def unpack_seeds(target: str) -> Path:
     """The directory that the engine reads: a file for each seed."""
-    directory, seeds = PLACE / "seeds" / target, f"tests/fuzz/{target}.seeds"
-    shutil.rmtree(directory, ignore_errors=True)
-    directory.mkdir(parents=True)
+    directory, seeds = room(PLACE / "seeds" / target), f"tests/fuzz/{target}.seeds"
     for index, line in enumerate((PROJECT / seeds).read_text("ascii").splitlines()):
         if not line.startswith("#"):
             (directory / f"{index:04}").write_bytes(unescaped(line))

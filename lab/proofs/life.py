@@ -33,6 +33,7 @@ from lab.oracles.sets import (fits, is_due, is_welcome, link, mixed, names_of, n
                               set_of, whole)
 from lab.oracles.trial import entry_differences, left, trial
 from lab.proofs.kills import killed
+from lab.words.changes import change
 from lab.words.device import Device, decoded
 from lab.words.paths import (DOWNLOADS, FORMER_ZONEINFO, ICUTZ, LEGACY_ICUTZ, LOCALTIME,
                              OLD_ICU, RECORD, SYSTEM_ICU, SYSTEM_ZONEINFO, TZ_LATEST,
@@ -155,12 +156,8 @@ class Life:
 
     def __init__(self, count=lambda title: None):
         self.count, self.story = count, []
-        device = Device()
-        device.directory(DOWNLOADS.rstrip("/"))
-        device.point_links_at(None)
-        device.choose_zone("Europe/Paris")
-        device.directory(INCOMING.rstrip("/"))
-        namespace.build(device)
+        namespace.build(change(Device(), "directory TZ; link ZONEINFO SYSTEM;"
+                               f"choose_zone Europe/Paris; directory {INCOMING}"))
         install_system("2023c", "44l")
 
     def live(self, events: list[str]):

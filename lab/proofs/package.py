@@ -6,7 +6,6 @@ The packages stay in build/packaging. Each is built once more elsewhere, from wh
 knows of this tree, uncommitted changes too.
 """
 
-import fcntl
 import gzip
 import os
 import re
@@ -68,9 +67,7 @@ def run(*command, **options) -> str:
 
 def fresh(place: Path) -> Path:
     subprocess.run(["chmod", "-Rf", "u+w", place])  # a package has what is read-only
-    shutil.rmtree(place, ignore_errors=True)
-    place.mkdir(parents=True)
-    return place
+    return building.room(place)
 
 
 def found(pattern: str, text: str) -> str:
@@ -99,9 +96,7 @@ def pytest_generate_tests(metafunc):
 @pytest.fixture(scope="module")
 def package(request) -> Package:
     preset, work = request.param, WORK / request.param
-    work.mkdir(parents=True, exist_ok=True)
-    with open(work / "lock", "w", encoding="ascii") as lock:
-        fcntl.flock(lock, fcntl.LOCK_EX)
+    with building.locked(work):
         os.environ.pop("SOURCE_DATE_EPOCH", None)
         file = building.package(preset, work)
         # In another place, at another time, by somebody with other habits; and not by

@@ -15,11 +15,10 @@ Reports are left in build/asan/findings and build/memcheck/findings.
 
 import os
 import re
-import shutil
 from dataclasses import dataclass, field
 from pathlib import Path
 
-from lab.carriers.building import build, locked, need, quietly, show_end, trials
+from lab.carriers.building import build, locked, need, quietly, room, show_end, trials
 from lab.words.command import Options, say, stop
 from lab.words.places import BUILD, PROJECT, shown
 
@@ -45,8 +44,7 @@ class Tool:
 
     def watch(self, program: Path, *arguments: str) -> tuple[int, str]:
         """The status of a program on a private device, and the reports of it."""
-        shutil.rmtree(self.findings, ignore_errors=True)
-        self.findings.mkdir()
+        room(self.findings)
         status = quietly(
             self.log, PROJECT / "scripts/private-device", "--writable", self.folder,
             "--", *self.prefix, program, *arguments, check=False,
