@@ -89,7 +89,8 @@ def tell(story: Story):
         boot from now on, and touches nothing.""")
 
     story.install("refused")
-    story.download_and_announce("refused")
+    story.bring("refused", update_path(names.refused))
+    device.announce(names.refused)
     story.scene("An update that does not fit is refused", f"""In
         {names.refused} Lisbon has EET. marlin-install does not take it, but somebody
         has announced it by hand. It is newer, but its ICU data has the format
@@ -137,11 +138,6 @@ class Story:
         self.bring(f"{data_set}/icu", SYSTEM_ICU)
         # Where ICU looks for single files of its data.
         self.device.link(f"{SYSTEM_ICU}/icudt{self.names.icu}", ".")
-
-    def download_and_announce(self, data_set: str):
-        version = getattr(self.names, data_set)
-        self.bring(data_set, update_path(version))
-        self.device.announce(version)
 
     def install(self, data_set: str):
         """Has marlin-install install a data set on the device as it is."""
