@@ -14,7 +14,6 @@ namespace {
 
 // How an owner appears whom this user namespace does not have.
 constexpr uid_t nobody = 65534;
-
 constexpr char links_directory[] = "/var/db/timezone";
 
 std::vector<std::string> unknown(const report& told, bool is_running_system) {

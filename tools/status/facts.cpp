@@ -271,8 +271,9 @@ device_facts read_device(sight& seen) {
     device.current = device.links.current_path->empty()
                          ? device.system
                          : facts_of(*device.links.current_path, system);
-  if (device.links.tz_latest.what == entry::kind::link)
-    device.update = facts_of(latest_update_path(), system);
+  // As much of the target as a boot reads.
+  if (const std::string& latest = device.links.tz_latest.text; !latest.empty())
+    device.update = facts_of(latest.substr(0, 1024), system);
   device.refusals = refusals();
   list_downloads(device, seen);
   return device;

@@ -26,7 +26,7 @@ constexpr int not_here = 77;
 
 [[noreturn]] void refuse(int status, const std::string& why) {
   std::fprintf(stderr, "marlin-status: %s\n", why.c_str());
-  std::exit(status);
+  std::_Exit(status);
 }
 
 constexpr char help[] =
