@@ -406,14 +406,14 @@ class Life:
         device = Device()
         put_update(device, source, release, more=zone_files("zoneinfo", release, "U"),
                    schema="45l" if kind == "schema" else "44l")
-        paris = f"{source}/zoneinfo/Europe/Paris"
+        europe = f"{source}/zoneinfo/Europe"
         sums = device.find(f"{source}/SHA256SUMS")
         if kind == "damaged":
-            device.file(paris, "XXXX")
+            device.file(f"{europe}/Paris", "XXXX")
         elif kind in ("incomplete", "lacking"):
-            device.drop(paris)
+            device.drop(europe)
         if kind == "lacking":
-            sums.text = re.sub(".*Paris\n", "", sums.text)
+            sums.text = re.sub(".*/Europe/.*\n", "", sums.text)
         namespace.build_below(source, device.find(source))
         return source
 
