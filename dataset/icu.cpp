@@ -8,6 +8,7 @@
 #include <cerrno>
 #include <cstring>
 #include <memory>
+#include <new>
 #include <utility>
 
 #include "dataset/icu_file_name.h"
@@ -31,6 +32,9 @@ using walk_pointer = std::unique_ptr<FTS, close_walk>;
 // a comparison function the entries come as the directory lists them.
 walk_pointer open_walk(std::string& directory) {
   char* const roots[] = {directory.data(), nullptr};
+  // Some C libraries crash where there is no memory for the root's entry. So
+  // enough for two long paths and all else is had before, and given back.
+  ::operator delete(::operator new(16384));
   return walk_pointer(
       ::fts_open(roots, FTS_COMFOLLOW | FTS_PHYSICAL | FTS_XDEV, nullptr));
 }

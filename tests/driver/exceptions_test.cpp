@@ -3,6 +3,7 @@
 // Every request for memory that a boot makes is refused in turn, with an
 // exception of any type. Each reaches the handler that it has to reach, and
 // finds everything freed that was built by then.
+#include <algorithm>
 #include <cerrno>
 #include <cstdlib>
 #include <map>
@@ -23,6 +24,7 @@ namespace {
 int granted = 0;  // how many requests for memory are granted first
 int denied = 0;   // how many are denied after them
 std::function<void()> deny;
+std::size_t greatest = 0;  // request of all
 
 // What is allocated: now, and at the request that follows on a denied one.
 long live = 0;
@@ -41,6 +43,7 @@ char letter_of(const mln_dataset_component& component) {
 }  // namespace
 
 void* operator new(std::size_t size) {
+  greatest = std::max(greatest, size);
   if (std::exchange(was_denied, false)) live_after_denial = live;
   if (granted > 0) {
     --granted;
@@ -191,6 +194,13 @@ TEST_F(Exceptions, ThatAFallbackMeetsItselfLeaveThePass) {
   };
   fails(run_startup_pass, 1, unable_to_locate(ENOMEM));
   fails(repair_localtime_link, 0, resetting_localtime(ENOMEM));
+}
+
+// Else a walk that cannot have its last piece of memory crashes in fts_open(3).
+TEST_F(Exceptions, ComeBeforeAWalkThatCouldNotHaveItsMemory) {
+  greatest = 0;
+  printed_by(run_startup_pass);
+  EXPECT_EQ(greatest, 16384u);
 }
 
 // What was read before stays: the first 4096 bytes are there when room for
