@@ -31,10 +31,13 @@ using walk_pointer = std::unique_ptr<FTS, close_walk>;
 // Follows the directory itself if it is a link, but no link inside it. Without
 // a comparison function the entries come as the directory lists them.
 walk_pointer open_walk(std::string& directory) {
-  char* const roots[] = {directory.data(), nullptr};
   // Some C libraries crash where there is no memory for the root's entry. So
   // enough for two long paths and all else is had before, and given back.
-  ::operator delete(::operator new(16384));
+  if (void* const enough = ::operator new(16384, std::nothrow))
+    ::operator delete(enough);
+  else
+    return {};
+  char* const roots[] = {directory.data(), nullptr};
   return walk_pointer(
       ::fts_open(roots, FTS_COMFOLLOW | FTS_PHYSICAL | FTS_XDEV, nullptr));
 }
