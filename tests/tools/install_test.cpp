@@ -287,12 +287,6 @@ TEST_F(Installer, RefusesAnUpdateWithoutTheUsersZone) {
   expect_refused("it lacks the zone that the device is set to, Asia/\\x1b");
 }
 
-// No update would ever fit such a device.
-TEST_F(Installer, TakesNoZoneAwayFromADeviceThatHasNone) {
-  point_localtime_at(zoneinfo + "/Mars/Base");
-  expect_end(0, "");
-}
-
 TEST_F(Installer, RefusesADirectoryThatCannotBeItsPlace) {
   wipe(downloads);
   expect_end(1,
@@ -525,14 +519,6 @@ TEST_F(Installer, RefusesWhatIsNotADirectory) {
 }
 
 // --- Its other jobs ---------------------------------------------------------
-
-TEST_F(Installer, WithdrawsAnAnnouncement) {
-  EXPECT_EQ(install().exit_status, 0);
-  EXPECT_EQ(install({"--withdraw"}).exit_status, 0);
-  EXPECT_EQ(link_at(tz_latest), nothing);
-  EXPECT_EQ(file_at(update(version) + "/zoneinfo/+VERSION"), "2024b\n");
-  EXPECT_EQ(install({"--withdraw"}).exit_status, 0) << "there is none any more";
-}
 
 // What the next boot finds depends on the announcement only; what a later one
 // could be told of, not on a wrong order of commands.
