@@ -114,7 +114,7 @@ def built(tree: Path, preset: str, umask=-1, **environment) -> Path:
     run("bash", "-euo", "pipefail", "-c", """
         (cd "$2" && git ls-files -z | tar -c --null -T -) | tar -x --no-same-permissions
         cmake --preset "$1" -DMARLIN_WERROR=ON
-        cmake --build --preset "$1"
+        cmake --build "build/$1"
         cpack --config "build/$1/CPackConfig.cmake" -B "build/$1"
         """, "-", preset, PROJECT, cwd=fresh(tree), umask=umask,
         env=os.environ | environment)
