@@ -316,7 +316,8 @@ ACL = struct.pack("<I", 2) + b"".join(
     for tag, rights in ((1, 7), (2, 0), (4, 5), (16, 5), (32, 5)))
 AN_ACL = f"mark /var/db system.posix_acl_access {quote(ACL)}"
 LAYER = (r" looks different in an overlay; is it being changed, or has it an access "
-         r"list, an overlay attribute or the device number 0\?")
+         r"list, an overlay attribute, the device number 0, nosymfollow or a second "
+         r"path\?")
 INTO_FULL = """/bin/sh -c 'exec "$0" "$@" >/dev/full'"""
 TOO_LONG = """/usr/bin/prlimit --fsize=0 /bin/sh -c 'exec "$0" "$@" >/tmp/full'"""
 
@@ -518,6 +519,22 @@ def test_a_record_that_is_mounted():
         echo other | cmp /tmp/record -'""")
     assert (answer.status, answer.errors) == (0, "")
     assert fact(answer.said, "record") == "activation"
+
+
+@pytest.mark.parametrize("status, mounts", [
+    (77, "mount --bind . . && mount -o remount,bind,nosymfollow $PWD"),
+    (77, "mount --bind . timezone"),  # what the boot changes has two paths
+    (1, "mount -t tmpfs own icu && mount --bind /tmp/aside ."),  # one hides another
+])
+def test_odd_mounts(status, mounts):
+    unpack("directory OLD_ICU")
+    answer = ask("--root", TREE, "--check", under=AS_ROOT + f"""'
+        cd {TREE}/var/db && cp -a . /tmp/aside && {mounts} && cd /
+        exec "$0" "$@"'""")
+    shutil.rmtree("/tmp/aside")
+    assert answer.status == status, answer
+    assert answer.output == ("old icu: /var/db/icu is removed\n" * (status == 1))
+    assert status == 1 or re.search(LAYER, answer.errors)
 
 
 @pytest.mark.parametrize("place", ["/var/db/timezone", "/var/db/timezone/tz", "/var/db",

@@ -38,10 +38,6 @@ struct stat status_of(const std::string& path) {
   return status;
 }
 
-bool is_directory(const std::string& path) {
-  return S_ISDIR(status_of(path).st_mode);
-}
-
 entry record_at(const char* path) {
   entry record = entry_at(path);
   if (record.what != entry::kind::file) return record;
@@ -103,7 +99,7 @@ void list_downloads(device_facts& device, sight& seen) {
   device.has_more_downloads = names.size() > most_names;
   std::map<std::string, std::vector<std::string>> sets;
   for (const auto& name : names)
-    if (is_directory(root + name)) sets[name];
+    if (S_ISDIR(status_of(root + name).st_mode)) sets[name];
 
   for (const auto& [label, link] : needing) {
     const std::string text = target_of(link);
@@ -114,7 +110,7 @@ void list_downloads(device_facts& device, sight& seen) {
         name_behind(real_root, seen.follow(link).real)};
     for (const auto& name : needed)
       if (!name.empty() && name != "." && name != ".." &&
-          is_directory(root + name))
+          S_ISDIR(status_of(root + name).st_mode))
         sets[name].emplace_back(label);
   }
   for (const bool is_needed : {true, false})
@@ -161,13 +157,6 @@ void note_unreadable(dataset_facts& facts) {
   facts.has_several_schemas = schemas.size() > 1;
 }
 
-std::string icu_schema_of(const mln_dataset& built) {
-  for (const auto& component : built.components)
-    if (const auto* icu = dynamic_cast<const mln_icu*>(component.get()))
-      return icu->schema.substr(0, longest_word);
-  return {};
-}
-
 // Building it tells; what is kept afterwards is short, and the `system`.
 dataset_facts facts_of(const std::string& path,
                        std::unique_ptr<const mln_dataset>& system) {
@@ -179,7 +168,9 @@ dataset_facts facts_of(const std::string& path,
     auto built = std::make_unique<const mln_dataset>(path);
     facts.version_text = built->version_string.substr(0, longest_word);
     facts.version = built->version;
-    facts.schema = icu_schema_of(*built);
+    for (const auto& component : built->components)
+      if (const auto* icu = dynamic_cast<const mln_icu*>(component.get()))
+        facts.schema = icu->schema.substr(0, longest_word);
     facts.fits_system =
         path.empty() || (system && built->compatible_with(*system));
     if (path.empty()) system = std::move(built);

@@ -64,7 +64,11 @@ sight::place& sight::look(const std::string& real) {
   here.mode = status.st_mode;
   here.owner = status.st_uid;
   here.group = status.st_gid;
-  if (!S_ISDIR(here.mode)) here.size = status.st_size;
+  if (S_ISDIR(here.mode))
+    here.target =
+        first_.try_emplace({status.st_dev, status.st_ino}, real).first->second;
+  else
+    here.size = status.st_size;
   if (S_ISLNK(here.mode)) here.target = ::target_of(path.c_str());
   return here;
 }

@@ -22,8 +22,8 @@ class sight {
     mode_t mode = 0;
     off_t size = 0;  // not of a directory
     int error = 0;
-    std::string target{};
-    std::string names{};  // in a directory whose names count
+    std::string target{};  // of a directory: by which path it was seen first
+    std::string names{};   // in a directory whose names count
     uid_t owner = 0;
     gid_t group = 0;
 
@@ -41,8 +41,8 @@ class sight {
   // a file at the end the other.
   way follow(std::string path, mode_t of_directories = 01, mode_t of_file = 04);
 
-  // Looks at each place that a boot looks at or changes, as it stands there and
-  // where it leads.
+  // Looks at each place that a boot uses, as it stands there and where it
+  // leads.
   void look_around();
 
   std::optional<std::string> first_difference(const sight& other) const;
@@ -55,4 +55,5 @@ class sight {
 
   std::string root_;
   std::map<std::string, place> seen_{};  // "" is the root
+  std::map<std::pair<dev_t, ino_t>, std::string> first_{};
 };

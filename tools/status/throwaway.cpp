@@ -31,6 +31,7 @@ namespace {
 
 constexpr char writable[] = "/var/db";
 constexpr char in_base[] = "/root";  // the device, as long as it is not "/"
+constexpr unsigned long nosymfollow = 0x2000;  // has no name for programs
 constexpr char ask_outside[] =
     "; run this as root, and from outside of a container or chroot, with "
     "--root";
@@ -54,12 +55,13 @@ bool owner_may_change_links(const std::string& root) {
 }
 
 // Attributes and numbers of the device's own mean something to overlayfs, and
-// what is covered loses its access list.
+// what is covered loses its access list and its other paths.
 [[noreturn]] void refuse_layer(const std::string& path) {
   throw cannot_tell(
       escaped(path) +
       " looks different in an overlay; is it being changed, or has it an "
-      "access list, an overlay attribute or the device number 0?");
+      "access list, an overlay attribute, the device number 0, nosymfollow or "
+      "a second path?");
 }
 
 void make_read_only(const descriptor& tree, unsigned flags = 0) {
@@ -146,9 +148,8 @@ void resemble(const std::string& path, const struct stat& status,
   must(::chmod(path.c_str(), status.st_mode & 07777), "chmod");
 }
 
-// A writable layer over a directory. It is made in the base, and the directory
-// is the current one, so that no name of the device's becomes part of a list of
-// options.
+// Made in the base, and the directory is the current one, so that no name of
+// the device's becomes part of a list of options.
 descriptor layer_over(const descriptor& lower, const std::string& name,
                       const struct stat& status, const place& here) {
   const std::string upper = name + "/upper";
@@ -183,23 +184,29 @@ descriptor copy_of(const std::string& path, const std::string& name,
 // For a place that is a file system of its own, or the topmost.
 descriptor cover_for(const std::string& path, const std::string& name,
                      const place& here) {
-  descriptor below = place_at(in_base + path);
-  if (below.number() < 0) return below;
-  if (::getxattr((in_base + path).c_str(), "system.posix_acl_access", nullptr,
-                 0) > 0)
-    refuse_layer(path);
+  const descriptor below = place_at(in_base + path);
   struct stat status {};
   must(::fstat(below.number(), &status), "stat");
   struct statvfs mounted {};
-  // As the running system has it.
-  if (here.is_running_system)
-    must(::fstatvfs(below.number(), &mounted), "statvfs");
+  must(::fstatvfs(below.number(), &mounted), "statvfs");
+  if ((mounted.f_flag & nosymfollow) != 0 ||
+      ::getxattr((in_base + path).c_str(), "system.posix_acl_access", nullptr,
+                 0) > 0)
+    refuse_layer(path);
   descriptor cover =
       S_ISDIR(status.st_mode)   ? layer_over(below, name, status, here)
       : S_ISREG(status.st_mode) ? copy_of(in_base + path, name, status, here)
                                 : clone_tree(below);
-  if ((mounted.f_flag & ST_RDONLY) != 0) make_read_only(cover);
+  if (here.is_running_system && (mounted.f_flag & ST_RDONLY) != 0)
+    make_read_only(cover);
   return cover;
+}
+
+// And seen: another mount can hide it.
+bool is_mounted(const std::string& path) {
+  struct statx status {};
+  ::statx(AT_FDCWD, (in_base + path).c_str(), AT_SYMLINK_NOFOLLOW, 0, &status);
+  return (status.stx_attributes & STATX_ATTR_MOUNT_ROOT) != 0;
 }
 
 // What is to lie over "/var/db" and over what is mounted below, by real paths
@@ -213,7 +220,7 @@ std::vector<std::pair<std::string, descriptor>> make_covers(
   mounts.insert(real);
   for (const auto& path : mounts) {
     const std::string name = std::to_string(covers.size());
-    if ((path + "/").starts_with(real + "/"))
+    if (path == real || (path.starts_with(real + "/") && is_mounted(path)))
       covers.emplace_back(path, cover_for(path, "/" + name, here));
   }
 
@@ -244,8 +251,7 @@ place enter_throwaway_device(const std::string& root) {
 
   // Taken before anything is covered.
   const descriptor tree = clone_tree(open_directory(root), AT_RECURSIVE);
-  // A base of our own. Where it lies does not matter: this process sees nothing
-  // else from then on, and no other process sees it.
+  // A base that only this process sees, and from then on nothing else.
   must(::mount("base", "/proc", "tmpfs", 0, "mode=0755,size=64m"), "tmpfs",
        ask_outside);
   enter(open_directory("/proc"));
@@ -261,9 +267,7 @@ place enter_throwaway_device(const std::string& root) {
                       writable + " nor " + paths::system_zoneinfo);
   here.seen.look_around();
   for (const auto& [path, cover] : covers)
-    if (const descriptor target = place_at(in_base + path);
-        target.number() >= 0)
-      attach(cover, target);
+    attach(cover, place_at(in_base + path));
   sight covered(in_base);
   covered.look_around();
   if (const auto path = here.seen.first_difference(covered))
