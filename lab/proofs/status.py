@@ -524,6 +524,7 @@ def test_a_record_that_is_mounted():
 @pytest.mark.parametrize("status, mounts", [
     (77, "mount --bind . . && mount -o remount,bind,nosymfollow $PWD"),
     (77, "mount --bind . timezone"),  # what the boot changes has two paths
+    (1, "mount --bind . . && mount -o remount,bind,ro $PWD"),  # not the device's own
     (1, "mount -t tmpfs own icu && mount --bind /tmp/aside ."),  # one hides another
 ])
 def test_odd_mounts(status, mounts):
