@@ -170,7 +170,7 @@ def fact(said, name: str):
 
 # The status, the changes, and what is said: without a value, null.
 TREES = [
-    (0, "", "now.pair system"),
+    (0, "", "now.pair system", "cannot_know ['what the device mounts over this tree']"),
     (0, "use 2024a.1.0", "now.pair update", "current.version 2024a.1.0"),
     (2, "use 2024a.1.0; drop ICUTZ", "now.pair update_without_icu"),
     (2, "use 2024a.1.0; link ICUTZ TZ/2023d.1.0/icutz",
@@ -204,7 +204,8 @@ TREES = [
      "link /var/db/shut/way ../tree; directory /var/db/shut 0700",
      "reasons.0.code closed"),
     (2, "use 2024a.1.0; drop U/icutz/icutz44l.dat; file U/icutz/icutz45l.dat;"
-     "file U/icutz/icutz46l.dat", "current.has_several_schemas True"),
+     "file U/icutz/icutz46l.dat", "current.has_several_schemas True",
+     "cannot_know.0 which ICU data file comes first on the device's own file system"),
     (0, "use 2024a.1.0; link U/icutz/icutz45l.dat U/icutz/icutz44l.dat;"
      "file U/icutz/icutz46l.dat ICU 0640", "current.has_several_schemas False"),
     # The host's.
