@@ -462,12 +462,9 @@ def by_hand(verb: str, *words: str):
                 remove(path)
             case "bend", _, to:
                 relink(path, place(to) if to in RELEASES else to)
-            case "file", _:
+            case "file" | "directory", _:
                 remove(path)
-                os.mknod(path, 0o644)
-            case "directory", _:
-                remove(path)
-                os.mkdir(path)
+                (os.mkdir if verb == "directory" else os.mknod)(path, 0o755)
             case "mode", _, mode:
                 os.chmod(path, int(mode, 8))
             case "damage", _:
