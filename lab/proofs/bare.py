@@ -42,8 +42,7 @@ WHOLE_DOORS = {"gcc", "clang", "readers", "bench", "package", "arm64", "device",
 ROWS = [
     "packages python3", "private-device true", "status --json", "demo", "readers",
     "bench --check", "bench --companions", "package", "picture /tmp/picture.svg",
-    "coverage", "sanitize --sanitizers", "device --boot-cost",
-    "device --systems --help",
+    "device --boot-cost", "device --systems --help",
     *(f"test {preset}" for preset in MAY_SKIP),
     *(f"ci --full {stage}" for stage in told("ci") if stage not in WHOLE_DOORS),
     *(f"prove --quick {proof}" for proof in told("prove"))]

@@ -1,5 +1,5 @@
 # SPDX-License-Identifier: BSD-2-Clause
-"""usage: scripts/coverage
+"""usage: lab.proofs.coverage
 
 Measures which lines and branches of driver/, dataset/ and support/ the tests run
 through, those of the program that they boot included. Fails unless all of them are.

@@ -1,10 +1,10 @@
 # SPDX-License-Identifier: BSD-2-Clause
-"""usage: scripts/sanitize [--sanitizers | --memcheck]
+"""usage: lab.proofs.sanitize [--sanitizers]
 
 Runs every test twice, the program that the tests boot included: built with
 AddressSanitizer, LeakSanitizer and UndefinedBehaviorSanitizer, and under valgrind's
-memcheck. Before that, each has to find a leak that was made on purpose. With an option
-only the one or the other. With the sanitizers marlin-status also tells of trees, and
+memcheck, unless the sanitizers alone are wanted. Before that, each has to find a leak
+that was made on purpose. With the sanitizers marlin-status also tells of trees, and
 of random devices that are then booted. Left out is what the tool itself makes
 impossible: limits of memory, and under valgrind a limit of file sizes and a test that
 would take an hour.
@@ -130,14 +130,10 @@ def read(file: Path) -> str:
 
 def main():
     options = Options(__doc__)
-    one = options.add_mutually_exclusive_group()
-    for name in TOOLS:
-        one.add_argument(f"--{name}", action="store_const", const=[name], dest="names")
-    names = options.parse_args().names or list(TOOLS)
+    options.add_argument("--sanitizers", action="store_true")
+    names = list(TOOLS)[:1 if options.parse_args().sanitizers else 2]
     need("build", "private-device", "test", "pytest", "prove", "sanitize")
-    tests = sum(TOOLS[name].run() for name in names)
-    if "sanitizers" in names:
-        tests += asked_about()
+    tests = sum(TOOLS[name].run() for name in names) + asked_about()
     print(f"sanitize: {tests} tests with {' '.join(names)}: no finding")
 
 
