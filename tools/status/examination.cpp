@@ -1,4 +1,5 @@
 // SPDX-License-Identifier: BSD-2-Clause
+#include <sys/statvfs.h>
 #include <sys/xattr.h>
 #include <unistd.h>
 
@@ -29,9 +30,8 @@ std::vector<std::string> unknown(const report& told, bool is_running_system) {
   return texts;
 }
 
-// In a user namespace this user is the device's root only as far as the device
-// is this user's. What is sound for somebody with the rights of everybody is
-// sound.
+// This user is the device's root only as far as the device is this user's. What
+// is sound for somebody with the rights of everybody is sound.
 void insist_on_rights(const report& told, place& here) {
   std::vector<std::string> parts = {
       links_directory, paths::system_zoneinfo,
@@ -67,7 +67,6 @@ void insist_on_rights(const report& told, place& here) {
                       "list; run this as root");
 }
 
-// Tried, because it does not follow from the links.
 bool is_mended_by_a_removal(const report& told) {
   return told.after == told.device.links && !told.after.pair.fits &&
          ::unlink(paths::zoneinfo_link) == 0 && rehearse_boot().ends_normally &&
@@ -82,6 +81,7 @@ report examine(const std::string& root) {
   become_the_boot();
   limit_memory();
   report told;
+  struct statvfs mounted {};
   told.device = read_device(here.seen);
   told.boot = rehearse_boot();
   told.after = read_links();
@@ -89,7 +89,8 @@ report examine(const std::string& root) {
   if (refusals() > 2 * told.device.refusals) throw std::bad_alloc();
   // Whether another's owner may write there is insisted on below.
   if (!here.has_all_users && here.seen.follow(links_directory).end.owner != 0)
-    told.boot.may_change_links = true;
+    told.boot.may_change_links = ::statvfs(links_directory, &mounted) == 0 &&
+                                 (mounted.f_flag & ST_RDONLY) == 0;
   told.why = explain(told);
   if (!here.has_all_users) insist_on_rights(told, here);
   told.cannot_know = unknown(told, here.is_running_system);

@@ -37,7 +37,6 @@ std::string version_and_schema(const dataset_facts& set) {
          ", " + schema_of(set);
 }
 
-// Breaks at blanks where it can.
 std::string wrapped(std::string text, std::size_t columns) {
   const std::size_t width = std::max(columns, 2 * label_width) - label_width;
   std::string lines;
