@@ -62,6 +62,13 @@ def source_rules() -> Iterator[str]:
         for line in matching_lines(path, unqualified):
             yield f"{line}: must be fsutil::remove() or std::remove()"
 
+    programs = re.findall(r"marlin_test\(\w+ \w+ (\w+) ([^)]*)\)",
+                          Path("tests/CMakeLists.txt").read_text())
+    yield from differences(
+        {f"{folder}/{name}_test.cpp" for folder, names in programs
+         for name in names.split()}, "tests/CMakeLists.txt",
+        {str(path)[6:] for path in Path("tests").rglob("*_test.cpp")}, "tests/")
+
     floors = re.findall(r"^\| \[`(\w+)/`\]", Path("docs/proofs.md").read_text(), re.M)
     yield from differences({path.parent.name for path in Path("lab").glob("*/*.py")},
                            "lab/", set(floors), "docs/proofs.md")

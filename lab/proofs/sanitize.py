@@ -95,12 +95,13 @@ TOOLS = {
             "detect_leaks=1:detect_stack_use_after_return=1:strict_string_checks=1:"
             "check_initialization_order=1:strict_init_order=1:print_stacktrace=1:"
             f"log_path='{BUILD}/asan/findings/of'"))),
-    # valgrind itself exceeds limits of file sizes. Traced are test programs and what
+    # valgrind itself exceeds limits of file sizes, and spawns too early. Traced are test programs and what
     # they boot, not the machine's tools. "Possibly lost" does not count: so is every
     # exception in flight when a boot ends abnormally, because the library holds it by
     # its middle. A test's own operator new stays in force.
     "memcheck": Tool(
-        BUILD / "memcheck", "dev", "-g", "-*CannotBeWrittenWhole*:WholeListOfCalls.*",
+        BUILD / "memcheck", "dev", "-g",
+        "-*CannotBeWrittenWhole*:*CannotBeRun:WholeListOfCalls.*",
         [*"""valgrind --quiet --leak-check=full --error-exitcode=99
         --soname-synonyms=somalloc=nouserintercepts --show-leak-kinds=definite
         --errors-for-leak-kinds=definite --trace-children=yes

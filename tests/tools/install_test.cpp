@@ -464,6 +464,13 @@ TEST_F(Installer, RefusesWhatIsNotAsItsManifestHasIt) {
       [] {});
 }
 
+// Whatever emulates processes tells it too late.
+TEST_F(Installer, TellsOfAProgramThatCannotBeRun) {
+  if (!emulated())
+    expect_refused("cannot run /nowhere: No such file or directory", 1,
+                   {{"--verify", "/nowhere", source}});
+}
+
 // "$1" has to be the copy; what the source becomes meanwhile does not matter.
 TEST_F(Installer, LetsAProgramVerifyTheCopy) {
   const std::string program = "/var/db/verify", seen = "/var/db/seen";
@@ -475,9 +482,6 @@ TEST_F(Installer, LetsAProgramVerifyTheCopy) {
   expect_refused(program + " refuses it, with status 7", 1, verified);
   verify_by("kill $$");
   expect_refused(program + " refuses it, with status 143", 1, verified);
-  if (!emulated())
-    expect_refused("cannot run /nowhere: No such file or directory", 1,
-                   {{"--verify", "/nowhere", source}});
   verify_by("echo $# $1 >" + seen + "; cat $1/SHA256SUMS >>" + seen +
             "; readlink " + tz_latest + " >>" + seen + "; echo ICU >" + icu);
   const std::string listed = file_at(manifest);

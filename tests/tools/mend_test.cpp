@@ -127,7 +127,7 @@ TEST_F(Mend, TakesAFileForNoLinkInItsFormerPlace) {
   expect_mended();
 }
 
-TEST_F(Mend, GoesOnWithoutALog) {
+TEST_F(Mend, GoesOnWhenItsLogIsUnreadOrCannotBeWrittenWhole) {
   for (const auto lose_the_log : {leave_the_log_unread, forbid_files_to_grow}) {
     point_links_at_system();
     make_link(icutz, icu);
