@@ -6,8 +6,8 @@ AddressSanitizer, LeakSanitizer and UndefinedBehaviorSanitizer, and under valgri
 memcheck, unless the sanitizers alone are wanted. Before that, each has to find a leak
 that was made on purpose. With the sanitizers marlin-status also tells of trees, and
 of random devices that are then booted. Left out is what the tool itself makes
-impossible: limits of memory, and under valgrind a limit of file sizes and a test that
-would take an hour.
+impossible: whole lists of calls, and under valgrind a limit of file sizes and a program
+that cannot be run.
 
 Exit status: 0 without a finding, 1 with one or when a test fails, 2 for bad use.
 Reports are left in build/asan/findings and build/memcheck/findings.
@@ -95,10 +95,10 @@ TOOLS = {
             "detect_leaks=1:detect_stack_use_after_return=1:strict_string_checks=1:"
             "check_initialization_order=1:strict_init_order=1:print_stacktrace=1:"
             f"log_path='{BUILD}/asan/findings/of'"))),
-    # valgrind itself exceeds limits of file sizes, and spawns too early. Traced are test programs and what
-    # they boot, not the machine's tools. "Possibly lost" does not count: so is every
-    # exception in flight when a boot ends abnormally, because the library holds it by
-    # its middle. A test's own operator new stays in force.
+    # valgrind itself exceeds limits of file sizes, and spawns what cannot be run.
+    # Traced are test programs and what they boot, not the machine's tools. "Possibly
+    # lost" does not count: so is every exception in flight when a boot ends abnormally,
+    # because the library holds it by its middle. A test's own operator new stays.
     "memcheck": Tool(
         BUILD / "memcheck", "dev", "-g",
         "-*CannotBeWrittenWhole*:*CannotBeRun:WholeListOfCalls.*",
