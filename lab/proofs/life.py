@@ -295,8 +295,8 @@ class Life:
         return told
 
     def unsynced(self) -> list[str]:
-        """What a tool did before the disk had what it builds upon: a
-        rename after a write, or another rename; or it ended after a change."""
+        """What a tool did before the disk had what it builds upon: a rename after a
+        write, or another rename; or it ended after a change."""
         letters = {"write": "w", "rename": "r", "unlink": "u", "fsync": "s"}
         done = "".join(letters.get(call.name, "") for call in self.calls
                        if not call.error)
