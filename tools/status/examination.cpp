@@ -85,6 +85,9 @@ report examine(const std::string& root) {
   told.device = read_device(here.seen);
   told.boot = rehearse_boot();
   told.after = read_links();
+  sight afterwards;
+  told.boot.closed_part =
+      closed_part(told.after == told.device.links ? here.seen : afterwards);
   // The boot is refused what was refused before, and no more.
   if (refusals() > 2 * told.device.refusals) throw std::bad_alloc();
   // Whether another's owner may write there is insisted on below.

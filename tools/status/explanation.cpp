@@ -345,9 +345,9 @@ class account {
       found("links", name, std::string("after the boot ").append(sentence));
     if (!boot_.may_change_links)
       found("links", "not_writable", "no boot can write in /var/db/timezone");
-    if (const std::string closed = closed_part(); !closed.empty())
+    if (!boot_.closed_part.empty())
       found("links", "closed",
-            "only root can read what is in use: " + closed +
+            "only root can read what is in use: " + boot_.closed_part +
                 " is closed to others");
     if (!after_.zone_is_file)
       found("local_zone", "missing",

@@ -220,8 +220,7 @@ int list_directory(const std::string& path, std::vector<std::string>& names) {
   return 0;
 }
 
-std::string closed_part() {
-  sight seen;
+std::string closed_part(sight& seen) {
   for (const char* path :
        {"/var/db/timezone", paths::localtime_link, paths::icu_link})
     if (seen.follow(path).closed) return path;

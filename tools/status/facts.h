@@ -94,8 +94,8 @@ struct device_facts {
 // throws anything but std::bad_alloc.
 link_facts read_links();
 
-// What readers need and only root may read, as it is now; empty: nothing.
-std::string closed_part();
+// What readers need and only root may read; empty: nothing.
+std::string closed_part(sight& seen);
 
 // All of it. The data sets are read as a boot reads them; without memory for
 // the system's throws std::bad_alloc.

@@ -70,13 +70,12 @@ struct options {
   std::string (*text_of)(const report&) = in_rows_for_terminal;
 };
 
-// Numbers that no letter has.
-enum { root = 256, json, check, version };
-const option known[] = {{"root", required_argument, nullptr, root},
-                        {"json", no_argument, nullptr, json},
-                        {"check", no_argument, nullptr, check},
+// Of these letters only one is an option too.
+const option known[] = {{"root", required_argument, nullptr, 'r'},
+                        {"json", no_argument, nullptr, 'j'},
+                        {"check", no_argument, nullptr, 'c'},
                         {"help", no_argument, nullptr, 'h'},
-                        {"version", no_argument, nullptr, version},
+                        {"version", no_argument, nullptr, 'v'},
                         {}};
 
 options options_in(int count, char** words) {
@@ -86,20 +85,20 @@ options options_in(int count, char** words) {
     const int at = optind;
     switch (const int letter =
                 ::getopt_long(count, words, "+:h", known, nullptr)) {
-      case root:
+      case 'r':
         chosen.root = optarg;
         if (chosen.root.empty()) misused("--root needs a directory");
         break;
-      case json:
-      case check:
+      case 'j':
+      case 'c':
         if (chosen.text_of != in_rows_for_terminal)
           misused("one of --json and --check is enough");
-        chosen.text_of = letter == json ? in_json : in_reasons;
+        chosen.text_of = letter == 'j' ? in_json : in_reasons;
         break;
       case 'h':
         print(help);
         std::exit(0);
-      case version:
+      case 'v':
         print("marlin-status " MARLIN_VERSION "\n");
         std::exit(0);
       case -1:

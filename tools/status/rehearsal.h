@@ -43,6 +43,7 @@ struct rehearsal {
   bool ends_normally = false;
   std::string thrown{};           // otherwise: what was thrown, in words
   bool may_change_links = false;  // afterwards, in their directory
+  std::string closed_part{};      // afterwards, of what readers need
 };
 
 // Runs run_startup_pass() on the device that this process sees as "/". Throws

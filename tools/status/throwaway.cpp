@@ -2,7 +2,6 @@
 #include "tools/status/throwaway.h"
 
 #include <fcntl.h>
-#include <mntent.h>
 #include <sched.h>
 #include <sys/mount.h>
 #include <sys/sendfile.h>
@@ -13,10 +12,8 @@
 
 #include <cerrno>
 #include <climits>
-#include <cstdio>
 #include <cstdlib>
 #include <cstring>
-#include <memory>
 #include <set>
 #include <utility>
 #include <vector>
@@ -36,14 +33,10 @@ constexpr char ask_outside[] =
     "; run this as root, and from outside of a container or chroot, with "
     "--root";
 
-descriptor open_directory(const std::string& path) {
-  descriptor opened(::open(path.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
+descriptor place_at(const std::string& path, int flags = O_PATH) {
+  descriptor opened(::open(path.c_str(), flags | O_NOFOLLOW | O_CLOEXEC));
   must(opened.number(), escaped(path));
   return opened;
-}
-
-descriptor place_at(const std::string& path) {
-  return descriptor(::open(path.c_str(), O_PATH | O_NOFOLLOW | O_CLOEXEC));
 }
 
 // Before namespaces, in which all other users look like one.
@@ -77,46 +70,50 @@ void enter(const descriptor& root) {
   must(::chroot("."), "chroot", ask_outside);
 }
 
-bool has_all_users() {
-  char text[4096] = {};
-  const descriptor file(::open("/proc/self/uid_map", O_RDONLY | O_CLOEXEC));
-  must(file.number(), "uid_map");
-  must(::read(file.number(), text, sizeof text - 1), "uid_map");
-  return std::strstr(text, "4294967295") != nullptr;
+std::string text_of(const char* path) {
+  const descriptor file = place_at(path, O_RDONLY);
+  std::string text;
+  char part[4096];
+  for (ssize_t length = 1; length != 0;) {
+    must(length = ::read(file.number(), part, sizeof part), path);
+    text.append(part, static_cast<std::size_t>(length));
+  }
+  return text;
 }
 
-// Where something is mounted below a directory, as seen from there.
+// Where something is mounted below a directory, as seen from there. By hand,
+// because getmntent(3) would be a tenth of this program.
 std::set<std::string> mounts_below(const std::string& directory) {
-  const std::unique_ptr<std::FILE, int (*)(std::FILE*)> list(
-      ::setmntent("/proc/self/mounts", "re"), &::endmntent);
-  if (!list) must(-1, "mounts");
   std::set<std::string> places;
-  static char line[65536];
-  mntent mounted{};
-  while (::getmntent_r(list.get(), &mounted, line, sizeof line) != nullptr) {
-    const std::string path = mounted.mnt_dir;
+  const std::string mounts = text_of("/proc/self/mounts");
+  for (auto at = mounts.find(' '); at != std::string::npos;
+       at = mounts.find(' ', mounts.find('\n', at))) {
+    std::string path = mounts.substr(at + 1, mounts.find(' ', at + 1) - at - 1);
+    // Spaces and the like stand there as octal numbers.
+    for (std::size_t i = 0; (i = path.find('\\', i)) != std::string::npos; ++i)
+      path.replace(
+          i, 4, 1,
+          static_cast<char>(std::stoi(path.substr(i + 1, 3), nullptr, 8)));
     if (path.starts_with(directory + "/"))
       places.insert(path.substr(directory.size()));
   }
-  if (std::ferror(list.get()) != 0) must(-1, "mounts");
   return places;
 }
 
 void enter_namespaces(const std::string& root, place& here) {
-  const unsigned user = ::geteuid();
-  const unsigned group = ::getegid();
+  const std::pair<const char*, std::string> ids[] = {
+      {"/proc/self/setgroups", "deny"},
+      {"/proc/self/uid_map", "0 " + std::to_string(::geteuid()) + " 1\n"},
+      {"/proc/self/gid_map", "0 " + std::to_string(::getegid()) + " 1\n"}};
   const bool may_mount = ::unshare(CLONE_NEWNS) == 0;
   must(may_mount || errno == EPERM ? 0 : -1, "unshare", ask_outside);
-  here.has_all_users = may_mount && has_all_users();
+  here.has_all_users =
+      may_mount && text_of("/proc/self/uid_map").ends_with("4294967295\n");
   if (!here.has_all_users)
     here.owner_may_change_links = owner_may_change_links(root);
   if (may_mount) return;
   must(::unshare(CLONE_NEWUSER | CLONE_NEWNS),
        "this user may not have namespaces", ask_outside);
-  const std::pair<const char*, std::string> ids[] = {
-      {"/proc/self/setgroups", "deny"},
-      {"/proc/self/uid_map", "0 " + std::to_string(user) + " 1\n"},
-      {"/proc/self/gid_map", "0 " + std::to_string(group) + " 1\n"}};
   for (const auto& [path, text] : ids) {
     const descriptor file(::open(path, O_WRONLY | O_CLOEXEC));
     must(file.number(), path);
@@ -158,7 +155,7 @@ descriptor layer_over(const descriptor& lower, const std::string& name,
     must(::mkdir(path.c_str(), 0700), "mkdir");
   // The layer's own root gives the merged directory its owner and mode.
   resemble(upper, status, here);
-  must(::fchdir(lower.number()), "chdir");
+  must(::fchdir(lower.number()), "chdir", ask_outside);
   // Ordinary users may not set the attributes of the other kind.
   const std::string options =
       "userxattr,lowerdir=.,upperdir=" + upper + ",workdir=" + work;
@@ -245,18 +242,19 @@ place enter_throwaway_device(const std::string& root) {
   must(::mount(nullptr, "/", nullptr, MS_REC | MS_PRIVATE, nullptr), "mount",
        ask_outside);
   char outside[PATH_MAX];
-  must(::realpath(root.c_str(), outside) == nullptr ? -1 : 0, escaped(root));
+  must(::realpath((root + "/.").c_str(), outside) == nullptr ? -1 : 0,
+       escaped(root));
   here.is_running_system = std::strcmp(outside, "/") == 0;
   const auto mounts = mounts_below(here.is_running_system ? "" : outside);
 
   // Taken before anything is covered.
-  const descriptor tree = clone_tree(open_directory(root), AT_RECURSIVE);
+  const descriptor tree = clone_tree(place_at(root + "/."), AT_RECURSIVE);
   // A base that only this process sees, and from then on nothing else.
   must(::mount("base", "/proc", "tmpfs", 0, "mode=0755,size=64m"), "tmpfs",
        ask_outside);
-  enter(open_directory("/proc"));
+  enter(place_at("/proc"));
   must(::mkdir(in_base, 0700), "mkdir");
-  attach(tree, open_directory(in_base));
+  attach(tree, place_at(in_base));
   here.seen = sight(in_base);
   const auto covers = make_covers(mounts, here, here.seen);
   make_read_only(tree, AT_RECURSIVE);
