@@ -105,8 +105,7 @@ def names() -> Names:
 def names_of_lisbon() -> list[str]:
     """What the rules call Lisbon's zone; in some of Debian's releases WET, too."""
     rules = (TARGET / names().system / "tzdata.zi").read_text()
-    return sorted(["Europe/Lisbon",
-                   *re.findall(r"(?m)^L Europe/Lisbon (\S+)$", rules)])
+    return sorted(["Europe/Lisbon", *re.findall(r"(?m)^L Europe/Lisbon (\S+)$", rules)])
 
 
 def prepare():

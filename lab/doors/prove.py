@@ -87,8 +87,9 @@ def main() -> int:
         foreign = BUILD / "prove/another-users"
         foreign.mkdir(exist_ok=True)
         (foreign / "file").touch()
-        os.chown(foreign, 1, 1)
-        os.chown(foreign / "file", 1, 1)
+        (foreign / "closed").touch(0o600)
+        for path in foreign, *foreign.iterdir():
+            os.chown(path, 1, 1)
     build_program()
     if makes:
         releases.prepare()

@@ -292,8 +292,7 @@ def test_zones_that_differ(place):
 
 
 def test_zones_come_and_go(place):
-    edit("\nL Europe/Lisbon Portugal\n",
-         "\nL Europe/Lisbon Lusitania\n")(place)
+    edit("\nL Europe/Lisbon Portugal\n", "\nL Europe/Lisbon Lusitania\n")(place)
     facts = made(update(place, "--json"))
     assert facts["changed"] == [name for name in LISBON if name != "Portugal"]
     assert facts["added"] == ["Lusitania"]
@@ -309,8 +308,7 @@ def test_a_zone_like_an_option(place):
 
 def test_a_past_change(place):
     """Cairo's local mean time differs, and nothing after 1900."""
-    edit("\nZ Africa/Cairo 2:5:9 - LMT",
-         "\nZ Africa/Cairo 2:5:8 - LMT")(place)
+    edit("\nZ Africa/Cairo 2:5:9 - LMT", "\nZ Africa/Cairo 2:5:8 - LMT")(place)
     facts = made(update(place, "--json"))
     assert facts["changed"] == LISBON
     shutil.rmtree(facts["directory"])
@@ -537,8 +535,7 @@ REFUSED_UPDATES = [
      lambda place: (place / "system/zoneinfo.default/+VERSION").unlink()),
     ("is there already", lambda place: (place / "out" / VERSION).mkdir()),
     ("make it first", lambda place: (place / "out").rmdir()),
-    ("make it first",
-     lambda place: ((place / "out").rmdir(), (place / "out").touch())),
+    ("make it first", lambda place: ((place / "out").rmdir(), (place / "out").touch())),
     ("Permission denied", lambda place: (place / "out").chmod(0o555)),
     ("is not a version", given(revision="2147483648.0")),
     ("is not a version", given(revision="1" * 5000)),

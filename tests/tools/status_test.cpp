@@ -53,14 +53,6 @@ TEST(Json, HoldsAnyBytes) {
   EXPECT_THAT(text, Each(plain_byte));
 }
 
-TEST(Json, HasNullForWhatThereIsNot) {
-  const auto object = nlohmann::json::parse(in_json({}));
-  EXPECT_TRUE(object["system"]["version"].is_null());
-  EXPECT_TRUE(object["system"]["schema"].is_null());
-  EXPECT_TRUE(object["announced"].is_null());
-  EXPECT_EQ(object["now"]["zoneinfo"]["kind"], "none");
-}
-
 TEST(Rows, HoldNoByteThatATerminalObeys) {
   EXPECT_THAT(in_rows(hostile(), {}), Each(plain_byte));
 }

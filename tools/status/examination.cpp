@@ -33,29 +33,18 @@ std::vector<std::string> unknown(const report& told, bool is_running_system) {
 // This user is the device's root only as far as the device is this user's. What
 // is sound for somebody with the rights of everybody is sound.
 void insist_on_rights(const report& told, place& here) {
-  std::vector<std::string> parts = {
-      links_directory, paths::system_zoneinfo,
-      std::string(paths::system_zoneinfo) + "/+VERSION", paths::system_icu,
-      std::string(paths::system_icu) + "/icutzformat.txt"};
-  const std::string& zone = told.device.links.localtime.text;
-  parts.push_back(zone.substr(0, zone.rfind('/')));
-  for (const auto* set : {&told.device.current, &told.device.update})
-    if (*set && !(*set)->path.empty())
-      for (const char* part : {"", "/zoneinfo", "/zoneinfo/+VERSION", "/icutz"})
-        parts.push_back((*set)->path + part);
-
   std::string foreign;
   for (const char* path :
        {"/", "/var/db", links_directory, paths::version_record}) {
     const sight::place& part = here.seen.follow(path).end;
     if (foreign.empty() && part.error == 0 &&
-        (part.owner != 0 || part.group != 0 ||
+        (part.owner != 0 ||
          ::getxattr(path, "system.posix_acl_access", nullptr, 0) > 0))
       foreign = path;
   }
   // For all three kinds of users, because the boot's may be any.
   bool has_closed_part = false;
-  for (const auto& part : parts)
+  for (const auto& part : here.seen.look_around())
     if (const auto owner = here.seen.follow(part, 0555, 0444).closed) {
       has_closed_part = true;
       if (*owner == nobody && foreign.empty()) foreign = part;
@@ -63,8 +52,8 @@ void insist_on_rights(const report& told, place& here) {
   if (!foreign.empty() && (told.why.is != verdict::sound || has_closed_part ||
                            !here.owner_may_change_links))
     throw cannot_tell(escaped(foreign) +
-                      " belongs to another user or group, or has an access "
-                      "list; run this as root");
+                      " belongs to another user, or has an access list; "
+                      "run this as root");
 }
 
 bool is_mended_by_a_removal(const report& told) {
@@ -79,6 +68,8 @@ report examine(const std::string& root) {
   limit_time();
   place here = enter_throwaway_device(root);
   become_the_boot();
+  // It may be another user's, and a boot has no capabilities.
+  must(::access("/", X_OK), escaped(root), "; only its owner may search it");
   limit_memory();
   report told;
   struct statvfs mounted {};
@@ -86,8 +77,9 @@ report examine(const std::string& root) {
   told.boot = rehearse_boot();
   told.after = read_links();
   sight afterwards;
-  told.boot.closed_part =
-      closed_part(told.after == told.device.links ? here.seen : afterwards);
+  const bool is_same = told.after == told.device.links;
+  told.boot.closed_part = closed_part(is_same ? here.seen : afterwards);
+  told.system_after = is_same ? told.device.system : read_system();
   // The boot is refused what was refused before, and no more.
   if (refusals() > 2 * told.device.refusals) throw std::bad_alloc();
   // Whether another's owner may write there is insisted on below.

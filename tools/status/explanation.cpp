@@ -53,8 +53,7 @@ bool is_too_large(const dataset_facts& set) {
 
 class account {
  public:
-  explicit account(const report& of)
-      : device_(of.device), boot_(of.boot), after_(of.after) {}
+  explicit account(const report& of) : of_(of) {}
 
   explanation told() {
     legacy_icu_link();
@@ -336,9 +335,9 @@ class account {
   // What no later boot mends either.
   void state_afterwards() {
     if (is_too_large(device_.system)) return;
-    if (!device_.system.has_version())
+    if (!of_.system_after.has_version())
       found("system", "no_version", "its data has no version");
-    if (device_.system.schema.empty())
+    if (of_.system_after.schema.empty())
       found("system", "no_schema", "its data has no ICU schema");
     if (!boot_.ends_normally) return;
     if (const auto& [name, sentence, fits] = after_.pair; !fits)
@@ -354,9 +353,10 @@ class account {
             "its file cannot be reached after the boot");
   }
 
-  const device_facts& device_;
-  const rehearsal& boot_;
-  const link_facts& after_;
+  const report& of_;
+  const device_facts& device_ = of_.device;
+  const rehearsal& boot_ = of_.boot;
+  const link_facts& after_ = of_.after;
   const char* name_ = "";
   explanation told_{};
 };

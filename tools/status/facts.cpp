@@ -222,7 +222,7 @@ int list_directory(const std::string& path, std::vector<std::string>& names) {
 
 std::string closed_part(sight& seen) {
   for (const char* path :
-       {"/var/db/timezone", paths::localtime_link, paths::icu_link})
+       {paths::zoneinfo_link, paths::localtime_link, paths::icu_link})
     if (seen.follow(path).closed) return path;
   return {};
 }
@@ -247,6 +247,11 @@ link_facts read_links() {
   }
   links.pair = pair_of(links);
   return links;
+}
+
+dataset_facts read_system() {
+  std::unique_ptr<const mln_dataset> system;
+  return facts_of({}, system);
 }
 
 device_facts read_device(sight& seen) {

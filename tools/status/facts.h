@@ -97,6 +97,9 @@ link_facts read_links();
 // What readers need and only root may read; empty: nothing.
 std::string closed_part(sight& seen);
 
+// The system partition's data set, as it is now. Throws std::bad_alloc only.
+dataset_facts read_system();
+
 // All of it. The data sets are read as a boot reads them; without memory for
 // the system's throws std::bad_alloc.
 device_facts read_device(sight& seen);

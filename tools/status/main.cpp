@@ -139,8 +139,10 @@ int main(int count, char** words) {
   // A limit on the size of files fails a write, which is told.
   std::signal(SIGXFSZ, SIG_IGN);
   const options chosen = options_in(count, words);
-  // If it is ignored, nobody is told how a child ends.
+  // What is inherited must not hide how a child ends, or that it does not.
   std::signal(SIGCHLD, SIG_DFL);
+  const sigset_t none{};
+  ::sigprocmask(SIG_SETMASK, &none, nullptr);
   const pid_t child = ::fork();
   if (child < 0) refuse(not_here, std::string("fork: ") + std::strerror(errno));
   if (child == 0) std::_Exit(tell_or_refuse(chosen));

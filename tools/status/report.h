@@ -34,6 +34,7 @@ struct report {
   device_facts device{};
   rehearsal boot{};
   link_facts after{};
+  dataset_facts system_after{};
   explanation why{};
   std::vector<std::string> cannot_know{};
   bool is_mended_by_a_removal = false;  // of "zoneinfo", before another boot

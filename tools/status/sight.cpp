@@ -6,7 +6,6 @@
 #include <algorithm>
 #include <cerrno>
 #include <cstring>
-#include <set>
 #include <tuple>
 #include <vector>
 
@@ -24,7 +23,8 @@ sight::way sight::follow(std::string rest, mode_t of_directories,
     const auto start = rest.find_first_not_of('/');
     if (!S_ISDIR(at.mode) && !rest.empty()) return {};
     const mode_t needed = S_ISDIR(at.mode) ? of_directories : of_file;
-    if (!here.empty() && !closed && (at.mode & needed) != needed)
+    if (!here.empty() && closed.value_or(0) == 0 &&
+        (at.mode & needed) != needed)
       closed = at.owner;
     if (start == std::string::npos) return {here, at, closed};
     rest.erase(0, start);
@@ -63,26 +63,12 @@ sight::place& sight::look(const std::string& real) {
     here.error = errno;
   here.mode = status.st_mode;
   here.owner = status.st_uid;
-  here.group = status.st_gid;
-  if (S_ISDIR(here.mode))
+  if (!S_ISDIR(here.mode)) here.size = status.st_size;
+  if (S_ISDIR(here.mode) || status.st_nlink > 1)
     here.target =
         first_.try_emplace({status.st_dev, status.st_ino}, real).first->second;
-  else
-    here.size = status.st_size;
   if (S_ISLNK(here.mode)) here.target = ::target_of(path.c_str());
   return here;
-}
-
-void sight::look_into(const std::string& directory) {
-  const auto& [real, end, closed] = follow(directory);
-  std::vector<std::string> names;
-  if (S_ISDIR(end.mode) && end.names.empty())
-    list_directory(root_ + real, names);
-  for (const auto& name : names) {
-    look(real).names += name + "/";
-    // A name that is listed and hidden does not keep a directory.
-    look(real + "/" + name);
-  }
 }
 
 const sight::place& sight::at(const std::string& path) {
@@ -92,21 +78,19 @@ const sight::place& sight::at(const std::string& path) {
                                : nothing;
 }
 
-void sight::look_around() {
-  for (const char* path :
-       {"/var/db/timezone/tz", paths::icu_link, paths::version_record,
-        paths::legacy_icu_link, "/usr/share/icu/icutzformat.txt"})
-    follow(path);
-  look_into(paths::localtime_link);
-  look_into(paths::obsolete_icu);
-
+std::set<std::string> sight::look_around() {
+  follow(paths::download_root);
+  std::set<std::string> places = {
+      paths::icu_link,        paths::version_record,
+      paths::legacy_icu_link, "/usr/share/icu/icutzformat.txt",
+      paths::localtime_link,  paths::obsolete_icu};
   const std::string in_use = at(paths::zoneinfo_link).target;
   std::set<std::string> trees = {paths::zoneinfo_link, paths::system_zoneinfo};
   for (const auto& set : {in_use.substr(0, in_use.rfind('/')),
                           at(paths::latest_update_link).target}) {
     if (!set.starts_with(paths::download_root)) continue;
     trees.insert(set + "/zoneinfo");
-    look_into(set + "/icutz");
+    places.insert(set + "/icutz");
   }
   const std::string zone = at(paths::localtime_link).target;
   const auto tree_end = zone.find("/zoneinfo/");
@@ -114,7 +98,19 @@ void sight::look_around() {
   if (tree_end != std::string::npos)
     files.insert(zone.substr(tree_end + std::strlen("/zoneinfo/")));
   for (const auto& tree : trees)
-    for (const auto& file : files) follow(tree + "/" + file);
+    for (const auto& file : files) places.insert(tree + "/" + file);
+  for (const auto& path : places) {
+    const auto& [real, end, closed] = follow(path);
+    std::vector<std::string> names;
+    if (S_ISDIR(end.mode) && end.names.empty())
+      list_directory(root_ + real, names);
+    for (const auto& name : names) {
+      look(real).names += name + "/";
+      // A name that is listed and hidden does not keep a directory.
+      look(real + "/" + name);
+    }
+  }
+  return places;
 }
 
 std::optional<std::string> sight::first_difference(const sight& other) const {

@@ -7,6 +7,7 @@
 
 #include <map>
 #include <optional>
+#include <set>
 #include <string>
 #include <utility>
 
@@ -25,7 +26,6 @@ class sight {
     std::string target{};  // of a directory: by which path it was seen first
     std::string names{};   // in a directory whose names count
     uid_t owner = 0;
-    gid_t group = 0;
 
     // Whoever the owners are.
     bool operator==(const place& other) const;
@@ -42,8 +42,8 @@ class sight {
   way follow(std::string path, mode_t of_directories = 01, mode_t of_file = 04);
 
   // Looks at each place that a boot uses, as it stands there and where it
-  // leads.
-  void look_around();
+  // leads. Returns the paths of those that it reads.
+  std::set<std::string> look_around();
 
   std::optional<std::string> first_difference(const sight& other) const;
 
@@ -51,7 +51,6 @@ class sight {
 
  private:
   place& look(const std::string& real);
-  void look_into(const std::string& directory);
 
   std::string root_;
   std::map<std::string, place> seen_{};  // "" is the root

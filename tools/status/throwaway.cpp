@@ -107,8 +107,9 @@ void enter_namespaces(const std::string& root, place& here) {
       {"/proc/self/gid_map", "0 " + std::to_string(::getegid()) + " 1\n"}};
   const bool may_mount = ::unshare(CLONE_NEWNS) == 0;
   must(may_mount || errno == EPERM ? 0 : -1, "unshare", ask_outside);
-  here.has_all_users =
-      may_mount && text_of("/proc/self/uid_map").ends_with("4294967295\n");
+  here.has_all_users = may_mount;
+  for (const char* map : {"/proc/self/uid_map", "/proc/self/gid_map"})
+    here.has_all_users &= may_mount && text_of(map).ends_with("4294967295\n");
   if (!here.has_all_users)
     here.owner_may_change_links = owner_may_change_links(root);
   if (may_mount) return;
