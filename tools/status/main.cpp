@@ -57,9 +57,9 @@ void print(const std::string& text, const std::string& otherwise = {}) {
 std::string in_rows_for_terminal(const report& told) {
   winsize size{};
   look wanted;
-  if (::isatty(STDOUT_FILENO) == 0) return in_rows(told, wanted);
-  if (::ioctl(STDOUT_FILENO, TIOCGWINSZ, &size) == 0)
-    wanted.width = size.ws_col;
+  if (::ioctl(STDOUT_FILENO, TIOCGWINSZ, &size) != 0)
+    return in_rows(told, wanted);
+  wanted.width = size.ws_col;
   const char* const colourless = std::getenv("NO_COLOR");
   wanted.has_colour = colourless == nullptr || *colourless == '\0';
   return in_rows(told, wanted);

@@ -181,8 +181,9 @@ descriptor copy_of(const std::string& path, const std::string& name,
 
 // For a place that is a file system of its own, or the topmost.
 descriptor cover_for(const std::string& path, const std::string& name,
-                     const place& here) {
-  const descriptor below = place_at(in_base + path);
+                     const place& here, const descriptor& device) {
+  const descriptor below(::openat(device.number(), ("." + path).c_str(),
+                                  O_PATH | O_NOFOLLOW | O_CLOEXEC));
   struct stat status {};
   must(::fstat(below.number(), &status), "stat");
   struct statvfs mounted {};
@@ -208,30 +209,28 @@ bool is_mounted(const std::string& path) {
 }
 
 // What is to lie over "/var/db" and over what is mounted below, by real paths
-// of the device, outer ones first. Made before everything becomes read only.
+// of the device, outer ones first.
 std::vector<std::pair<std::string, descriptor>> make_covers(
-    std::set<std::string> mounts, const place& here, sight& seen) {
+    std::set<std::string> mounts, place& here, const descriptor& device) {
   std::vector<std::pair<std::string, descriptor>> covers;
-  const auto& [real, top, closed] = seen.follow(writable);
+  const auto& [real, top, closed] = here.seen.follow(writable);
   // Without the directory there is nothing that a boot could write to.
   if (!S_ISDIR(top.mode)) return covers;
   mounts.insert(real);
   for (const auto& path : mounts) {
     const std::string name = std::to_string(covers.size());
     if (path == real || (path.starts_with(real + "/") && is_mounted(path)))
-      covers.emplace_back(path, cover_for(path, "/" + name, here));
+      covers.emplace_back(path, cover_for(path, "/" + name, here, device));
   }
 
-  const sight::way updates = seen.follow(paths::download_root);
+  const sight::way updates = here.seen.follow(paths::download_root);
   const std::string& kept = updates.real;
-  // What a unit may write stays so if all around it is only to be read.
-  if (!S_ISDIR(updates.end.mode) || kept.empty() ||
-      real.starts_with(kept + "/"))
-    return covers;
-  // Without the layer, which shows some files of an update as missing.
-  descriptor copy = clone_tree(place_at(in_base + kept), AT_RECURSIVE);
-  make_read_only(copy, AT_RECURSIVE);
-  covers.emplace_back(kept, std::move(copy));
+  // What a unit may write stays so if all around it is only to be read. The
+  // layer would show some files of an update as missing.
+  if (S_ISDIR(updates.end.mode) && !kept.empty() &&
+      !real.starts_with(kept + "/"))
+    covers.emplace_back(kept,
+                        clone_tree(place_at(in_base + kept), AT_RECURSIVE));
   return covers;
 }
 
@@ -248,8 +247,10 @@ place enter_throwaway_device(const std::string& root) {
   here.is_running_system = std::strcmp(outside, "/") == 0;
   const auto mounts = mounts_below(here.is_running_system ? "" : outside);
 
-  // Taken before anything is covered.
-  const descriptor tree = clone_tree(place_at(root + "/."), AT_RECURSIVE);
+  // Taken before anything is covered; to read in it is no access to the device.
+  const descriptor device = place_at(root + "/.");
+  const descriptor tree = clone_tree(device, AT_RECURSIVE);
+  make_read_only(tree, AT_RECURSIVE);
   // A base that only this process sees, and from then on nothing else.
   must(::mount("base", "/proc", "tmpfs", 0, "mode=0755,size=64m"), "tmpfs",
        ask_outside);
@@ -257,8 +258,7 @@ place enter_throwaway_device(const std::string& root) {
   must(::mkdir(in_base, 0700), "mkdir");
   attach(tree, place_at(in_base));
   here.seen = sight(in_base);
-  const auto covers = make_covers(mounts, here, here.seen);
-  make_read_only(tree, AT_RECURSIVE);
+  const auto covers = make_covers(mounts, here, device);
 
   if (here.seen.at(writable).error != 0 &&
       here.seen.at(paths::system_zoneinfo).error != 0)
