@@ -13,16 +13,13 @@
 
 namespace {
 
-// How an owner appears whom this user namespace does not have.
-constexpr uid_t nobody = 65534;
 constexpr char links_directory[] = "/var/db/timezone";
 
 std::vector<std::string> unknown(const report& told, bool is_running_system) {
   std::vector<std::string> texts;
   for (const auto* set : {&told.device.current, &told.device.update})
     if (!is_running_system && *set && (*set)->has_several_schemas)
-      texts = {
-          "which ICU data file comes first on the device's own file system"};
+      texts = {"which ICU data file comes first on the device's file system"};
   if (!(told.after == told.device.links))
     texts.emplace_back("whether there is space for the links");
   if (!is_running_system)
@@ -38,8 +35,9 @@ void insist_on_rights(const report& told, place& here) {
        {"/", "/var/db", links_directory, paths::version_record}) {
     const sight::place& part = here.seen.follow(path).end;
     if (foreign.empty() && part.error == 0 &&
-        (part.owner != 0 ||
-         ::getxattr(path, "system.posix_acl_access", nullptr, 0) > 0))
+        (part.owner != 0 || part.group != 0 ||
+         ::getxattr(path, "system.posix_acl_access", nullptr, 0) > 0 ||
+         ::getxattr(path, "system.posix_acl_default", nullptr, 0) > 0))
       foreign = path;
   }
   // For all three kinds of users, because the boot's may be any.
@@ -51,9 +49,10 @@ void insist_on_rights(const report& told, place& here) {
     }
   if (!foreign.empty() && (told.why.is != verdict::sound || has_closed_part ||
                            !here.owner_may_change_links))
-    throw cannot_tell(escaped(foreign) +
-                      " belongs to another user, or has an access list; "
-                      "run this as root");
+    throw cannot_tell(
+        escaped(foreign) +
+        " belongs to another user or group, or has an access list; "
+        "run this as root");
 }
 
 bool is_mended_by_a_removal(const report& told) {

@@ -288,9 +288,7 @@ class account {
     if (!is_due) return add("nothing", "no_activation", sound, "no activation");
     const dataset_facts& active =
         has(lines::incompatible) ? device_.system : compared();
-    const link_facts& before = device_.links;
-    if (!after_.recorded ||
-        (after_.recorded == before.recorded && after_.record == before.record))
+    if (!opens_record())
       return add("not_written", "not_opened", wrong,
                  "the change cannot be recorded");
     const std::string text =
@@ -335,9 +333,9 @@ class account {
   // What no later boot mends either.
   void state_afterwards() {
     if (is_too_large(device_.system)) return;
-    if (!of_.system_after.has_version())
+    if (!device_.system.has_version() || !of_.system_after.has_version())
       found("system", "no_version", "its data has no version");
-    if (of_.system_after.schema.empty())
+    if (device_.system.schema.empty() || of_.system_after.schema.empty())
       found("system", "no_schema", "its data has no ICU schema");
     if (!boot_.ends_normally) return;
     if (const auto& [name, sentence, fits] = after_.pair; !fits)

@@ -22,6 +22,7 @@
 #include "driver/dataset_links.h"
 #include "support/fsutil.h"
 #include "support/paths.h"
+#include "support/special_file.h"
 #include "tools/descriptor.h"
 #include "tools/escaped.h"
 #include "tools/status/rehearsal.h"
@@ -97,6 +98,8 @@ void list_downloads(device_facts& device, sight& seen) {
   std::vector<std::string> names;
   device.downloads_error = list_directory(root, names);
   device.has_more_downloads = names.size() > most_names;
+  if (device.downloads_error == 0 && ::access(root.c_str(), X_OK) != 0)
+    device.downloads_error = errno;
   std::map<std::string, std::vector<std::string>> sets;
   for (const auto& name : names)
     if (S_ISDIR(status_of(root + name).st_mode)) sets[name];
@@ -220,6 +223,13 @@ int list_directory(const std::string& path, std::vector<std::string>& names) {
   return 0;
 }
 
+bool opens_record() {
+  return !is_special_file(paths::version_record) &&
+         descriptor(::open(paths::version_record,
+                           O_WRONLY | O_CREAT | O_CLOEXEC, 0666))
+                 .number() >= 0;
+}
+
 std::string closed_part(sight& seen) {
   for (const char* path :
        {paths::zoneinfo_link, paths::localtime_link, paths::icu_link})
@@ -236,10 +246,6 @@ link_facts read_links() {
   links.record = record_at(paths::version_record);
   links.legacy_icutz = entry_at(paths::legacy_icu_link);
   links.old_icu = entry_at(paths::obsolete_icu);
-  const struct stat record = status_of(paths::version_record);
-  if (S_ISREG(record.st_mode))
-    links.recorded =
-        record.st_mtim.tv_sec * 1'000'000'000LL + record.st_mtim.tv_nsec;
   links.zone_is_file = S_ISREG(status_of(paths::localtime_link).st_mode);
   try {
     links.current_path = current_dataset_path();

@@ -68,8 +68,7 @@ struct link_facts {
   entry old_icu{};
   std::optional<std::string> current_path{};  // if "zoneinfo" is accepted
   link_pair pair{};
-  bool zone_is_file = false;            // "localtime" leads to a regular file
-  std::optional<long long> recorded{};  // when the record's file was written
+  bool zone_is_file = false;  // "localtime" leads to a regular file
 
   bool operator==(const link_facts&) const = default;
 };
@@ -90,15 +89,16 @@ struct device_facts {
   unsigned refusals = 0;
 };
 
-// The links as they are, also after a boot. Nothing here changes anything, or
-// throws anything but std::bad_alloc.
+// Whether a boot can write the record, asked as the boot asks.
+bool opens_record();
+
+// The links, and the system partition's data set, as they are, also after a
+// boot. Nothing here changes anything, or throws anything but std::bad_alloc.
 link_facts read_links();
+dataset_facts read_system();
 
 // What readers need and only root may read; empty: nothing.
 std::string closed_part(sight& seen);
-
-// The system partition's data set, as it is now. Throws std::bad_alloc only.
-dataset_facts read_system();
 
 // All of it. The data sets are read as a boot reads them; without memory for
 // the system's throws std::bad_alloc.

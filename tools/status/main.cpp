@@ -70,7 +70,6 @@ struct options {
   std::string (*text_of)(const report&) = in_rows_for_terminal;
 };
 
-// Of these letters only one is an option too.
 const option known[] = {{"root", required_argument, nullptr, 'r'},
                         {"json", no_argument, nullptr, 'j'},
                         {"check", no_argument, nullptr, 'c'},
@@ -126,9 +125,7 @@ int tell_or_refuse(const options& chosen) {
     why = "the next boot takes more than " + std::to_string(most_memory >> 20) +
           " MB of memory";
   } catch (...) {
-    why =
-        "what the boot did does not follow from what was read; is the device "
-        "being changed?";
+    why = "nothing read explains the boot; is the device being changed?";
   }
   refuse(not_here, "cannot tell: " + why);
 }

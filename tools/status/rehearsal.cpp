@@ -62,8 +62,7 @@ void limit_memory() {
   // Sanitizers reserve terabytes of addresses.
   rlimit limit{};
   must(::getrlimit(RLIMIT_AS, &limit), "getrlimit");
-  limit.rlim_max = std::min<rlim_t>(limit.rlim_max, most_memory);
-  limit.rlim_cur = std::min(limit.rlim_cur, limit.rlim_max);
+  limit.rlim_cur = std::min<rlim_t>(limit.rlim_cur, most_memory);
   must(::setrlimit(RLIMIT_AS, &limit), "setrlimit");
 #endif
 }

@@ -63,6 +63,7 @@ sight::place& sight::look(const std::string& real) {
     here.error = errno;
   here.mode = status.st_mode;
   here.owner = status.st_uid;
+  here.group = status.st_gid;
   if (!S_ISDIR(here.mode)) here.size = status.st_size;
   if (S_ISDIR(here.mode) || status.st_nlink > 1)
     here.target =
@@ -74,8 +75,8 @@ sight::place& sight::look(const std::string& real) {
 const sight::place& sight::at(const std::string& path) {
   const auto name = path.rfind('/');
   const way parent = follow(path.substr(0, name));
-  return parent.end.error == 0 ? look(parent.real + path.substr(name))
-                               : nothing;
+  return S_ISDIR(parent.end.mode) ? look(parent.real + path.substr(name))
+                                  : nothing;
 }
 
 std::set<std::string> sight::look_around() {

@@ -11,6 +11,9 @@
 #include <string>
 #include <utility>
 
+// How an owner appears whom this user namespace does not have.
+inline constexpr uid_t nobody = 65534;
+
 // Follows paths as the kernel does, and looks at each place only once. Opens
 // nothing but directories. Throws std::bad_alloc only.
 class sight {
@@ -26,6 +29,7 @@ class sight {
     std::string target{};  // of a directory: by which path it was seen first
     std::string names{};   // in a directory whose names count
     uid_t owner = 0;
+    gid_t group = 0;
 
     // Whoever the owners are.
     bool operator==(const place& other) const;

@@ -39,14 +39,6 @@ descriptor place_at(const std::string& path, int flags = O_PATH) {
   return opened;
 }
 
-// Before namespaces, in which all other users look like one.
-bool owner_may_change_links(const std::string& root) {
-  sight outside(root);
-  const sight::place& directory = outside.follow(paths::timezone_directory).end;
-  return directory.owner == outside.follow("/").end.owner &&
-         (directory.mode & S_IWUSR) != 0;
-}
-
 // Attributes and numbers of the device's own mean something to overlayfs, and
 // what is covered loses its access list and its other paths.
 [[noreturn]] void refuse_layer(const std::string& path) {
@@ -110,8 +102,14 @@ void enter_namespaces(const std::string& root, place& here) {
   here.has_all_users = may_mount;
   for (const char* map : {"/proc/self/uid_map", "/proc/self/gid_map"})
     here.has_all_users &= may_mount && text_of(map).ends_with("4294967295\n");
-  if (!here.has_all_users)
-    here.owner_may_change_links = owner_may_change_links(root);
+  if (!here.has_all_users) {
+    // Before namespaces, in which all other users look like one.
+    sight outside(root);
+    const auto& directory = outside.follow(paths::timezone_directory).end;
+    here.owner_may_change_links =
+        directory.owner == outside.follow("/").end.owner &&
+        directory.owner != nobody && (directory.mode & S_IWUSR) != 0;
+  }
   if (may_mount) return;
   must(::unshare(CLONE_NEWUSER | CLONE_NEWNS),
        "this user may not have namespaces", ask_outside);
@@ -137,19 +135,19 @@ void attach(const descriptor& tree, const descriptor& target) {
 }
 
 // What a boot sees of a cover is what it sees of the device.
-void resemble(const std::string& path, const struct stat& status,
+void resemble(const std::string& path, const struct statx& status,
               const place& here) {
   // Owners whom this user cannot stand in for are in what was seen.
-  if (::chown(path.c_str(), status.st_uid, status.st_gid) != 0 &&
+  if (::chown(path.c_str(), status.stx_uid, status.stx_gid) != 0 &&
       (here.has_all_users || errno != EINVAL))
     must(-1, "chown");
-  must(::chmod(path.c_str(), status.st_mode & 07777), "chmod");
+  must(::chmod(path.c_str(), status.stx_mode & 07777), "chmod");
 }
 
 // Made in the base, and the directory is the current one, so that no name of
 // the device's becomes part of a list of options.
 descriptor layer_over(const descriptor& lower, const std::string& name,
-                      const struct stat& status, const place& here) {
+                      const struct statx& status, const place& here) {
   const std::string upper = name + "/upper";
   const std::string work = name + "/work";
   for (const auto& path : {name, upper, work})
@@ -167,7 +165,7 @@ descriptor layer_over(const descriptor& lower, const std::string& name,
 
 // Of a file that is mounted by itself, which can have no layer.
 descriptor copy_of(const std::string& path, const std::string& name,
-                   const struct stat& status, const place& here) {
+                   const struct statx& status, const place& here) {
   const descriptor from(::open(path.c_str(), O_RDONLY | O_CLOEXEC));
   must(from.number(), "a file that is mounted by itself");
   const descriptor to(::creat(name.c_str(), 0600));
@@ -179,13 +177,17 @@ descriptor copy_of(const std::string& path, const std::string& name,
   return clone_tree(to);
 }
 
-// For a place that is a file system of its own, or the topmost.
+// For the topmost place or a file system of its own; none if a mount hides it.
 descriptor cover_for(const std::string& path, const std::string& name,
-                     const place& here, const descriptor& device) {
+                     bool is_top, const place& here, const descriptor& device) {
   const descriptor below(::openat(device.number(), ("." + path).c_str(),
                                   O_PATH | O_NOFOLLOW | O_CLOEXEC));
-  struct stat status {};
-  must(::fstat(below.number(), &status), "stat");
+  struct statx status {};
+  const int seen =
+      ::statx(below.number(), "", AT_EMPTY_PATH, STATX_BASIC_STATS, &status);
+  if (!is_top && (status.stx_attributes & STATX_ATTR_MOUNT_ROOT) == 0)
+    return descriptor();
+  must(seen, "statx");
   struct statvfs mounted {};
   must(::fstatvfs(below.number(), &mounted), "statvfs");
   if ((mounted.f_flag & nosymfollow) != 0 ||
@@ -193,19 +195,12 @@ descriptor cover_for(const std::string& path, const std::string& name,
                  0) > 0)
     refuse_layer(path);
   descriptor cover =
-      S_ISDIR(status.st_mode)   ? layer_over(below, name, status, here)
-      : S_ISREG(status.st_mode) ? copy_of(in_base + path, name, status, here)
-                                : clone_tree(below);
+      S_ISDIR(status.stx_mode)   ? layer_over(below, name, status, here)
+      : S_ISREG(status.stx_mode) ? copy_of(in_base + path, name, status, here)
+                                 : clone_tree(below);
   if (here.is_running_system && (mounted.f_flag & ST_RDONLY) != 0)
     make_read_only(cover);
   return cover;
-}
-
-// And seen: another mount can hide it.
-bool is_mounted(const std::string& path) {
-  struct statx status {};
-  ::statx(AT_FDCWD, (in_base + path).c_str(), AT_SYMLINK_NOFOLLOW, 0, &status);
-  return (status.stx_attributes & STATX_ATTR_MOUNT_ROOT) != 0;
 }
 
 // What is to lie over "/var/db" and over what is mounted below, by real paths
@@ -218,9 +213,10 @@ std::vector<std::pair<std::string, descriptor>> make_covers(
   if (!S_ISDIR(top.mode)) return covers;
   mounts.insert(real);
   for (const auto& path : mounts) {
+    if (path != real && !path.starts_with(real + "/")) continue;
     const std::string name = std::to_string(covers.size());
-    if (path == real || (path.starts_with(real + "/") && is_mounted(path)))
-      covers.emplace_back(path, cover_for(path, "/" + name, here, device));
+    descriptor cover = cover_for(path, "/" + name, path == real, here, device);
+    if (cover.number() >= 0) covers.emplace_back(path, std::move(cover));
   }
 
   const sight::way updates = here.seen.follow(paths::download_root);
