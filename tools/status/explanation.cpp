@@ -288,7 +288,7 @@ class account {
     if (!is_due) return add("nothing", "no_activation", sound, "no activation");
     const dataset_facts& active =
         has(lines::incompatible) ? device_.system : compared();
-    if (!opens_record())
+    if (!opens_record() && after_.record == device_.links.record)
       return add("not_written", "not_opened", wrong,
                  "the change cannot be recorded");
     const std::string text =

@@ -89,7 +89,7 @@ struct device_facts {
   unsigned refusals = 0;
 };
 
-// Whether a boot can write the record, asked as the boot asks.
+// Asked as the boot asks; one that it has just made may be closed to it.
 bool opens_record();
 
 // The links, and the system partition's data set, as they are, also after a
