@@ -64,8 +64,8 @@ class account {
       found("boot", "abnormal_end",
             "it ends abnormally: " + escaped(boot_.thrown));
     state_afterwards();
-    if (told_.is == sound && !(after_ == device_.links))
-      throw std::logic_error("a change without a reason");
+    if (told_.is != wrong && (told_.is == sound) != (after_ == device_.links))
+      throw std::logic_error("a change without a reason, or without effect");
     return std::move(told_);
   }
 
@@ -288,7 +288,8 @@ class account {
     if (!is_due) return add("nothing", "no_activation", sound, "no activation");
     const dataset_facts& active =
         has(lines::incompatible) ? device_.system : compared();
-    if (!opens_record() && after_.record == device_.links.record)
+    if (after_.record.what == kind::none ||
+        (!opens_record() && after_.record == device_.links.record))
       return add("not_written", "not_opened", wrong,
                  "the change cannot be recorded");
     const std::string text =

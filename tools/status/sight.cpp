@@ -23,8 +23,7 @@ sight::way sight::follow(std::string rest, mode_t of_directories,
     const auto start = rest.find_first_not_of('/');
     if (!S_ISDIR(at.mode) && !rest.empty()) return {};
     const mode_t needed = S_ISDIR(at.mode) ? of_directories : of_file;
-    if (!here.empty() && closed.value_or(0) == 0 &&
-        (at.mode & needed) != needed)
+    if (!here.empty() && !closed.value_or(0) && (at.mode & needed) != needed)
       closed = at.owner;
     if (start == std::string::npos) return {here, at, closed};
     rest.erase(0, start);
