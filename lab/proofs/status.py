@@ -228,6 +228,8 @@ TREES = [
     (2, "announce 2024a.1.0; link RECORD /etc/passwd",
      "next_boot.after.record.target /etc/passwd"),
     (2, "announce 2024a.1.0; file RECORD 2 0444", "record not_opened"),
+    (2, "announce 2024a.1.0; file RECORD 2023c.1.0_2024a.1.0 0444",
+     "record not_opened"),
     (1, "announce 2024a.1.0; file RECORD 2 0200", "record activation"),
     (2, "announce 2024a.1.0; link RECORD zoneinfo/+VERSION", "record not_opened"),
     (0, "move /var /data; link /var data", "now.pair system"),
@@ -240,6 +242,7 @@ TREES = [
      "next_boot.ends abnormally"),
     (2, "announce 2024a.1.0; directory TIMEZONE 0555", "next_boot.ends abnormally"),
     (2, "directory TIMEZONE 0555", "reasons.0.code not_writable"),
+    (0, "directory TZ 0000"),
     (0, "directory TZ 0644", "downloads_error Permission denied"),
     # Behind what the boot removes.
     (2, "use 2024a.1.0; announce 2024b.1.0; move TZ/2024b.1.0/icutz /var/db/real;"
@@ -336,7 +339,7 @@ TOO_LONG = """/usr/bin/prlimit --fsize=0 /bin/sh -c 'exec "$0" "$@" >/tmp/full'"
      "/usr/bin/prlimit --fsize=5"),
     (f"{TREE} is not a device: it has neither /var/db nor {SYSTEM_ZONEINFO}",
      "drop /var; drop /usr", ""),
-    (f"{TREE}: Permission denied; only its owner may search it", "", """/bin/sh -c
+    (f"{TREE}: Permission denied; let everybody search it", "", """/bin/sh -c
         'chmod 0 /tmp/device; "$0" "$@"; e=$?; chmod 755 /tmp/device; exit $e'"""),
     (f"{TIMEZONE} belongs to another .*, or has an access list; .*",
      f"announce 2024a.1.0; mark TIMEZONE system.posix_acl_default {quote(ACL)}", ""),

@@ -28,7 +28,8 @@ std::vector<std::string> unknown(const report& told, bool is_running_system) {
 }
 
 // This user is the device's root only as far as the device is this user's. What
-// is sound for somebody with the rights of everybody is sound.
+// is sound for somebody with the rights of everybody is sound. A layer fails
+// with a group that this namespace lacks, where the device does not.
 void insist_on_rights(const report& told, place& here) {
   std::string foreign;
   for (const char* path :
@@ -49,10 +50,9 @@ void insist_on_rights(const report& told, place& here) {
     }
   if (!foreign.empty() && (told.why.is != verdict::sound || has_closed_part ||
                            !here.owner_may_change_links))
-    throw cannot_tell(
-        escaped(foreign) +
-        " belongs to another user or group, or has an access list; "
-        "run this as root");
+    throw cannot_tell(escaped(foreign) +
+                      " belongs to another user or group, or has an access "
+                      "list; run this as root");
 }
 
 bool is_mended_by_a_removal(const report& told) {
@@ -68,7 +68,7 @@ report examine(const std::string& root) {
   place here = enter_throwaway_device(root);
   become_the_boot();
   // It may be another user's, and a boot has no capabilities.
-  must(::access("/", X_OK), escaped(root), "; only its owner may search it");
+  must(::access("/", X_OK), escaped(root), "; let everybody search it");
   limit_memory();
   report told;
   struct statvfs mounted {};

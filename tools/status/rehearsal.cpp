@@ -41,7 +41,7 @@ void become_the_boot() {
   // Not allowed where this user is not really root, and needless there.
   if (::setgroups(0, nullptr) != 0 && errno != EPERM) must(-1, "setgroups");
   must(::setresgid(0, 0, 0), "setresgid");
-  must(::setresuid(0, 0, 0), "setresuid");
+  must(::setresuid(0, 0, 0), "setresuid", "; run this as root");
   const rlimit none{0, 0};
   must(::setrlimit(RLIMIT_CORE, &none), "setrlimit");
   ::umask(022);

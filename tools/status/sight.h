@@ -26,7 +26,7 @@ class sight {
     mode_t mode = 0;
     off_t size = 0;  // not of a directory
     int error = 0;
-    std::string target{};  // of a directory: by which path it was seen first
+    std::string target{};  // a link's; of what has more paths, the first one
     std::string names{};   // in a directory whose names count
     uid_t owner = 0;
     gid_t group = 0;
@@ -39,10 +39,10 @@ class sight {
   struct way {
     std::string real{};             // where it leads; "/" is empty
     const place& end = nothing;     // what is there
-    std::optional<uid_t> closed{};  // whose the first part without a mode is
+    std::optional<uid_t> closed{};  // whose a part without a mode is, if any
   };
-  // Directories on the way and at its end, except "/", have to have one mode,
-  // a file at the end the other.
+  // Directories on the way and at its end, except "/", have to have one mode, a
+  // file at the end the other. Of closed parts one that is not root's counts.
   way follow(std::string path, mode_t of_directories = 01, mode_t of_file = 04);
 
   // Looks at each place that a boot uses, as it stands there and where it
